@@ -1,0 +1,36 @@
+#include "platform/BundleLoader.h"
+
+#include <dlfcn.h>
+
+#include <filesystem>
+
+#include "platform/Log.h"
+
+namespace platform {
+
+const void* LoadedBundle::symbol(const char* name) const {
+  return ::dlsym(_library, name);
+}
+
+BundleLoader& BundleLoader::of(Platform& platform) {
+  return *platform.once<std::unique_ptr<BundleLoader>>([] { return std::make_unique<BundleLoader>(); });
+}
+
+const LoadedBundle* BundleLoader::load(const std::string& bundleDirectory) {
+  const std::lock_guard lock(_mutex);
+  auto& slot = _loaded[bundleDirectory];
+  if (slot) return slot.get();
+
+  const std::string library = bundleDirectory + "/" + std::filesystem::path(bundleDirectory).stem().string() + ".so";
+  void* const handle = ::dlopen(library.c_str(), RTLD_NOW | RTLD_LOCAL);
+  if (handle == nullptr) {
+    const char* const reason = ::dlerror();
+    PLATFORM_LOG(error, "BundleLoader(load): Could not load {}: {}", library, reason == nullptr ? "(null)" : reason);
+    return nullptr;
+  }
+  PLATFORM_LOG(info, "BundleLoader(load): Loaded {}", library);
+  slot = std::make_unique<LoadedBundle>(handle);
+  return slot.get();
+}
+
+}  // namespace platform

@@ -1,0 +1,18 @@
+#pragma once
+
+#include <string>
+
+#include "platform/Result.h"
+#include "platform/UniqueFd.h"
+
+namespace platform {
+
+// Connects to the named service whose socket lies in `directory`: the client's counterpart of Listener. Does not block;
+// the socket is non-blocking and close-on-exec. Any thread.
+//
+// On failure `*errorNumber`, where given, tells apart what the text only says: ENOENT (no such socket: nothing runs
+// there), ECONNREFUSED (a socket file that nobody listens behind), EACCES, EAGAIN (the service has too many waiting),
+// ENAMETOOLONG. It is 0 on success.
+Result<UniqueFd> connectToService(const std::string& directory, const std::string& service, int* errorNumber = nullptr);
+
+}  // namespace platform

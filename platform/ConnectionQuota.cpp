@@ -1,0 +1,32 @@
+#include "platform/ConnectionQuota.h"
+
+#include <mutex>
+#include <unordered_map>
+
+namespace platform {
+
+struct ConnectionQuota::Counts {
+  std::mutex mutex;
+  std::unordered_map<uid_t, std::size_t> perUser;  // guarded by mutex; no zeros
+
+  void release(uid_t user) {
+    const std::lock_guard lock(mutex);
+    const auto place = perUser.find(user);
+    if (--place->second == 0) perUser.erase(place);
+  }
+};
+
+ConnectionQuota::ConnectionQuota(std::size_t maximumPerUser)
+    : _maximum(maximumPerUser), _counts(std::make_shared<Counts>()) {}
+
+std::shared_ptr<void> ConnectionQuota::take(uid_t user) {
+  {
+    const std::lock_guard lock(_counts->mutex);
+    std::size_t& count = _counts->perUser[user];
+    if (count >= _maximum) return nullptr;
+    ++count;
+  }
+  return {_counts.get(), [counts = _counts, user](void*) { counts->release(user); }};
+}
+
+}  // namespace platform

@@ -1,0 +1,48 @@
+#pragma once
+
+#include <atomic>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <thread>
+
+#include "platform/HttpClient.h"
+#include "platform/HttpIntake.h"
+#include "platform/HttpTransferLoop.h"
+
+namespace platform {
+
+// The HTTP client over libcurl: checks and hands in requests on the callers' threads, and runs a HttpTransferLoop on a
+// thread of its own. The thread starts with the first request, so that a process can enter its sandbox before.
+class CurlHttpClient final : public HttpClient {
+ public:
+  CurlHttpClient(WorkPool& pool, HttpClientOptions options);
+  ~CurlHttpClient() override;
+
+  std::shared_ptr<HttpLane> makeLane(LaneKind kind) override;
+  void start(const std::shared_ptr<HttpLane>& lane, HttpRequest request,
+             UniqueFunction<void(const HttpResult&)> observe, Completion completion) override;
+  HttpResult perform(const std::shared_ptr<HttpLane>& lane, HttpRequest request) override;
+  void abortBlockingRequests() override;
+  void shutdown(std::chrono::milliseconds patience) override;
+
+ private:
+  void handIn(std::unique_ptr<PendingHttpRequest> request);
+  // Why there is no running loop; none when there is one.
+  std::optional<std::string> ensureRunning();
+  void wake();
+
+  // Constant after construction.
+  WorkPool& _pool;
+  const HttpClientOptions _options;
+
+  HttpIntake _intake;
+  std::mutex _threadMutex;                  // guards starting and joining the thread
+  std::unique_ptr<HttpTransferLoop> _loop;  // made under _threadMutex, kept until destruction
+  std::thread _thread;                      // guarded by _threadMutex
+  bool _shutDown = false;                   // guarded by _threadMutex
+  std::atomic<HttpTransferLoop*> _running{nullptr};
+};
+
+}  // namespace platform

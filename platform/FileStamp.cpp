@@ -1,0 +1,90 @@
+#include "platform/FileStamp.h"
+
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <sys/stat.h>
+
+#include <array>
+#include <cerrno>
+#include <system_error>
+
+#include "platform/UniqueFd.h"
+
+namespace platform {
+
+namespace {
+
+// The coarsest times among the file systems that a state directory may lie on.
+constexpr time_t kGranularitySeconds = 2;
+
+FileStamp stampFrom(const struct stat& status) {
+  FileStamp stamp;
+  stamp.exists = true;
+  stamp.device = status.st_dev;
+  stamp.inode = status.st_ino;
+  stamp.size = status.st_size;
+  stamp.modified = status.st_mtim;
+  stamp.changed = status.st_ctim;
+  timespec now{};
+  ::clock_gettime(CLOCK_REALTIME, &now);
+  stamp.settled = now.tv_sec - status.st_ctim.tv_sec > kGranularitySeconds;
+  return stamp;
+}
+
+bool equal(const timespec& a, const timespec& b) {
+  return a.tv_sec == b.tv_sec && a.tv_nsec == b.tv_nsec;
+}
+
+Failure failure(const std::string& path, const std::string& reason) {
+  return {fmt::format("cannot read {}: {}", path, reason)};
+}
+
+}  // namespace
+
+FileStamp FileStamp::of(const std::string& path) {
+  struct stat status {};
+  if (::stat(path.c_str(), &status) == 0) return stampFrom(status);
+  FileStamp stamp;
+  stamp.settled = true;
+  return stamp;
+}
+
+FileStamp FileStamp::of(int fd) {
+  struct stat status {};
+  return ::fstat(fd, &status) == 0 ? stampFrom(status) : FileStamp{};
+}
+
+bool FileStamp::stillHolds(const FileStamp& now) const {
+  if (!settled || exists != now.exists) return false;
+  return !exists || (device == now.device && inode == now.inode && size == now.size && equal(modified, now.modified) &&
+                     equal(changed, now.changed));
+}
+
+Result<StampedContent> readStamped(const std::string& path, std::size_t maximumBytes) {
+  // Not blocking, so that a FIFO in the file's place cannot hold the caller.
+  const UniqueFd fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+  StampedContent content;
+  if (!fd) {
+    const int code = errno;
+    if (code != ENOENT && code != ENOTDIR) return failure(path, std::system_category().message(code));
+    content.stamp.settled = true;
+    return content;
+  }
+  struct stat status {};
+  if (::fstat(fd.get(), &status) != 0) return failure(path, std::system_category().message(errno));
+  if (!S_ISREG(status.st_mode)) return failure(path, "not a regular file");
+  content.stamp = stampFrom(status);
+  std::array<char, 16384> buffer;
+  for (;;) {
+    const ssize_t count = ::read(fd.get(), buffer.data(), buffer.size());
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return failure(path, std::system_category().message(errno));
+    if (count == 0) return content;
+    if (content.bytes.size() + static_cast<std::size_t>(count) > maximumBytes) {
+      return failure(path, fmt::format("more than {} bytes", maximumBytes));
+    }
+    content.bytes.append(buffer.data(), static_cast<std::size_t>(count));
+  }
+}
+
+}  // namespace platform

@@ -1,0 +1,16 @@
+#include "platform/HttpClient.h"
+
+#include <strings.h>
+
+#include <algorithm>
+
+namespace platform {
+
+const std::string* HttpResponse::header(std::string_view name) const {
+  const auto found = std::find_if(headers.begin(), headers.end(), [&](const HttpHeader& header) {
+    return header.name.size() == name.size() && ::strncasecmp(header.name.data(), name.data(), name.size()) == 0;
+  });
+  return found == headers.end() ? nullptr : &found->value;
+}
+
+}  // namespace platform

@@ -1,0 +1,106 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+#include "platform/UniqueFunction.h"
+#include "platform/WorkQueue.h"
+
+namespace platform {
+
+struct HttpHeader {
+  std::string name;
+  std::string value;
+};
+
+struct HttpRequest {
+  std::string method = "GET";       // or "POST"
+  std::string url;                  // http or https
+  std::vector<HttpHeader> headers;  // sent in this order; see HttpClient
+  std::string body;
+  // From the hand-in to the whole answer, waiting in the lane included; none: only the progress rule.
+  std::optional<std::chrono::milliseconds> timeout;
+  // The answer's body is read and thrown away.
+  bool discardResponseBody = false;
+};
+
+struct HttpResponse {
+  int status = 0;
+  std::vector<HttpHeader> headers;  // of the last answer, after redirects
+  std::string body;
+  // The first header of that name, compared without case; null when absent.
+  const std::string* header(std::string_view name) const;
+};
+
+// What came of a request: an answer, or a transport error's text (which carries the TLS library's reason), never both.
+struct HttpResult {
+  std::optional<HttpResponse> response;
+  std::string error;
+};
+
+// Requests of one lane start in the order in which they were handed in, the next when the one before has ended. Made by
+// the client; dropping the last reference lets requests already handed in run on.
+class HttpLane {
+ public:
+  virtual ~HttpLane() = default;
+};
+
+struct HttpLimits {
+  std::size_t laneBytes = 16U << 20U;   // waiting in one lane, each request charged its body plus 1 KiB
+  std::size_t totalBytes = 64U << 20U;  // waiting in all lanes
+  std::size_t responseBytes = 16U << 20U;
+  std::chrono::seconds noProgress{60};
+  int maximumRedirects = 5;
+};
+
+// The process's HTTP client, on one thread of its own that only moves bytes.
+//
+// http and https only; certificates and host names are verified; no "Expect" header, none added that the caller did not
+// ask for but Host (Accept, User-Agent and Content-Length only as given, or as HTTP needs them); a header whose value
+// holds control characters is left out with a warning, an empty value is sent empty. Redirects: at most 5; a POST is
+// repeated only on 307 and 308, and on other redirects the redirect itself is the answer; never from https to http.
+// Answers above 16 MiB fail. A request that does not fit a lane's or the client's limit fails at once with a transport
+// error that says so.
+//
+// Every call may come from any thread. Each completion runs exactly once.
+class HttpClient {
+ public:
+  // Unrefused: requests of the lane are exempt from the limits on waiting bytes.
+  enum class LaneKind { limited, unrefused };
+
+  using Completion = UniqueFunction<void(HttpResult)>;
+
+  virtual ~HttpClient() = default;
+  virtual std::shared_ptr<HttpLane> makeLane(LaneKind kind = LaneKind::limited) = 0;
+
+  // Hands the request in and returns. `observe`, when given, runs first, on the client's own thread (or the caller's
+  // when the request is refused at once): it must not block, lock for long or call the client. `completion` runs on the
+  // pool afterwards.
+  virtual void start(const std::shared_ptr<HttpLane>& lane, HttpRequest request,
+                     UniqueFunction<void(const HttpResult&)> observe, Completion completion) = 0;
+
+  // Hands the request in and waits, in a BlockingScope, for its end.
+  virtual HttpResult perform(const std::shared_ptr<HttpLane>& lane, HttpRequest request) = 0;
+
+  // Ends every request somebody waits for in perform(), now and later, with a transport error. For shutting down.
+  virtual void abortBlockingRequests() = 0;
+  // Waits up to `patience` for everything handed in to end, then fails the rest and joins the thread. Completions of
+  // what failed still run on the pool. Requests handed in later fail at once. Idempotent.
+  virtual void shutdown(std::chrono::milliseconds patience) = 0;
+};
+
+struct HttpClientOptions {
+  std::string caFile;  // PEM certificates trusted instead of the system's; empty: the system's
+  HttpLimits limits;
+};
+
+// The client over libcurl's multi interface. The pool outlives it.
+std::unique_ptr<HttpClient> makeCurlHttpClient(WorkPool& pool, HttpClientOptions options);
+
+}  // namespace platform

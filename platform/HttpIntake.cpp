@@ -1,0 +1,82 @@
+#include "platform/HttpIntake.h"
+
+#include <fmt/format.h>
+
+#include <utility>
+
+#include "platform/HttpLaneQueue.h"
+
+namespace platform {
+
+namespace {
+
+constexpr std::size_t kChargePerRequest = 1024;  // for headers, URL and what keeps the request together
+
+bool fits(std::size_t charge, std::size_t used, std::size_t limit) {
+  return charge <= limit && used <= limit - charge;
+}
+
+}  // namespace
+
+HttpIntake::Entry HttpIntake::handIn(std::unique_ptr<PendingHttpRequest>& request) {
+  HttpLaneQueue& lane = *request->lane;
+  const std::size_t charge = lane.isLimited() ? request->request.body.size() + kChargePerRequest : 0;
+  const std::lock_guard guard(_mutex);
+  if (_closed) return {"The HTTP client has been shut down", false};
+  if (_abortBlocking && request->blocking) return {"Aborted: the process is ending", false};
+  if (lane.isLimited() && !fits(charge, lane.charged, _limits.laneBytes)) {
+    return {fmt::format("Refused: {} bytes wait in this lane, {} more would exceed its limit of {}", lane.charged,
+                        charge, _limits.laneBytes),
+            false};
+  }
+  if (lane.isLimited() && !fits(charge, _charged, _limits.totalBytes)) {
+    return {fmt::format("Refused: {} bytes wait in all lanes, {} more would exceed the limit of {}", _charged, charge,
+                        _limits.totalBytes),
+            false};
+  }
+  request->charge = charge;
+  lane.charged += charge;
+  _charged += charge;
+  ++_unfinished;
+  _handedIn.push_back(std::move(request));
+  return {std::nullopt, _handedIn.size() == 1};
+}
+
+HttpIntake::Orders HttpIntake::take() {
+  const std::lock_guard guard(_mutex);
+  return {std::exchange(_handedIn, {}), _abortBlocking, _stop};
+}
+
+void HttpIntake::release(const PendingHttpRequest& request) {
+  const std::lock_guard guard(_mutex);
+  request.lane->charged -= request.charge;
+  _charged -= request.charge;
+}
+
+void HttpIntake::ended() {
+  const std::lock_guard guard(_mutex);
+  if (--_unfinished == 0) _empty.notify_all();
+}
+
+void HttpIntake::abortBlocking() {
+  const std::lock_guard guard(_mutex);
+  _abortBlocking = true;
+}
+
+void HttpIntake::close() {
+  const std::lock_guard guard(_mutex);
+  _closed = true;
+}
+
+bool HttpIntake::waitUntilEmpty(std::chrono::milliseconds patience) {
+  std::unique_lock lock(_mutex);
+  return _empty.wait_for(lock, patience, [&] { return _unfinished == 0; });
+}
+
+void HttpIntake::stop() {
+  const std::lock_guard guard(_mutex);
+  _closed = true;
+  _stop = true;
+}
+
+}  // namespace platform

@@ -1,0 +1,62 @@
+#pragma once
+
+#include <chrono>
+#include <condition_variable>
+#include <cstddef>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/HttpClient.h"
+#include "platform/PendingHttpRequest.h"
+
+namespace platform {
+
+// The door between callers and the HTTP thread: takes requests in their order, charges them against the limits, and
+// knows when all have ended. Owned by the client. Thread-safe.
+class HttpIntake {
+ public:
+  explicit HttpIntake(const HttpLimits& limits) : _limits(limits) {}
+
+  struct Entry {
+    std::optional<std::string> refusal;  // why the request was not taken; it then stays with the caller
+    bool wake = false;                   // the HTTP thread may be asleep
+  };
+  Entry handIn(std::unique_ptr<PendingHttpRequest>& request);
+
+  struct Orders {
+    std::vector<std::unique_ptr<PendingHttpRequest>> requests;
+    bool abortBlocking = false;
+    bool stop = false;  // nothing is taken in from now on
+  };
+  // For the HTTP thread: what came in since the last call.
+  Orders take();
+  // A request's bytes no longer wait. Before its completion runs, so that this may hand in the next.
+  void release(const PendingHttpRequest& request);
+  // A request has ended, its completion is on its way.
+  void ended();
+
+  void abortBlocking();
+  // Takes nothing more in.
+  void close();
+  // Whether all that was taken in ended in time.
+  bool waitUntilEmpty(std::chrono::milliseconds patience);
+  void stop();
+
+ private:
+  const HttpLimits& _limits;
+
+  std::mutex _mutex;
+  std::condition_variable _empty;
+  // Guarded by _mutex.
+  std::vector<std::unique_ptr<PendingHttpRequest>> _handedIn;
+  std::size_t _charged = 0;     // of all limited lanes
+  std::size_t _unfinished = 0;  // taken in and not ended
+  bool _abortBlocking = false;
+  bool _closed = false;
+  bool _stop = false;
+};
+
+}  // namespace platform

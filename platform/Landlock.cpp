@@ -1,0 +1,76 @@
+#include "platform/Landlock.h"
+
+#include <linux/landlock.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <iterator>
+#include <string>
+#include <system_error>
+#include <utility>
+
+namespace platform {
+
+namespace {
+
+Failure failedStep(const char* step) {
+  return Failure{std::string(step) + ": " + std::generic_category().message(errno)};
+}
+
+Failure missingLandlock() {
+  const char* reason = errno == ENOSYS       ? "the kernel has no Landlock"
+                       : errno == EOPNOTSUPP ? "the kernel's Landlock is switched off"
+                                             : "the kernel's Landlock cannot be used";
+  return Failure{std::string(reason) + " (" + std::generic_category().message(errno) +
+                 "): use a kernel with CONFIG_SECURITY_LANDLOCK, booted with \"landlock\" in its lsm= list, "
+                 "or run without a sandbox by ORVANTA_SANDBOX=off"};
+}
+
+}  // namespace
+
+std::uint64_t landlockRightsOfAbi(int abi) {
+  std::uint64_t rights = 0;
+  if (abi >= 1) rights |= (std::uint64_t{kLandlockMakeSymbolicLink} << 1U) - 1;
+  if (abi >= 2) rights |= kLandlockRefer;
+  if (abi >= 3) rights |= kLandlockTruncate;
+  if (abi >= 5) rights |= kLandlockIoctlDevice;
+  return rights;
+}
+
+std::uint64_t landlockFileRights(std::uint64_t rights) {
+  return rights &
+         (kLandlockExecute | kLandlockWriteFile | kLandlockReadFile | kLandlockTruncate | kLandlockIoctlDevice);
+}
+
+Result<Landlock> Landlock::create() {
+  const long abi = ::syscall(SYS_landlock_create_ruleset, nullptr, 0, LANDLOCK_CREATE_RULESET_VERSION);
+  if (abi < 1) return missingLandlock();
+  // Only the first member, as the kernel of every ABI takes it; later ones would be about the network.
+  const std::uint64_t handled = landlockRightsOfAbi(static_cast<int>(abi));
+  const long fd = ::syscall(SYS_landlock_create_ruleset, &handled, sizeof handled, 0);
+  if (fd < 0) return failedStep("landlock_create_ruleset");
+  return Landlock(static_cast<int>(abi), UniqueFd(static_cast<int>(fd)));
+}
+
+Result<bool> Landlock::allow(const UniqueFd& target, std::uint64_t rights) {
+  struct stat status {};
+  if (::fstat(target.get(), &status) != 0) return failedStep("fstat");
+  landlock_path_beneath_attr rule{};
+  rule.allowed_access = rights & landlockRightsOfAbi(_abi);
+  if (!S_ISDIR(status.st_mode)) rule.allowed_access = landlockFileRights(rule.allowed_access);
+  rule.parent_fd = target.get();
+  if (rule.allowed_access == 0) return true;  // the kernel refuses empty rules
+  if (::syscall(SYS_landlock_add_rule, _ruleset.get(), LANDLOCK_RULE_PATH_BENEATH, &rule, 0) != 0) {
+    return failedStep("landlock_add_rule");
+  }
+  return true;
+}
+
+Result<bool> Landlock::restrictSelf() {
+  if (::syscall(SYS_landlock_restrict_self, _ruleset.get(), 0) != 0) return failedStep("landlock_restrict_self");
+  return true;
+}
+
+}  // namespace platform

@@ -1,0 +1,18 @@
+#include "platform/Listener.h"
+
+#include <utility>
+
+#include "platform/ServiceListener.h"
+#include "platform/ServiceSocket.h"
+
+namespace platform {
+
+Result<std::unique_ptr<Listener>> Listener::create(WorkPool& pool, const std::string& directory,
+                                                   const std::string& service, Handler handler) {
+  auto socket = openServiceSocket(directory, service);
+  if (!socket) return Failure{socket.error()};
+  return std::unique_ptr<Listener>(
+      std::make_unique<ServiceListener>(pool, std::move(*socket), std::move(handler), kMaximumConnectionsPerUser));
+}
+
+}  // namespace platform

@@ -1,0 +1,42 @@
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "platform/Connection.h"
+#include "platform/PeerIdentity.h"
+#include "platform/Result.h"
+#include "platform/WorkQueue.h"
+
+namespace platform {
+
+// A peer that has connected, offered to the listener's delegate.
+struct OfferedConnection {
+  std::shared_ptr<Connection> connection;  // not resumed yet; its description is set
+  PeerIdentity peer;
+};
+
+// Listens on a named service: a Unix stream socket in the runtime directory, or the one that systemd passed.
+//
+// The handler runs on the pool, possibly on several threads at once. It returns whether it admitted (and resumed) the
+// connection; a refused one is closed. When descriptors run out (EMFILE) accepting pauses for 100 ms instead of
+// spinning, with one log line a minute.
+class Listener {
+ public:
+  using Handler = std::function<bool(OfferedConnection&&)>;
+
+  // Takes LISTEN_FDS's socket if systemd passed one, else binds `directory`/`service`. A stale socket file is replaced;
+  // a live one fails with a text that says which process listens there. Connections above `maximumPerUser` of one uid
+  // are closed at once, with a log line.
+  static Result<std::unique_ptr<Listener>> create(WorkPool& pool, const std::string& directory,
+                                                  const std::string& service, Handler handler);
+  virtual ~Listener() = default;
+  virtual void resume() = 0;
+  // No handler runs after this returns, unless called from one. The socket file that create() made is removed.
+  virtual void stop() = 0;
+  // The most connections of one uid at a time; see docs/operation.md.
+  static constexpr std::size_t kMaximumConnectionsPerUser = 4096;
+};
+
+}  // namespace platform

@@ -1,0 +1,25 @@
+#pragma once
+
+#include <fmt/format.h>
+
+#include <iterator>
+
+#include "platform/LogSink.h"
+
+// Logs one line. The arguments are neither evaluated nor formatted when the level is off.
+#define PLATFORM_LOG(LEVEL, ...)                                          \
+  do {                                                                    \
+    if (::platform::logEnabled(::platform::LogLevel::LEVEL))              \
+      ::platform::logFormatted(::platform::LogLevel::LEVEL, __VA_ARGS__); \
+  } while (false)
+
+namespace platform {
+
+template <class... Args>
+void logFormatted(LogLevel level, fmt::format_string<Args...> format, Args&&... args) {
+  fmt::memory_buffer buffer;
+  fmt::format_to(std::back_inserter(buffer), format, std::forward<Args>(args)...);
+  writeLogLine(level, std::string_view(buffer.data(), buffer.size()));
+}
+
+}  // namespace platform

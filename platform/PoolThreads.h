@@ -1,0 +1,67 @@
+#pragma once
+
+#include <chrono>
+#include <cstddef>
+#include <list>
+#include <mutex>
+#include <thread>
+
+namespace platform {
+
+// The threads of a WorkPool: a fixed number, and extra ones that stand in for threads that block.
+//
+// Owned by its pool. An extra thread starts when fewer than the fixed number would be left to run jobs, and ends once
+// it has been superfluous and without work for kLinger. All operations may be called from any thread.
+class PoolThreads {
+ public:
+  static constexpr std::chrono::milliseconds kLinger{1000};
+
+  // What the threads do: run jobs.
+  class Loop {
+   public:
+    virtual ~Loop() = default;
+    virtual void runUntilStopped() = 0;
+    // Runs one job; false when none came up for so long, or the loop was stopped.
+    virtual bool runOne(std::chrono::milliseconds patience) = 0;
+  };
+
+  PoolThreads(Loop& loop, std::size_t threads, std::size_t extraThreads);
+  PoolThreads(const PoolThreads&) = delete;
+  PoolThreads& operator=(const PoolThreads&) = delete;
+  ~PoolThreads() = default;  // after join()
+
+  void start();
+  // From now on no thread starts. The loop is to be stopped between this and join().
+  void closeDown();
+  void join();
+  std::size_t count() const;
+
+  // Around a stretch in which the calling thread, one of these, does nothing for the loop.
+  void blockingBegins();
+  void blockingEnds();
+
+  // The threads that the calling thread belongs to; null outside every pool.
+  static PoolThreads* current();
+
+ private:
+  void launch(bool extra);   // with _mutex held
+  bool superfluous() const;  // with _mutex held
+  void serveAsExtra();
+  bool retireIfSuperfluous();
+
+  // Constant after construction.
+  Loop& _loop;
+  const std::size_t _wanted;
+  const std::size_t _maximum;
+
+  mutable std::mutex _mutex;
+  // Guarded by _mutex.
+  std::list<std::thread> _threads;
+  std::thread _retired;  // ended or about to, joined by whoever comes next
+  std::size_t _running = 0;
+  std::size_t _blocked = 0;
+  bool _started = false;
+  bool _closed = false;
+};
+
+}  // namespace platform

@@ -1,0 +1,44 @@
+#include "platform/Process.h"
+
+#include <pthread.h>
+#include <sys/resource.h>
+
+#include <cerrno>
+#include <csignal>
+
+#include "platform/Log.h"
+
+namespace platform {
+
+namespace {
+sigset_t terminationSignals() {
+  sigset_t signals;
+  sigemptyset(&signals);
+  sigaddset(&signals, SIGTERM);
+  sigaddset(&signals, SIGINT);
+  return signals;
+}
+}  // namespace
+
+void enterUtilitySchedulingClass() {
+  constexpr int kUtilityNice = 5;
+  if (::setpriority(PRIO_PROCESS, 0, kUtilityNice) != 0) {
+    PLATFORM_LOG(info, "enterUtilitySchedulingClass: The scheduling priority stays as it is (error {})", errno);
+  }
+}
+
+void blockTerminationSignals() {
+  const sigset_t signals = terminationSignals();
+  ::pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+  ::signal(SIGPIPE, SIG_IGN);
+}
+
+int waitForTermination() {
+  const sigset_t signals = terminationSignals();
+  for (;;) {
+    const int signal = ::sigwaitinfo(&signals, nullptr);
+    if (signal > 0) return signal;
+  }
+}
+
+}  // namespace platform

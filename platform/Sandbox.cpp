@@ -1,0 +1,116 @@
+#include "platform/Sandbox.h"
+
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <sys/prctl.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <optional>
+#include <system_error>
+#include <utility>
+#include <vector>
+
+#include "platform/Landlock.h"
+#include "platform/PropertyList.h"
+#include "platform/SandboxProfile.h"
+
+namespace platform {
+
+namespace {
+
+std::string describeErrno() {
+  return std::generic_category().message(errno);
+}
+
+// The directory in which `path` lies once symbolic links are followed; the path itself when it leads to a directory.
+// Files are replaced by renaming, and a rule for the old one would not hold for the new one.
+Result<std::string> realDirectoryOf(const std::string& path) {
+  std::error_code error;
+  const std::filesystem::path real = std::filesystem::canonical(path, error);
+  if (error) return Failure{fmt::format("cannot resolve {}: {}", path, error.message())};
+  const std::filesystem::path directory = std::filesystem::is_directory(real, error) ? real : real.parent_path();
+  return directory.string();
+}
+
+// A profile's file rules being carried over into Landlock.
+class FileRules {
+ public:
+  FileRules(Landlock& landlock, const std::map<std::string, std::string>& variables)
+      : _landlock(landlock), _variables(variables) {}
+
+  Result<bool> add(const SandboxProfile::FileRule& rule) {
+    for (const std::string& path : rule.paths) {
+      if (auto added = addPath(path, false, rule); !added) return added;
+    }
+    for (const std::string& path : rule.directoriesOf) {
+      if (auto added = addPath(path, true, rule); !added) return added;
+    }
+    return true;
+  }
+
+  std::size_t added() const { return _added; }
+  const std::vector<std::string>& skipped() const { return _skipped; }
+
+ private:
+  Result<bool> addPath(const std::string& written, bool itsDirectory, const SandboxProfile::FileRule& rule) {
+    auto path = fillPlaces(written, _variables);
+    if (!path) return skip(rule, written, written + " has a variable without a value");
+    if (itsDirectory) {
+      auto directory = realDirectoryOf(*path);
+      if (!directory) return skip(rule, written, directory.error());
+      path = std::move(*directory);
+    }
+    if (*path == "/") return skip(rule, written, written + " leads to the root directory, which is not opened up");
+    const UniqueFd target(::open(path->c_str(), O_PATH | O_CLOEXEC));
+    if (!target) return skip(rule, *path, fmt::format("cannot open {}: {}", *path, describeErrno()));
+    if (auto allowed = _landlock.allow(target, rule.rights); !allowed) {
+      return Failure{fmt::format("rule for {}: {}", *path, allowed.error())};
+    }
+    ++_added;
+    return true;
+  }
+
+  Result<bool> skip(const SandboxProfile::FileRule& rule, const std::string& path, std::string reason) {
+    if (!rule.optional) return Failure{std::move(reason)};
+    _skipped.push_back(path);
+    return true;
+  }
+
+  Landlock& _landlock;
+  const std::map<std::string, std::string>& _variables;
+  std::size_t _added = 0;
+  std::vector<std::string> _skipped;
+};
+
+}  // namespace
+
+Result<std::string> enterSandbox(const std::string& directory, const std::string& name,
+                                 const std::map<std::string, std::string>& variables) {
+  const std::string path = directory + "/" + name + ".plist";
+  const auto document = readPropertyListFile(path);
+  if (!document) return Failure{fmt::format("sandbox profile {}: {}", name, document.error())};
+  const auto profile = SandboxProfile::fromPropertyList(*document);
+  if (!profile) return Failure{fmt::format("sandbox profile {}: {}", path, profile.error())};
+
+  if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) {
+    return Failure{fmt::format("sandbox profile {}: no-new-privileges: {}", name, describeErrno())};
+  }
+  auto landlock = Landlock::create();
+  if (!landlock) return Failure{fmt::format("sandbox profile {}: {}", name, landlock.error())};
+  FileRules rules(*landlock, variables);
+  for (const SandboxProfile::FileRule& rule : profile->files) {
+    if (auto added = rules.add(rule); !added) {
+      return Failure{fmt::format("sandbox profile {}: {}", name, added.error())};
+    }
+  }
+  if (auto restricted = landlock->restrictSelf(); !restricted) {
+    return Failure{fmt::format("sandbox profile {}: {}", name, restricted.error())};
+  }
+  std::string text =
+      fmt::format("sandbox profile {}: {} file rules, Landlock ABI {}", name, rules.added(), landlock->abi());
+  if (!rules.skipped().empty()) text += fmt::format(", not present: {}", fmt::join(rules.skipped(), " "));
+  return text;
+}
+
+}  // namespace platform

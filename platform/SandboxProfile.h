@@ -1,0 +1,33 @@
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/Result.h"
+#include "platform/Value.h"
+
+namespace platform {
+
+// What a sandbox profile's property list says, checked but not yet applied to any file system. Its format is described
+// in docs/operation.md. Plain data.
+struct SandboxProfile {
+  struct FileRule {
+    std::vector<std::string> paths;          // as written, with their ${NAME} places
+    std::vector<std::string> directoriesOf;  // the same; the directory in which each really lies is meant
+    std::uint64_t rights = 0;                // of LandlockRight
+    bool optional = false;                   // a path that does not exist, or has an empty variable, is skipped
+  };
+  std::vector<FileRule> files;
+
+  // Strict: a key or word that is not known is an error, which names the place and the nearest known one.
+  static Result<SandboxProfile> fromPropertyList(const Value& document);
+};
+
+// `path` with its ${NAME} places filled; none when a variable is absent or empty.
+std::optional<std::string> fillPlaces(std::string_view path, const std::map<std::string, std::string>& variables);
+
+}  // namespace platform

@@ -1,0 +1,146 @@
+#include "platform/ServiceListener.h"
+
+#include <fmt/format.h>
+#include <sys/socket.h>
+
+#include <cerrno>
+#include <cstring>
+#include <utility>
+
+#include "platform/Log.h"
+#include "platform/SocketConnection.h"
+
+namespace platform {
+
+namespace {
+
+constexpr int kAcceptsPerTurn = 16;
+constexpr std::chrono::milliseconds kPause{100};
+constexpr std::chrono::minutes kLogInterval{1};
+
+// Whose handler the calling thread is inside: stop() must not wait for its own caller.
+thread_local const Acceptor* tOffering = nullptr;
+
+// Whether a line that could come at any rate is due again.
+bool isDue(std::optional<std::chrono::steady_clock::time_point>& logged) {
+  const auto now = std::chrono::steady_clock::now();
+  if (logged && now - *logged < kLogInterval) return false;
+  logged = now;
+  return true;
+}
+
+}  // namespace
+
+Acceptor::Acceptor(WorkPool& pool, ServiceSocket socket, Listener::Handler handler, std::size_t maximumPerUser)
+    : _pool(pool),
+      _handler(std::move(handler)),
+      _maximumPerUser(maximumPerUser),
+      _queue(pool.makeQueue()),
+      _socket(std::move(socket)),
+      _quota(maximumPerUser) {}
+
+void Acceptor::start() {
+  _queue->post([self = shared_from_this()] { self->acceptSome(); });
+}
+
+void Acceptor::acceptSome() {
+  if (_closed) return;
+  if (!_watch) _watch = _queue->makeDescriptorWatch(_socket.socket.get());
+  for (int i = 0; i < kAcceptsPerTurn; ++i) {
+    if (!acceptOne()) return;
+  }
+  start();  // others first
+}
+
+// False when there is nothing more to accept for now; then what comes next has been seen to.
+bool Acceptor::acceptOne() {
+  UniqueFd socket(::accept4(_socket.socket.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+  if (socket) {
+    admit(std::move(socket));
+    return true;
+  }
+  switch (errno) {
+    case EINTR:
+    case ECONNABORTED:
+      return true;
+    case EAGAIN:
+      _watch->whenReadable([self = shared_from_this()] { self->acceptSome(); });
+      return false;
+    default:
+      pause(errno);
+      return false;
+  }
+}
+
+void Acceptor::pause(int error) {
+  if (isDue(_pauseLogged)) {
+    PLATFORM_LOG(error, "Listener: No connection can be accepted, trying again every {} ms: {}", kPause.count(),
+                 std::strerror(error));
+  }
+  if (!_timer) _timer = _queue->makeTimer();
+  _timer->runAfter(kPause, [self = shared_from_this()] { self->acceptSome(); });
+}
+
+void Acceptor::admit(UniqueFd socket) {
+  auto peer = peerIdentityOf(socket.get());
+  if (!peer) {
+    PLATFORM_LOG(warning, "Listener: A connection was closed: {}", peer.error());
+    return;
+  }
+  auto place = _quota.take(peer->uid);
+  if (!place) {
+    if (isDue(_refusalLogged)) {
+      PLATFORM_LOG(warning, "Listener: A connection was closed: User {} has {} already", peer->uid, _maximumPerUser);
+    }
+    return;
+  }
+  _pool.post(
+      [self = shared_from_this(), socket = std::move(socket), peer = std::move(*peer),
+       place = std::move(place)]() mutable { self->offer(std::move(socket), std::move(peer), std::move(place)); });
+}
+
+void Acceptor::offer(UniqueFd socket, PeerIdentity peer, std::shared_ptr<void> place) {
+  {
+    const std::lock_guard lock(_mutex);
+    if (_stopped) return;
+    ++_offering;
+  }
+  const Acceptor* const before = std::exchange(tOffering, this);
+  const int fd = socket.get();
+  const auto connection = SocketConnection::create(_pool, std::move(socket), {});
+  connection->setDescription(fmt::format("fd {} (pid {}, uid {})", fd, peer.pid, peer.uid));
+  connection->hold(std::move(place));
+  if (!_handler({connection, std::move(peer)})) connection->cancel(std::chrono::milliseconds(0));
+  tOffering = before;
+
+  const std::lock_guard lock(_mutex);
+  --_offering;
+  _idle.notify_all();
+}
+
+void Acceptor::stop() {
+  {
+    const std::lock_guard lock(_mutex);
+    if (!_stopped) {
+      _stopped = true;
+      _socket.removeFile();
+      _queue->post([self = shared_from_this()] { self->close(); });
+    }
+  }
+  const std::size_t own = tOffering == this ? 1 : 0;
+  std::unique_lock lock(_mutex);
+  if (_offering <= own) return;
+  lock.unlock();
+  const BlockingScope blocking;
+  lock.lock();
+  _idle.wait(lock, [&] { return _offering <= own; });
+}
+
+void Acceptor::close() {
+  _closed = true;
+  _watch.reset();
+  _timer.reset();
+  _socket.socket.reset();
+}
+
+}  // namespace platform

@@ -1,0 +1,76 @@
+#pragma once
+
+#include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <cstddef>
+#include <memory>
+#include <mutex>
+#include <optional>
+
+#include "platform/ConnectionQuota.h"
+#include "platform/Listener.h"
+#include "platform/ServiceSocket.h"
+#include "platform/WorkQueue.h"
+
+namespace platform {
+
+// What a ServiceListener does, apart from it so that work under way can outlive it. Accepts on a queue of its own,
+// offers on whatever thread of the pool.
+class Acceptor final : public std::enable_shared_from_this<Acceptor> {
+ public:
+  Acceptor(WorkPool& pool, ServiceSocket socket, Listener::Handler handler, std::size_t maximumPerUser);
+
+  void start();
+  void stop();
+
+ private:
+  using Instant = std::chrono::steady_clock::time_point;
+
+  // On _queue.
+  void acceptSome();
+  bool acceptOne();
+  void admit(UniqueFd socket);
+  void pause(int error);
+  void close();
+
+  // On any thread of the pool.
+  void offer(UniqueFd socket, PeerIdentity peer, std::shared_ptr<void> place);
+
+  // Constant after construction.
+  WorkPool& _pool;
+  const Listener::Handler _handler;
+  const std::size_t _maximumPerUser;
+  const std::shared_ptr<WorkQueue> _queue;
+
+  // Owned by _queue.
+  ServiceSocket _socket;  // stop() removes its file, which the queue never touches
+  ConnectionQuota _quota;
+  std::unique_ptr<DescriptorWatch> _watch;
+  std::unique_ptr<Timer> _timer;
+  bool _closed = false;
+  std::optional<Instant> _pauseLogged;
+  std::optional<Instant> _refusalLogged;
+
+  std::mutex _mutex;
+  std::condition_variable _idle;
+  // Guarded by _mutex.
+  bool _stopped = false;
+  std::size_t _offering = 0;  // handlers under way
+};
+
+// The Listener on a service socket.
+class ServiceListener final : public Listener {
+ public:
+  ServiceListener(WorkPool& pool, ServiceSocket socket, Handler handler, std::size_t maximumPerUser)
+      : _acceptor(std::make_shared<Acceptor>(pool, std::move(socket), std::move(handler), maximumPerUser)) {}
+  ~ServiceListener() override { _acceptor->stop(); }
+
+  void resume() override { _acceptor->start(); }
+  void stop() override { _acceptor->stop(); }
+
+ private:
+  const std::shared_ptr<Acceptor> _acceptor;
+};
+
+}  // namespace platform

@@ -1,0 +1,120 @@
+#pragma once
+
+#include <atomic>
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <span>
+#include <thread>
+#include <vector>
+
+#include "platform/Connection.h"
+#include "platform/SocketIo.h"
+#include "platform/UniqueFd.h"
+#include "platform/WorkQueue.h"
+
+namespace platform {
+
+// The outbox of a SocketConnection, which makes it, keeps the socket open until close(), and hears of its progress.
+//
+// send() may be called on any thread. What the socket does not take at once waits here, and is written when the socket
+// becomes writable: on a queue of its own, since the connection's may be busy for long. After a failed write everything
+// is dropped, what waits and what comes.
+class SocketOutbox final : public Outbox, public std::enable_shared_from_this<SocketOutbox> {
+ public:
+  // Above this, gathered messages are written before their batch ends.
+  static constexpr std::size_t kGatherAtMost = 64U << 10U;
+
+  class Observer {
+   public:
+    virtual ~Observer() = default;
+    // What awaitAtMost() waited for has come, or a write has failed. On any thread, without locks held.
+    virtual void outboxEased() = 0;
+  };
+
+  SocketOutbox(WorkPool& pool, int socket, std::size_t maximumDroppable);
+  // Once, before the first send.
+  void setObserver(std::weak_ptr<Observer> observer) { _observer = std::move(observer); }
+
+  bool send(std::span<const std::uint8_t> message, Urgency urgency) override;
+  bool sendWithDescriptor(std::span<const std::uint8_t> message, UniqueFd descriptor) override;
+  std::size_t pending() const override { return _pending.load(std::memory_order_relaxed); }
+
+  // Between the two, what the calling thread sends is gathered.
+  void beginGathering();
+  void endGathering();
+  void writeGathered();
+
+  bool broken() const;
+  // True when no more than `limit` bytes wait or a write has failed; otherwise the observer hears it once that is so.
+  bool awaitAtMost(std::size_t limit);
+  // Takes nothing more, and shuts down the sending side once all is written.
+  void finish();
+  // Takes nothing more, drops what waits; the socket is not touched afterwards.
+  void close();
+
+ private:
+  enum class State { open, finishing, finished, broken, closed };
+  // A descriptor that goes out with the byte at `begin`, in a call that sends nothing behind `end`; both count from the
+  // first byte ever sent.
+  struct Attachment {
+    std::uint64_t begin;
+    std::uint64_t end;
+    UniqueFd descriptor;
+  };
+  bool append(std::span<const std::uint8_t> message, Urgency urgency, UniqueFd descriptor);
+  // All below with _mutex held. Writing is whose turn it is: the waiter's while somebody waits, else everybody's.
+  bool mayWrite() const { return isUsable() && !_waiting; }
+  bool isUsable() const { return _state == State::open || _state == State::finishing; }
+  bool isGathering() const { return _gatherer == std::this_thread::get_id(); }
+  std::size_t waitingBytes() const { return _bytes.size() - _start; }
+  // Until nothing waits or the socket takes no more for now, which the result tells.
+  Sent::Kind writeWaiting();
+  Sent writeSome();
+  void keep(std::span<const std::uint8_t> rest);
+  void dropFront(std::size_t count);
+  void becomeUseless(State state);
+  // Ends every operation: what follows from how the last write went. Whom it returns is to be told once the lock is
+  // released.
+  [[nodiscard]] std::shared_ptr<Observer> settle(Sent::Kind last);
+  void startWaiting();
+
+  // On _writerQueue.
+  void waitUntilWritable(const std::shared_ptr<void>& owner);
+  void writeOn(const std::shared_ptr<void>& owner);
+  void retryLater(const std::shared_ptr<void>& owner);
+  void stopWaiting();
+
+  // Constant after construction, or set before the first send.
+  WorkPool& _pool;
+  const std::size_t _maximumDroppable;
+  std::weak_ptr<Observer> _observer;
+
+  std::atomic<std::size_t> _pending{0};  // written under _mutex
+
+  mutable std::mutex _mutex;
+  // Guarded by _mutex.
+  State _state = State::open;
+  int _socket;                       // the connection's; -1 once closed
+  std::vector<std::uint8_t> _bytes;  // from _start on: not yet taken by the socket
+  std::size_t _start = 0;
+  std::uint64_t _sent = 0;               // bytes that the socket has taken since the beginning
+  std::vector<Attachment> _attachments;  // in order
+  std::thread::id _gatherer;             // the thread whose messages are gathered
+  std::optional<std::size_t> _awaited;
+  bool _waiting = false;                    // somebody waits for the socket to become writable
+  std::shared_ptr<WorkQueue> _writerQueue;  // made when first needed
+
+  // Owned by _writerQueue. The watch has a descriptor of its own: once watched for writing, a descriptor reports
+  // whenever its peer reads, and the connection's should not; it lives only while something waits.
+  struct Writer {
+    UniqueFd socket;
+    std::unique_ptr<DescriptorWatch> watch;
+    std::unique_ptr<Timer> retry;
+  };
+  Writer _writer;
+};
+
+}  // namespace platform
