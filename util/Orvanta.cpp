@@ -1,0 +1,94 @@
+#include "util/Orvanta.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <optional>
+#include <system_error>
+#include <utility>
+#include <vector>
+
+#include "interface/OrvantaLogging.h"
+#include "platform/PropertyList.h"
+#include "platform/UniqueFd.h"
+
+namespace orvanta {
+
+namespace {
+
+constexpr const char* kVersionWithoutBundle = "8.0";
+constexpr const char* kRespectConsentKey = "uuid-respect-dnu";
+constexpr const char* kOverrideConsentKey = "uuid-override-dnu";
+constexpr std::size_t kLargestKeyFile = 64U << 10U;  // a 16,384-bit key takes 2 KiB
+
+// Not the object itself, which cannot be moved into the platform's keeping.
+struct OrvantaOfPlatform {
+  std::unique_ptr<Orvanta> orvanta;
+};
+
+std::string readVersion(const std::string& frameworkDirectory) {
+  const std::string path = frameworkDirectory + "/framework.plist";
+  if (::access(path.c_str(), F_OK) != 0 && errno == ENOENT) return kVersionWithoutBundle;
+  const auto bundle = platform::readPropertyListFile(path);
+  if (!bundle) {
+    ORVANTA_LOG(warning, "bundleVersion: {}; version {} is used", bundle.error(), kVersionWithoutBundle);
+    return kVersionWithoutBundle;
+  }
+  const platform::Dictionary* content = bundle->dictionary();
+  if (content == nullptr) {
+    ORVANTA_LOG(warning, "bundleVersion: {} is no dictionary; version {} is used", path, kVersionWithoutBundle);
+    return kVersionWithoutBundle;
+  }
+  const platform::Value* version = content->find("version");
+  if (version == nullptr) return kVersionWithoutBundle;
+  if (const std::string* text = version->string()) return *text;
+  if (version->isNumber()) return version->description();
+  ORVANTA_LOG(warning, "bundleVersion: \"version\" in {} is no text; version {} is used", path, kVersionWithoutBundle);
+  return kVersionWithoutBundle;
+}
+
+// The key file's bytes, or what keeps them from being read.
+platform::Result<std::vector<std::uint8_t>> readKeyFile(const std::string& path) {
+  const platform::UniqueFd file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+  if (!file) return platform::Failure{"cannot open " + path + ": " + std::generic_category().message(errno)};
+  std::vector<std::uint8_t> bytes(kLargestKeyFile);
+  const ssize_t count = ::read(file.get(), bytes.data(), bytes.size());
+  if (count < 0) return platform::Failure{"cannot read " + path + ": " + std::generic_category().message(errno)};
+  bytes.resize(static_cast<std::size_t>(count));
+  return bytes;
+}
+
+}  // namespace
+
+Orvanta& Orvanta::of(platform::Platform& platform) {
+  return *platform.once<OrvantaOfPlatform>([&] { return OrvantaOfPlatform{std::make_unique<Orvanta>(platform)}; })
+              .orvanta;
+}
+
+Orvanta::Orvanta(platform::Platform& platform)
+    : _platform(platform), _version(readVersion(platform.files().frameworkDirectory)) {}
+
+std::shared_ptr<const platform::RsaPublicKey> Orvanta::publicKey() {
+  const std::lock_guard lock(_mutex);
+  if (_key) return _key;
+  const std::string path = _platform.files().frameworkDirectory + "/publicKey.der";
+  const auto bytes = readKeyFile(path);
+  if (!bytes) {
+    ORVANTA_LOG(debug, "publicKey: {}", bytes.error());
+    return nullptr;
+  }
+  _key = platform::RsaPublicKey::fromDer(*bytes);
+  if (!_key) ORVANTA_LOG(debug, "publicKey: {} holds no RSA public key", path);
+  return _key;
+}
+
+std::string Orvanta::getPersistentIdentifierForDNU(bool respectConsent) {
+  platform::Value value =
+      _platform.defaults().valueOrStore(respectConsent ? kRespectConsentKey : kOverrideConsentKey,
+                                        [] { return platform::Value(platform::uuidText(platform::randomUuid())); });
+  return value.string() != nullptr ? std::move(*value.string()) : value.description();
+}
+
+}  // namespace orvanta

@@ -1,0 +1,34 @@
+#pragma once
+
+#include <memory>
+#include <string>
+
+#include "platform/Digest.h"
+#include "platform/Platform.h"
+
+namespace orvanta {
+
+// The client framework as installed on the device: its version, its verification key and the persistent identifiers
+// that it hands out. One per platform, made on first use; reads its files then, the key on each request for it until it
+// has one. Thread-safe.
+class Orvanta {
+ public:
+  static Orvanta& of(platform::Platform& platform);
+  explicit Orvanta(platform::Platform& platform);
+
+  // framework.plist's "version", or "8.0" when it has none.
+  const std::string& bundleVersion() const { return _version; }
+  // The resource publicKey.der; null when it is missing or no RSA key.
+  std::shared_ptr<const platform::RsaPublicKey> publicKey();
+  // A random UUID's text kept in the user defaults: one for devices whose consent is respected, another for reports
+  // that override it, so that the two can never be joined.
+  std::string getPersistentIdentifierForDNU(bool respectConsent);
+
+ private:
+  platform::Platform& _platform;
+  std::string _version;  // constant after construction
+  std::mutex _mutex;
+  std::shared_ptr<const platform::RsaPublicKey> _key;  // guarded by _mutex
+};
+
+}  // namespace orvanta

@@ -1,0 +1,223 @@
+#include "util/Storebag.h"
+
+#include <algorithm>
+#include <chrono>
+#include <cstdlib>
+#include <limits>
+#include <utility>
+#include <vector>
+
+#include "interface/OrvantaLogging.h"
+#include "platform/PropertyList.h"
+#include "util/ClientTypes.h"
+#include "util/DeviceInfo.h"
+#include "util/Environment.h"
+#include "util/Orvanta.h"
+
+namespace orvanta {
+
+using platform::Dictionary;
+using platform::HttpResponse;
+using platform::SharedDictionary;
+using platform::Value;
+
+namespace {
+
+constexpr const char* kServerOverrideKey = "orvanta_storebag_url";
+constexpr const char* kInternalServer = "https://internal-bags.kovalt.com/storebags/tamrel";
+constexpr const char* kPublicServer = "https://bags.kovalt.com/bags/tamrel";
+constexpr std::chrono::seconds kRequestTimeout{15};
+constexpr std::int32_t kLongestMaxAge = 86400;
+constexpr std::string_view kNameWithFallback = "confluo";
+
+struct StorebagServer {
+  std::string url;
+};
+
+struct StorebagLane {
+  std::shared_ptr<platform::HttpLane> lane;
+};
+
+std::span<const std::uint8_t> bytesOf(std::string_view text) {
+  return {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()};
+}
+
+// Headers that came more than once count as one, joined by commas.
+std::optional<std::string> cacheControlOf(const HttpResponse& response) {
+  std::optional<std::string> joined;
+  for (const auto& [name, value] : response.headers) {
+    constexpr std::string_view kName = "cache-control";
+    const bool same = std::equal(name.begin(), name.end(), kName.begin(), kName.end(), [](char a, char b) {
+      return (a >= 'A' && a <= 'Z' ? static_cast<char>(a - 'A' + 'a') : a) == b;
+    });
+    if (!same) continue;
+    joined = joined ? *joined + ", " + value : value;
+  }
+  return joined;
+}
+
+// What the conferencing client gets when no server can be reached.
+SharedDictionary fallbackBag() {
+  const Dictionary section{{"brisk", Dictionary{{"active", true}}}};
+  return std::make_shared<const Dictionary>(Dictionary{{"kovalt_internal", section},
+                                                       {"development", section},
+                                                       {"release", section},
+                                                       {"version", "1.0.0-Confluo-Fallback"},
+                                                       {"refresh_cycle", 3600}});
+}
+
+// The bytes of a base64 text under `key`; none when the document has no such text or it does not decode.
+std::optional<std::vector<std::uint8_t>> decodedMember(const Dictionary& document, std::string_view key) {
+  const Value* member = document.find(key);
+  if (member == nullptr || member->string() == nullptr) return std::nullopt;
+  return platform::decodeBase64(*member->string());
+}
+
+// The inner bag of a downloaded document, once its signature has been verified; null for anything else.
+SharedDictionary openDocument(platform::Platform& platform, std::string_view body) {
+  const auto document = platform::parsePropertyList(bytesOf(body));
+  if (!document) ORVANTA_LOG(error, "fetchStorebagWithName: propertyListWithData error {}", document.error());
+  const Dictionary* content = document ? document->dictionary() : nullptr;
+  if (content == nullptr || !content->contains("signature")) {
+    ORVANTA_LOG(error, "fetchStorebagWithName: Signature is missing");
+    return nullptr;
+  }
+  const auto key = Orvanta::of(platform).publicKey();
+  if (!key) return nullptr;
+  const auto signature = decodedMember(*content, "signature");
+  if (!signature) return nullptr;
+  const auto bag = decodedMember(*content, "bag");
+  if (!bag) return nullptr;
+  if (!verifyStorebagSignature(*key, *bag, *signature)) {
+    ORVANTA_LOG(error, "fetchStorebagWithName: Signature can not be verified, {}", fmt::ptr(key.get()));
+    return nullptr;
+  }
+  auto inner = platform::parsePropertyList(*bag);
+  if (!inner || inner->dictionary() == nullptr) return nullptr;
+  return std::make_shared<const Dictionary>(std::move(*inner->dictionary()));
+}
+
+}  // namespace
+
+std::optional<std::string> userDefaultStringForKey(platform::Platform& platform, std::string_view key) {
+  return platform.defaults().text(key);
+}
+
+const std::string& storebagServerURL(platform::Platform& platform) {
+  return platform
+      .once<StorebagServer>([&] {
+        auto url = userDefaultStringForKey(platform, kServerOverrideKey);
+        if (!url) url = isInternalBuild(platform) ? kInternalServer : kPublicServer;
+        return StorebagServer{std::move(*url)};
+      })
+      .url;
+}
+
+bool verifyStorebagSignature(const platform::RsaPublicKey& key, std::span<const std::uint8_t> bag,
+                             std::span<const std::uint8_t> signature) {
+  return key.verifySha1(platform::sha1(bag), signature);
+}
+
+std::int32_t maxAgeFromCacheControl(std::optional<std::string_view> cacheControl) {
+  if (!cacheControl) return kLongestMaxAge;
+  std::string_view rest = *cacheControl;
+  bool previousIsMaxAge = false;
+  while (true) {
+    const std::size_t end = rest.find_first_of("= ");
+    const std::string_view piece = rest.substr(0, end);
+    if (previousIsMaxAge) {
+      const long long number = std::strtoll(std::string(piece).c_str(), nullptr, 10);
+      using Limits = std::numeric_limits<std::int32_t>;
+      return static_cast<std::int32_t>(std::clamp<long long>(number, Limits::min(), Limits::max()));
+    }
+    if (end == std::string_view::npos) return kLongestMaxAge;
+    previousIsMaxAge = piece == "max-age";
+    rest.remove_prefix(end + 1);
+  }
+}
+
+SharedDictionary fetchStorebagWithName(platform::Platform& platform, const std::string& name, StorebagFetch& fetch) {
+  platform::HttpRequest request;
+  request.url = storebagServerURL(platform) + "/" + name + "?version=" + Orvanta::of(platform).bundleVersion();
+  request.timeout = kRequestTimeout;
+  const std::string url = request.url;
+  ORVANTA_LOG(debug, "fetchStorebagWithName: Storebag Server URL: {}", url);
+  if (fetch.lastModified) {
+    ORVANTA_LOG(debug, "fetchStorebagWithName: Adding 'Last-Modified: {}' to the header", *fetch.lastModified);
+    request.headers.push_back({"If-Modified-Since", *fetch.lastModified});
+  }
+  const auto& lane = platform
+                         .once<StorebagLane>([&] {
+                           return StorebagLane{platform.http().makeLane(platform::HttpClient::LaneKind::unrefused)};
+                         })
+                         .lane;
+  const platform::HttpResult result = platform.http().perform(lane, std::move(request));
+  if (!result.response) {
+    ORVANTA_LOG(info, "fetchStorebagWithName: Error resolving with lookup server {}, sendSynchronousRequest error {}",
+                url, result.error);
+    if (name != kNameWithFallback) return nullptr;
+    ORVANTA_LOG(info, "fetchStorebagWithName: Loading default storebag '{}'", name);
+    return fallbackBag();
+  }
+  const HttpResponse& response = *result.response;
+  fetch.maxAge = maxAgeFromCacheControl(cacheControlOf(response));
+  if (const std::string* stamp = response.header("Last-Modified")) {
+    if (response.body.empty() && fetch.lastModified) {
+      ORVANTA_LOG(debug, "fetchStorebagWithName: storebag content has not changed. using its cached version");
+      fetch.notModified = true;
+      return nullptr;
+    }
+    fetch.lastModified = *stamp;
+    ORVANTA_LOG(debug, "fetchStorebagWithName: New 'Last-Modified: {}' received", *stamp);
+  }
+  return openDocument(platform, response.body);
+}
+
+SharedDictionary fetchStorebagForEnvironmentAndClientType(platform::Platform& platform, std::int32_t clientType,
+                                                          StorebagFetch& fetch) {
+  const auto name = storebagNameForClientType(clientType);
+  if (!name) {
+    ORVANTA_LOG(error, "fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type {}",
+                clientType);
+    return nullptr;
+  }
+  const SharedDictionary bag = fetchStorebagWithName(platform, std::string(*name), fetch);
+  if (!bag) {
+    if (!fetch.notModified) {
+      ORVANTA_LOG(error, "fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type {}",
+                  clientType);
+    }
+    return nullptr;
+  }
+  const auto sectionNamed = [&](const char* sectionName) {
+    const Value* section = sectionName == nullptr ? nullptr : bag->find(sectionName);
+    return section == nullptr ? nullptr : section->dictionary();
+  };
+  const EnvironmentType environment = currentEnvironmentType(platform);
+  const char* sectionName = environmentSectionName(environment);
+  const Dictionary* section = sectionNamed(sectionName);
+  if (section == nullptr && environment == EnvironmentType::seed) {
+    ORVANTA_LOG(warning, "fetchStorebagForEnvironmentAndClientType: Seed section is missing in the storebag.");
+    sectionName = environmentSectionName(EnvironmentType::release);
+    section = sectionNamed(sectionName);
+  }
+  if (section == nullptr) {
+    ORVANTA_LOG(error,
+                "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type {} with {} "
+                "environment",
+                clientType, sectionName == nullptr ? "(null)" : sectionName);
+    return nullptr;
+  }
+  const Value* version = bag->find("version");
+  fetch.version = version == nullptr ? std::string() : version->description();
+  if (const Value* refreshCycle = bag->find("refresh_cycle")) {
+    constexpr std::int64_t kLowest = std::numeric_limits<std::int32_t>::min();
+    fetch.maxAge =
+        static_cast<std::int32_t>(std::clamp<std::int64_t>(refreshCycle->integerValue(), kLowest, kLongestMaxAge));
+    ORVANTA_LOG(info, "fetchStorebagForEnvironmentAndClientType: Store bag override MaxAge={}", fetch.maxAge);
+  }
+  // A copy, so that the other environments' sections do not stay in memory with it.
+  return std::make_shared<const Dictionary>(*section);
+}
+
+}  // namespace orvanta
