@@ -1,0 +1,42 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+namespace orvanta {
+
+// Under which identifier a backend posts. Used on the session's queue.
+class ClientIdentity {
+ public:
+  // How the user's consent and the storebag stand to each other.
+  enum DnuType : std::int32_t {
+    kConsentRespected = 0,
+    kConsentOverriddenNotGiven = 1,
+    kConsentOverriddenGiven = 2,
+  };
+
+  ClientIdentity(std::string respectDnu, std::string overrideDnu)
+      : _uuidRespectDnu(std::move(respectDnu)), _uuidOverrideDnu(std::move(overrideDnu)) {}
+
+  std::int32_t dnuType() const { return _dnuType; }
+  void setDnuType(std::int32_t type) { _dnuType = type; }
+  void setUuidCustom(std::string uuid) { _uuidCustom = std::move(uuid); }
+  void setExtrasOnInternal(std::int32_t extras) { _extrasOnInternal = extras; }
+
+  // The identifier of the next message. An internal device's own identifier stands in only where there is one.
+  const std::string& choose(bool isInternal, const std::string& udid) const {
+    if (_extrasOnInternal != 0 && isInternal && !udid.empty()) return udid;
+    if (!_uuidCustom.empty()) return _uuidCustom;
+    return _dnuType != kConsentRespected ? _uuidOverrideDnu : _uuidRespectDnu;
+  }
+
+ private:
+  const std::string _uuidRespectDnu;
+  const std::string _uuidOverrideDnu;
+  std::string _uuidCustom;  // empty: none
+  std::int32_t _dnuType = kConsentRespected;
+  std::int32_t _extrasOnInternal = 0;
+};
+
+}  // namespace orvanta

@@ -1,0 +1,170 @@
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "interface/OrvantaError.h"
+#include "platform/Clock.h"
+#include "platform/Platform.h"
+#include "platform/UniqueFunction.h"
+#include "platform/Value.h"
+#include "util/DeviceInfo.h"
+
+namespace orvanta {
+
+using platform::SharedArray;
+using platform::SharedDictionary;
+
+// Whether and how a backend reports.
+enum BackendState : std::int32_t {
+  kBackendWaiting = 0,  // for user info
+  kBackendDisabled = 1,
+  kBackendEnabled = 2,
+  kBackendSampledOut = 3,  // held
+};
+
+// Facts of the session and the device that every backend of a session shares. Set once, right after construction.
+struct BackendIdentity {
+  std::uint32_t sessionID = 0;
+  std::int32_t compType = 0;  // client type
+  std::uint16_t clientVersion = 0;
+  std::string udid;  // unique device identifier, at most 40 bytes; empty when the device reports none
+  std::optional<std::string> productVersion;
+  std::optional<std::string> buildVersion;
+  std::optional<std::string> hardwareType;  // product type
+  bool isInternal = false;
+  bool requireUserInfo = false;
+  std::string selfVersion;             // "major.middle.minor" of the client framework
+  platform::TimeValue startTimestamp;  // of the session
+};
+
+// Called exactly once: the text of what was flushed or none, and an error or none. Any thread, none of our locks held.
+using FlushCompletion = platform::UniqueFunction<void(std::optional<std::string>, std::optional<OrvantaError>)>;
+
+// One way to deliver a session's events. Every operation that a backend has no use for has a harmless default.
+//
+// Owned by its session (or by one one-off send), which calls everything on its own queue, one operation at a time, in
+// the order: factory, setIdentity, setBatchEvents, setUserInfoDict, then updateState, sends and flushes, at last
+// cleanup. Other sessions' threads may call state/setState, samplingThreshold/setSamplingThreshold,
+// setCorrelatedSessionID and combinedSessionIDString at any time meanwhile; HTTP threads may set the state. Kept by
+// shared_ptr because posts in flight hold weak references to it.
+class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
+ public:
+  // Draws the sampling factor: one draw per backend constructed, from the process's drand48 sequence.
+  OrvantaBackend(platform::Platform& platform, std::string name, SharedDictionary profile, std::string productFamily);
+  virtual ~OrvantaBackend();
+  OrvantaBackend(const OrvantaBackend&) = delete;
+  OrvantaBackend& operator=(const OrvantaBackend&) = delete;
+
+  // --- What the session drives ---
+
+  virtual void cleanup() {}
+  virtual void updateState() { setState(kBackendEnabled); }
+  // Numbers the event and hands it on; the text for the message log, or none. `payload` may be null.
+  std::optional<std::string> sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
+                                         std::uint16_t method, std::uint16_t respCode, std::int32_t flag);
+  virtual std::optional<std::string> sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
+                                                 std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID,
+                                                 std::int32_t flag);
+  // The completion may be empty. The base calls it at once with neither result nor error.
+  virtual std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion);
+  // `descriptor` is the client's open file, borrowed for the call; -1 without one. `removeFile` asks the client to
+  // delete the file it opened. Blocks for the whole exchange.
+  struct UploadFile {
+    std::string path;
+    std::optional<std::string> extensionToken;
+    int descriptor = -1;
+    std::function<void()> removeFile;
+  };
+  virtual bool uploadFileAtPath(const UploadFile& file);
+  virtual bool uploadLogData(const SharedArray& logData);
+  // Any thread.
+  virtual void setCorrelatedSessionID(std::optional<std::string> combined) {
+    setCombinedSessionIDString(std::move(combined));
+  }
+
+  bool isWhitelistedEvent(std::uint16_t category) const;
+  bool isBlacklistedEvent(std::uint16_t category) const;
+
+  // --- Properties ---
+
+  void setIdentity(BackendIdentity identity);
+  const BackendIdentity& identity() const { return _identity; }
+  const std::string& name() const { return _name; }
+  const std::string& productFamily() const { return _productFamily; }
+  const std::optional<std::string>& displayURL() const { return _displayURL; }
+
+  std::int32_t state() const { return _state.load(std::memory_order_acquire); }
+  virtual void setState(std::int32_t state) { _state.store(state, std::memory_order_release); }
+  double samplingFactor() const { return _samplingFactor; }
+  void setSamplingFactor(double factor) { _samplingFactor = factor; }  // before the first evaluation
+  std::optional<double> samplingThreshold() const;
+  void setSamplingThreshold(std::optional<double> threshold);
+  std::optional<std::string> combinedSessionIDString() const;
+  void setCombinedSessionIDString(std::optional<std::string> combined);
+
+  bool batchEvents() const { return _batchEvents; }
+  void setBatchEvents(bool batch) { _batchEvents = batch; }
+  const SharedDictionary& userInfoDict() const { return _userInfoDict; }
+  virtual void setUserInfoDict(SharedDictionary userInfo) { _userInfoDict = std::move(userInfo); }
+
+  // The three version bytes of "major.middle.minor": leading integers, cut to 8 bits, 0 when missing.
+  struct SelfVersion {
+    std::uint8_t major = 0;
+    std::uint8_t middle = 0;
+    std::uint8_t minor = 0;
+    auto operator<=>(const SelfVersion&) const = default;
+    static SelfVersion parse(std::string_view text);
+    // "major.middle", and ".minor" unless that is 0.
+    std::string text() const;
+  };
+  SelfVersion selfVersion() const { return _selfVersion; }
+  double startTimeStamp() const { return _startTimeStamp; }
+
+  // 64 lower-case hexadecimal digits over the text's bytes.
+  static std::string convertIntoSHA256(std::string_view text);
+
+ protected:
+  platform::Platform& platform() const { return _platform; }
+  const SharedDictionary& profile() const { return _profile; }
+  void setDisplayURL(std::optional<std::string> url) { _displayURL = std::move(url); }
+  void setEventWhitelist(std::optional<std::vector<std::int32_t>> list) { _eventWhitelist = std::move(list); }
+  void setEventBlacklist(std::optional<std::vector<std::int32_t>> list) { _eventBlacklist = std::move(list); }
+  // For subclasses whose rules are compare-exchange.
+  std::atomic<std::int32_t>& stateCell() { return _state; }
+  std::mutex& mutex() const { return _mutex; }
+
+ private:
+  platform::Platform& _platform;
+  // Constant after construction (the identity and sampling factor: after set-up).
+  const std::string _name;
+  const SharedDictionary _profile;
+  const std::string _productFamily;
+  std::optional<std::string> _displayURL;
+  BackendIdentity _identity;
+  SelfVersion _selfVersion;
+  double _startTimeStamp = 0;
+  double _samplingFactor = 0;
+
+  // Session's queue only.
+  std::uint16_t _eventID = 0;
+  bool _batchEvents = false;
+  SharedDictionary _userInfoDict;
+  std::optional<std::vector<std::int32_t>> _eventWhitelist;
+  std::optional<std::vector<std::int32_t>> _eventBlacklist;
+
+  // Any thread.
+  std::atomic<std::int32_t> _state{kBackendWaiting};
+  mutable std::mutex _mutex;                            // the backend's one lock; subclasses use it too
+  std::optional<double> _samplingThreshold;             // guarded by _mutex
+  std::optional<std::string> _combinedSessionIDString;  // guarded by _mutex
+};
+
+}  // namespace orvanta

@@ -1,0 +1,152 @@
+#include "backends/PostQueue.h"
+
+#include <fmt/format.h>
+
+#include "interface/OrvantaLogging.h"
+#include "platform/Platform.h"
+#include "util/Compression.h"
+
+namespace orvanta {
+namespace {
+
+constexpr int kLocalFailure = -1;
+
+bool isServerError(int status) {
+  return status >= 500 && status <= 599;
+}
+
+// Counts a post from the hand-in until it is with the HTTP client, also when the pool drops the job.
+class PendingPost {
+ public:
+  explicit PendingPost(PendingPosts& posts) : _posts(&posts) { posts.begin(); }
+  PendingPost(PendingPost&& other) noexcept : _posts(std::exchange(other._posts, nullptr)) {}
+  PendingPost& operator=(PendingPost&&) = delete;
+  ~PendingPost() {
+    if (_posts != nullptr) _posts->end();
+  }
+
+ private:
+  PendingPosts* _posts;
+};
+
+}  // namespace
+
+PendingPosts& PendingPosts::of(platform::Platform& platform) {
+  struct Holder {
+    std::shared_ptr<PendingPosts> posts;
+  };
+  return *platform.once<Holder>([] { return Holder{std::make_shared<PendingPosts>()}; }).posts;
+}
+
+void PendingPosts::begin() {
+  const std::lock_guard lock(_mutex);
+  ++_count;
+}
+
+void PendingPosts::end() {
+  const std::lock_guard lock(_mutex);
+  if (--_count == 0) _changed.notify_all();
+}
+
+bool PendingPosts::waitUntilHandedIn(std::chrono::milliseconds patience) {
+  std::unique_lock lock(_mutex);
+  return _changed.wait_for(lock, patience, [&] { return _count == 0; });
+}
+
+// What is done when the post has ended. Shared by the two callbacks of the request; if both are dropped uncalled, the
+// completion hears of that.
+class PostQueue::Outcome {
+ public:
+  Outcome(std::weak_ptr<OrvantaBackend> backend, std::string backendName, PostCompletion completion)
+      : _backend(std::move(backend)), _backendName(std::move(backendName)), _completion(std::move(completion)) {}
+  Outcome(const Outcome&) = delete;
+  Outcome& operator=(const Outcome&) = delete;
+  ~Outcome() {
+    if (_completion) complete(makeOrvantaError("the post was dropped", kLocalFailure));
+  }
+
+  // On the HTTP client's thread. The backend, if this was its last reference, is let go of in finish().
+  void observe(const platform::HttpResult& result) {
+    if (!result.response || !isServerError(result.response->status)) return;
+    _kept = _backend.lock();
+    if (_kept) _kept->setState(kBackendDisabled);
+  }
+
+  void finish(const platform::HttpResult& result) {
+    _kept.reset();
+    std::optional<OrvantaError> error;
+    if (!result.response) {
+      ORVANTA_LOG(error, "HTTPSPostBackend(postJsonMessage): post error: {}", result.error);
+      error = makeOrvantaError(result.error, kLocalFailure);
+    } else if (isServerError(result.response->status)) {
+      const int status = result.response->status;
+      std::string text = fmt::format("backend {} disabled by server {} return code", _backendName, status);
+      ORVANTA_LOG(info, "postJSONMessage: {}", text);
+      error = makeOrvantaError(std::move(text), status);
+    }
+    complete(std::move(error));
+  }
+
+ private:
+  void complete(std::optional<OrvantaError> error) {
+    auto completion = std::move(_completion);
+    if (completion) completion(std::move(error));
+  }
+
+  const std::weak_ptr<OrvantaBackend> _backend;
+  const std::string _backendName;
+  PostCompletion _completion;
+  std::shared_ptr<OrvantaBackend> _kept;
+};
+
+PostQueue::PostQueue(platform::Platform& platform, std::weak_ptr<OrvantaBackend> backend, std::string backendName)
+    : _http(platform.http()),
+      _pendingPosts(PendingPosts::of(platform)),
+      _backend(std::move(backend)),
+      _backendName(std::move(backendName)),
+      _queue(platform.pool().makeQueue()),
+      _lane(_http.makeLane()) {}
+
+// A post that waits to be compressed.
+struct PostQueue::Job {
+  std::shared_ptr<PostQueue> queue;
+  Post post;
+  std::shared_ptr<Outcome> outcome;
+  PendingPost pending;
+};
+
+void PostQueue::post(Post post) {
+  const std::size_t charge = post.json.size();
+  const std::size_t before = _waitingBytes.fetch_add(charge);
+  auto outcome = std::make_shared<Outcome>(_backend, _backendName, std::move(post.completion));
+  if (before != 0 && before + charge > kMaximumWaitingBytes) {
+    _waitingBytes -= charge;
+    outcome->finish({std::nullopt, fmt::format("{} bytes wait to be posted already", before)});
+    return;
+  }
+  auto job =
+      std::make_unique<Job>(Job{shared_from_this(), std::move(post), std::move(outcome), PendingPost(_pendingPosts)});
+  _queue->post([job = std::move(job)] { job->queue->compressAndStart(*job); });
+}
+
+void PostQueue::compressAndStart(Job& job) {
+  const std::size_t charge = job.post.json.size();
+  platform::HttpRequest request;
+  request.method = "POST";
+  request.url = std::move(job.post.url);
+  request.headers = std::move(job.post.headers);
+  request.discardResponseBody = true;
+  auto compressed = gzipDeflate(job.post.json);
+  const bool smaller = compressed && !compressed->empty() && compressed->size() < charge;
+  request.body = smaller ? std::move(*compressed) : std::move(job.post.json);
+  request.headers.push_back({"Content-Length", std::to_string(request.body.size())});
+  if (smaller) request.headers.push_back({"Content-Encoding", "gzip"});
+  std::string().swap(job.post.json);
+  _waitingBytes -= charge;
+  _http.start(
+      _lane, std::move(request),
+      [outcome = job.outcome](const platform::HttpResult& result) { outcome->observe(result); },
+      [outcome = job.outcome](platform::HttpResult result) { outcome->finish(result); });
+}
+
+}  // namespace orvanta

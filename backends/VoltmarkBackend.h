@@ -1,0 +1,28 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+#include <utility>
+
+#include "backends/OrvantaBackend.h"
+
+namespace orvanta {
+
+// Copies events into the platform's power log. Called on its session's queue; failures of the log are not observed.
+class VoltmarkBackend final : public OrvantaBackend {
+ public:
+  using OrvantaBackend::OrvantaBackend;
+  static std::shared_ptr<VoltmarkBackend> create(platform::Platform& platform, std::string name,
+                                                 SharedDictionary profile, std::string productFamily) {
+    return std::make_shared<VoltmarkBackend>(platform, std::move(name), std::move(profile), std::move(productFamily));
+  }
+
+  // Always none. Events of category 0 and events without a payload are left out.
+  using OrvantaBackend::sendMessage;
+  std::optional<std::string> sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
+                                         std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID,
+                                         std::int32_t flag) override;
+};
+
+}  // namespace orvanta
