@@ -1,0 +1,149 @@
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "interface/ClientSessionInterface.h"
+#include "platform/Connection.h"
+#include "platform/Platform.h"
+#include "session/BackendSet.h"
+#include "session/ClientReplyProxy.h"
+#include "session/OrvantadSessionDelegate.h"
+#include "session/SessionInfoRecord.h"
+#include "util/DeviceInfo.h"
+
+namespace orvanta {
+
+// The daemon's side of one client connection: holds the session's description and its backends and carries out every
+// call of the client.
+//
+// Owned by the agent's session list and by the connection's handler. Every operation runs on the connection's queue,
+// one at a time, unless it says otherwise. end() is the last job there; after it the session can be dropped on any
+// thread. Failures are logged and answered as the operations describe; nothing here throws.
+class OrvantadSession final : public ClientSessionInterface, public std::enable_shared_from_this<OrvantadSession> {
+ public:
+  // `connection` may be null for a session without a client (tests): nothing is then handed back to one.
+  static std::shared_ptr<OrvantadSession> create(platform::Platform& platform, OrvantadSessionDelegate& delegate,
+                                                 std::shared_ptr<platform::Connection> connection);
+  ~OrvantadSession() override;
+
+  // --- The client's calls ---
+  void setSessionInfo(SharedDictionary sessionInfo, SharedDictionary userInfo, SharedArray frameworksToCheck,
+                      bool hasAggregationBlock, DoneReply done) override;
+  void startConfigWithCompletionHandler(BackendNamesReply completion) override;
+  void fetchStatesWithUserInfo(SharedDictionary userInfo, BackendNamesReply completion) override;
+  void fetchDisplayURL(StringReply reply) override;
+  void sendMessageWithCategory(std::uint16_t category, std::uint16_t type, SharedDictionary payload,
+                               StringReply reply) override;
+  void sendMessageWithDictionary(SharedDictionary parameters, StringReply reply) override;
+  void flushMessagesWithCompletion(FlushReply completion) override;
+  void finishSessionWithReply(StringReply reply) override;
+  void uploadFileAtPath(std::string fileURL, std::optional<std::string> extensionToken,
+                        UploadReply completion) override;
+  void uploadLogData(SharedArray logData, LogDataReply completion) override;
+  void sendMessageWithSessionInfo(SharedDictionary sessionInfo, SharedDictionary userInfo, std::uint16_t category,
+                                  std::uint16_t type, SharedDictionary payload, StringReply reply) override;
+
+  // Sends the session-end record, flushes, ends aggregation and cleans the backends up. Once, as the session's last
+  // job.
+  void end();
+
+  // --- What related sessions' threads call; they hold the agent's lock ---
+  std::uint32_t sessionID() const { return _sessionID; }
+  const std::string& sessionIDString() const { return _sessionIDString; }
+  std::uint32_t hierarchyLevel() const { return static_cast<std::uint32_t>(_hierarchy.level); }
+  const std::optional<std::string>& hierarchyToken() const { return _hierarchy.token; }
+  bool hasUserInfo() const { return _userInfo != nullptr; }
+  void updateCombinedSessionID();
+  void syncReportingStates();
+  // Any thread.
+  bool hasAggregator() const { return _hasAggregator.load(std::memory_order_acquire); }
+  void shutdownSessionAggregation();
+  // Whether the event was handed to this session's client: not when its aggregation has ended meanwhile. Any thread.
+  bool sendToAggregator(const SharedDictionary& sessionInfo, double timestamp, std::uint16_t category,
+                        std::uint16_t type, const SharedDictionary& payload);
+
+  // --- The session's own queue ---
+  const SharedDictionary& sessionInfo() const { return _sessionInfo; }
+  const SharedDictionary& userInfo() const { return _userInfo; }
+  const std::optional<std::string>& storebagVersion() const { return _storebagVersion; }
+  std::int32_t clientType() const { return _info.clientType; }
+  const BackendSet* backends() const { return _backends ? &*_backends : nullptr; }
+  // Whether the registry holds the session in some group; set by the agent.
+  bool isInGroup() const { return _inGroup; }
+  void setInGroup(bool inGroup) { _inGroup = inGroup; }
+  // For log lines.
+  std::string description() const;
+  const std::shared_ptr<platform::Connection>& connection() const { return _connection; }
+
+ private:
+  // One event on its way to the backends.
+  struct Message {
+    std::uint16_t category = 0;
+    std::uint16_t type = 0;
+    SharedDictionary payload;
+    std::int32_t flag = 0;
+  };
+
+  OrvantadSession(platform::Platform& platform, OrvantadSessionDelegate& delegate,
+                  std::shared_ptr<platform::Connection> connection);
+
+  // Setup.
+  void createBackendsWithStorebag(const SharedDictionary& storebag);
+  void sendStartMessage();
+  void receivedUserInfo(SharedDictionary userInfo);
+  void updateUserInfoForBackends();
+  void updateReportingStates();
+  void updateSessionWithDefaultSessionInfo();
+  BackendNames fetchReportingStates() const;
+  void configure(SharedDictionary sessionInfo);  // records and registration; shared fields under the agent's lock
+  // Held around changes of what related sessions read. Sessions outside every group take no lock.
+  std::unique_lock<AgentLock> lockSharedFields(bool joiningGroup = false);
+
+  // Intake.
+  std::optional<std::string> dispatch(const Message& message);
+  std::optional<std::string> send(std::uint16_t category, std::uint16_t type, SharedDictionary payload);
+  void internalSendMessage(SharedDictionary payload, std::uint16_t method, std::uint16_t respCode);
+  static void sendSingleMessage(platform::Platform& platform, const SharedDictionary& sessionInfo,
+                                const SharedDictionary& userInfo, const SharedDictionary& storebag,
+                                const Message& message);
+
+  // Aggregation and flushing.
+  void aggregateMessage(double timestamp, const Message& message);
+  SharedDictionary mergedPayload(const SharedDictionary& payload) const;
+  void internalFlushMessagesWithCompletion(FlushReply completion);
+
+  // Constant after construction.
+  platform::Platform& _platform;
+  OrvantadSessionDelegate& _delegate;
+  const std::shared_ptr<platform::Connection> _connection;
+  const std::unique_ptr<ClientReplyProxy> _client;  // used under _aggregationLock; null without a connection
+  DeviceIDBuffer _deviceid{};
+  std::string _sessionIDString;
+
+  // Written on the session's queue, under the agent's lock when the session is in a group; read there without it, and
+  // by related sessions' threads under it.
+  std::uint32_t _sessionID = 0;
+  HierarchyPosition _hierarchy;
+  SharedDictionary _userInfo;
+  std::optional<BackendSet> _backends;
+
+  // The session's queue only.
+  SharedDictionary _sessionInfo;
+  SessionInfoRecord _info;
+  SharedArray _frameworks;
+  std::optional<std::string> _storebagVersion;
+  bool _inGroup = false;
+  bool _ended = false;
+
+  // Leaf lock: an event or the end notice is handed to the client together with the test and change of _hasAggregator.
+  std::mutex _aggregationLock;
+  std::atomic<bool> _hasAggregator{false};  // written under _aggregationLock
+};
+
+}  // namespace orvanta
