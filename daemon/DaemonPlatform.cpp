@@ -1,0 +1,71 @@
+#include "daemon/DaemonPlatform.h"
+
+#include <cstdlib>
+#include <filesystem>
+#include <string_view>
+#include <thread>
+
+#include "interface/OrvantaConstants.h"
+#include "interface/OrvantaLogging.h"
+#include "platform/JsonLinesPowerLog.h"
+#include "platform/Sandbox.h"
+
+namespace orvanta {
+
+namespace {
+// Jobs are short; blocked ones get a stand-in. Two threads keep one long job from holding up everybody on a small
+// device.
+std::size_t poolThreads() {
+  return std::max(2U, std::min(4U, std::thread::hardware_concurrency()));
+}
+}  // namespace
+
+std::unique_ptr<platform::Platform> makeDaemonPlatform(platform::FileLocations files) {
+  platform::Platform::Parts parts;
+  parts.clock = std::make_unique<platform::SystemClock>();
+  parts.device =
+      std::make_unique<platform::LinuxDeviceProperties>(files.configurationDirectory, std::string(kOrvantaServiceName));
+  parts.defaults =
+      std::make_unique<platform::UserDefaults>(files.stateDirectory, std::string(kOrvantaUserDefaultsDomain));
+  parts.pool = std::make_unique<platform::WorkPool>(poolThreads());
+  platform::HttpClientOptions options;
+  options.caFile = files.caFile;
+  parts.http = platform::makeCurlHttpClient(*parts.pool, options);
+  parts.powerLog = std::make_unique<platform::JsonLinesPowerLog>(files.stateDirectory + "/powerlog.jsonl", *parts.clock);
+  parts.files = std::move(files);
+  return std::make_unique<platform::Platform>(std::move(parts));
+}
+
+std::map<std::string, std::string> sandboxVariables(const platform::FileLocations& files) {
+  std::string caDirectory;
+  if (!files.caFile.empty()) {
+    // The directory that holds the file itself: a link may point elsewhere.
+    std::error_code error;
+    const auto real = std::filesystem::canonical(files.caFile, error);
+    caDirectory = (error ? std::filesystem::path(files.caFile) : real).parent_path().string();
+  }
+  return {{"RUNTIME_DIRECTORY", files.runtimeDirectory},
+          {"STATE_DIRECTORY", files.stateDirectory},
+          {"CONFIGURATION_DIRECTORY", files.configurationDirectory},
+          {"ORVANTA_FRAMEWORK", files.frameworkDirectory},
+          {"ORVANTA_PLUGINS", files.plugInsDirectory},
+          {"ORVANTA_CA_DIRECTORY", caDirectory}};
+}
+
+bool enterDaemonSandbox(const platform::FileLocations& files) {
+  const char* setting = std::getenv("ORVANTA_SANDBOX");
+  if (setting != nullptr && std::string_view(setting) == "off") {
+    ORVANTA_LOG(warning, "main: ORVANTA_SANDBOX is off: the daemon runs without its sandbox");
+    return true;
+  }
+  const auto entered = platform::enterSandbox(files.frameworkDirectory + "/sandbox", std::string(kOrvantaServiceName),
+                                              sandboxVariables(files));
+  if (!entered) {
+    ORVANTA_LOG(error, "main: Failed to enter sandbox {}: {}", kOrvantaServiceName, entered.error());
+    return false;
+  }
+  ORVANTA_LOG(info, "main: {}", *entered);
+  return true;
+}
+
+}  // namespace orvanta

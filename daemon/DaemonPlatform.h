@@ -1,0 +1,20 @@
+#pragma once
+
+#include <map>
+#include <memory>
+#include <string>
+
+#include "platform/Platform.h"
+
+namespace orvanta {
+
+// The Linux device that orvantad runs on. Starts no thread but the HTTP client's; the pool is started by main.
+std::unique_ptr<platform::Platform> makeDaemonPlatform(platform::FileLocations files);
+
+// What the sandbox profile's ${NAME} places stand for.
+std::map<std::string, std::string> sandboxVariables(const platform::FileLocations& files);
+
+// Enters the service's sandbox, or says why not and returns false. ORVANTA_SANDBOX=off stays outside, with a warning.
+bool enterDaemonSandbox(const platform::FileLocations& files);
+
+}  // namespace orvanta

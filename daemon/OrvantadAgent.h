@@ -1,0 +1,74 @@
+#pragma once
+
+#include <condition_variable>
+#include <memory>
+#include <mutex>
+#include <vector>
+
+#include "daemon/SessionRegistry.h"
+#include "daemon/StorebagCache.h"
+#include "platform/Entitlements.h"
+#include "platform/Listener.h"
+#include "platform/Platform.h"
+#include "session/OrvantadSession.h"
+#include "session/OrvantadSessionDelegate.h"
+
+namespace orvanta {
+
+class SessionConnection;
+
+// The one agent of the process: admits clients, owns their sessions, and holds what sessions share, the storebag cache
+// and the registry of related sessions.
+//
+// Made by main and outlives every session. Admission and invalidation come from connection queues, several at once; the
+// delegate operations from any session's queue. The session list's lock and the agent's lock are never held together.
+class OrvantadAgent final : public OrvantadSessionDelegate {
+ public:
+  explicit OrvantadAgent(platform::Platform& platform);
+  // `fetch` stands for the storebag server.
+  OrvantadAgent(platform::Platform& platform, StorebagCache::Fetch fetch);
+
+  // The listener's handler: whether the peer was admitted. Only peers that hold the entitlement are.
+  bool listenerShouldAcceptNewConnection(platform::OfferedConnection&& offered);
+
+  // A client has gone, or the process is about to: takes the session out of every list. On the session's queue; a
+  // second call does nothing.
+  void invalidated(const std::shared_ptr<OrvantadSession>& session);
+  // An admitted session's end() has run. On the session's queue.
+  void sessionEnded();
+  // Ends every session while its connection is still open, and returns when all have ended. Sessions admitted meanwhile
+  // are refused. Not on a pool thread.
+  void endAllSessions();
+
+  std::size_t sessionCount() const;
+
+  AgentLock& lock() override { return _lock; }
+  platform::SharedDictionary storebagForSession(OrvantadSession& session) override;
+  std::optional<std::string> storebagVersionForSession(OrvantadSession& session) override;
+  void updateCorrelatedSessions(const std::shared_ptr<OrvantadSession>& session) override;
+  std::optional<std::string> parentSessionIDStringForSession(OrvantadSession& session) override;
+  void updateDownstreamSessions(OrvantadSession& session) override;
+  std::shared_ptr<OrvantadSession> parentSessionForChild(OrvantadSession& session) override;
+  std::shared_ptr<OrvantadSession> getAncestorWithAggregatorForSession(OrvantadSession& session) override;
+
+ private:
+  struct Entry {
+    std::shared_ptr<OrvantadSession> session;
+    std::shared_ptr<SessionConnection> connection;
+  };
+
+  platform::Platform& _platform;
+  const platform::Entitlements _entitlements;
+
+  mutable std::mutex _sessionListLock;
+  std::vector<Entry> _sessionList;  // guarded by _sessionListLock; in order of admission
+  bool _ending = false;             // guarded by _sessionListLock
+  std::size_t _unended = 0;         // guarded by _sessionListLock: admitted, and end() has not run to its end
+  std::condition_variable _allEnded;
+
+  AgentLock _lock;
+  StorebagCache _storebags;   // guarded by _lock
+  SessionRegistry _registry;  // guarded by _lock, but for its count of tokens
+};
+
+}  // namespace orvanta

@@ -1,0 +1,47 @@
+#include "daemon/SessionConnection.h"
+
+#include "daemon/OrvantadAgent.h"
+#include "interface/OrvantaLogging.h"
+#include "interface/RemoteCalls.h"
+
+namespace orvanta {
+
+void SessionConnection::received(platform::Frame&& frame) {
+  if (_finished) return;
+  if (frame.kind == platform::Frame::Kind::response) {
+    ORVANTA_LOG(warning, "listener: Closing connection to {}: it answered a call that was never made",
+                _session->description());
+    _finished = true;
+    _connection->cancel();
+    return;
+  }
+  // A call that is refused leaves the descriptor that came with it untaken, and later calls would get the wrong one.
+  const bool carriesDescriptor =
+      frame.method == "uploadFileAtPath" && frame.params.size() > 1 && !frame.params[1].isNull();
+  if (!dispatchCall(std::move(frame), *_session, _connection->outbox()) && carriesDescriptor) {
+    _connection->takeDescriptor();
+  }
+}
+
+void SessionConnection::interrupted() {
+  ORVANTA_LOG(debug, "listener: Vyx connection to {} was interrupted", _session->description());
+}
+
+void SessionConnection::invalidated(const std::optional<std::string>& protocolError) {
+  if (protocolError) {
+    ORVANTA_LOG(warning, "listener: Closing connection to {}: {}", _session->description(), *protocolError);
+  }
+  ORVANTA_LOG(debug, "listener: Vyx connection to {} was invalidated", _session->description());
+  endSession();
+}
+
+void SessionConnection::endSession() {
+  _finished = true;
+  if (_ended) return;
+  _ended = true;
+  _agent.invalidated(_session);
+  _session->end();
+  _agent.sessionEnded();
+}
+
+}  // namespace orvanta

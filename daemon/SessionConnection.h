@@ -1,0 +1,39 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/Connection.h"
+#include "session/OrvantadSession.h"
+
+namespace orvanta {
+
+class OrvantadAgent;
+
+// Carries the frames of one admitted connection to its session and ends the session when the connection ends.
+// Held by the connection until its invalidation and by the agent's session list. Everything runs on the connection's
+// queue.
+class SessionConnection final : public platform::ConnectionDelegate {
+ public:
+  SessionConnection(OrvantadAgent& agent, std::shared_ptr<OrvantadSession> session,
+                    std::shared_ptr<platform::Connection> connection)
+      : _agent(agent), _session(std::move(session)), _connection(std::move(connection)) {}
+
+  void received(platform::Frame&& frame) override;
+  void interrupted() override;
+  void invalidated(const std::optional<std::string>& protocolError) override;
+
+  // Takes the session out of the agent's lists and ends it. Once; later calls and frames do nothing.
+  void endSession();
+  const std::shared_ptr<platform::Connection>& connection() const { return _connection; }
+
+ private:
+  OrvantadAgent& _agent;
+  const std::shared_ptr<OrvantadSession> _session;
+  const std::shared_ptr<platform::Connection> _connection;
+  bool _finished = false;  // nothing more is carried out
+  bool _ended = false;
+};
+
+}  // namespace orvanta

@@ -1,0 +1,137 @@
+#include "daemon/SessionRegistry.h"
+
+#include <algorithm>
+
+#include "interface/OrvantaLogging.h"
+
+namespace orvanta {
+
+std::shared_ptr<OrvantadSession> SessionRegistry::getFirstSessionWithHierarchy(std::int64_t level, const Group& group) {
+  const auto found = group.levels.find(level);
+  if (found == group.levels.end() || found->second.empty()) return nullptr;
+  return found->second.begin()->second;
+}
+
+const SessionRegistry::Group* SessionRegistry::groupOf(const OrvantadSession& session) const {
+  const auto found = _correlatedSessions.find(*session.hierarchyToken());
+  return found == _correlatedSessions.end() ? nullptr : &found->second;
+}
+
+bool SessionRegistry::holds(const Group& group, const OrvantadSession& session) const {
+  const auto place = _places.find(&session);
+  if (place == _places.end()) return false;
+  const auto found = _correlatedSessions.find(place->second.token);
+  return found != _correlatedSessions.end() && &found->second == &group;
+}
+
+void SessionRegistry::update(const std::shared_ptr<OrvantadSession>& session) {
+  remove(*session);
+  const auto& token = session->hierarchyToken();
+  if (!token) return;
+  Group& group = _correlatedSessions[*token];
+  _tokenCount.store(_correlatedSessions.size(), std::memory_order_relaxed);
+  ORVANTA_LOG(debug, "updateCorrelatedSessions: Adding session {} to list for hierarchyToken {} with hierarchyLevel {}",
+              session->sessionID(), *token, session->hierarchyLevel());
+  const Place place{*token, session->hierarchyLevel(), _nextOrder++};
+  group.levels[place.level].emplace(place.order, session);
+  ++group.size;
+  _places.emplace(session.get(), place);
+}
+
+void SessionRegistry::remove(const OrvantadSession& session) {
+  const auto place = _places.find(&session);
+  if (place == _places.end()) return;
+  Group& group = _correlatedSessions[place->second.token];
+  const auto level = group.levels.find(place->second.level);
+  if (level != group.levels.end()) {
+    level->second.erase(place->second.order);
+    if (level->second.empty()) group.levels.erase(level);
+  }
+  --group.size;
+  _places.erase(place);
+}
+
+std::shared_ptr<OrvantadSession> SessionRegistry::parentSessionForChild(const OrvantadSession& child) const {
+  if (child.hierarchyLevel() == 0 || !child.hierarchyToken()) return nullptr;
+  const std::string& token = *child.hierarchyToken();
+  ORVANTA_LOG(debug, "parentSessionForChild: Checking hierarchyToken '{}' for session {}", token, child.sessionID());
+  const Group* group = groupOf(child);
+  if (group == nullptr || group->size == 0) {
+    ORVANTA_LOG(error, "parentSessionForChild: ERROR: No sessions found for hierarchyToken {}", token);
+    return nullptr;
+  }
+  if (!holds(*group, child)) {
+    ORVANTA_LOG(error, "parentSessionForChild: ERROR: Session {} not found for hierarchyToken {}", child.sessionID(),
+                token);
+    return nullptr;
+  }
+  const std::int64_t level = static_cast<std::int64_t>(child.hierarchyLevel()) - 1;
+  auto parent = getFirstSessionWithHierarchy(level, *group);
+  if (!parent) {
+    ORVANTA_LOG(error, "parentSessionForChild: Unable to find session with hierarchy of {} for hierarchyToken '{}'",
+                level, token);
+  }
+  return parent;
+}
+
+std::optional<std::string> SessionRegistry::parentSessionIDStringForSession(const OrvantadSession& session) const {
+  const std::string& token = *session.hierarchyToken();
+  const Group* group = groupOf(session);
+  if (group == nullptr || group->size == 0) {
+    ORVANTA_LOG(error, "parentSessionIDStringForSession: ERROR: No sessions found for hierarchyToken {}", token);
+    return std::nullopt;
+  }
+  if (!holds(*group, session)) {
+    ORVANTA_LOG(info, "parentSessionIDStringForSession: Session {} not found for hierarchyToken {}",
+                session.sessionID(), token);
+    return std::nullopt;
+  }
+  std::optional<std::string> result;
+  for (std::int64_t level = static_cast<std::int64_t>(session.hierarchyLevel()) - 1; level >= 0; --level) {
+    const auto ancestor = getFirstSessionWithHierarchy(level, *group);
+    if (!ancestor) {
+      ORVANTA_LOG(info,
+                  "parentSessionIDStringForSession: Found a gap in hierarchy (one of parents missing): incomplete "
+                  "parentSessionID is '{}'",
+                  result.value_or(""));
+      break;
+    }
+    result = result ? ancestor->sessionIDString() + "." + *result : ancestor->sessionIDString();
+  }
+  return result;
+}
+
+std::shared_ptr<OrvantadSession> SessionRegistry::getAncestorWithAggregatorForSession(
+    const OrvantadSession& session) const {
+  if (!session.hasUserInfo()) {
+    ORVANTA_LOG(info, "getAncestorWithAggregatorForSession: No user info found for session {}", session.sessionID());
+    return nullptr;
+  }
+  if (!session.hierarchyToken() || session.hierarchyLevel() < 1) return nullptr;
+  const Group* group = groupOf(session);
+  if (group == nullptr) return nullptr;
+  // Levels in ascending order: root first. Levels that nobody holds cost nothing.
+  for (const auto& [level, sessions] : group->levels) {
+    if (level >= static_cast<std::int64_t>(session.hierarchyLevel())) break;
+    const auto& first = sessions.begin()->second;
+    if (first->hasAggregator()) return first;
+  }
+  return nullptr;
+}
+
+std::vector<std::shared_ptr<OrvantadSession>> SessionRegistry::downstreamOf(const OrvantadSession& session) const {
+  std::vector<std::pair<std::uint64_t, std::shared_ptr<OrvantadSession>>> found;
+  if (const Group* group = session.hierarchyToken() ? groupOf(session) : nullptr) {
+    const auto own = static_cast<std::int64_t>(session.hierarchyLevel());
+    for (auto level = group->levels.upper_bound(own); level != group->levels.end(); ++level) {
+      found.insert(found.end(), level->second.begin(), level->second.end());
+    }
+  }
+  std::sort(found.begin(), found.end(), [](const auto& a, const auto& b) { return a.first < b.first; });
+  std::vector<std::shared_ptr<OrvantadSession>> sessions;
+  sessions.reserve(found.size());
+  for (auto& entry : found) sessions.push_back(std::move(entry.second));
+  return sessions;
+}
+
+}  // namespace orvanta

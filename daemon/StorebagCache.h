@@ -1,0 +1,55 @@
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <optional>
+#include <string>
+
+#include "platform/Clock.h"
+#include "platform/Value.h"
+#include "util/Storebag.h"
+
+namespace orvanta {
+
+enum class StorebagFetchState { successful, failure };  // "Fetch Successful", "Fetch Failure"
+
+// What is known of one storebag. Made by the first attempt to fetch it and kept for the life of the process.
+struct StorebagCacheEntry {
+  platform::SharedDictionary storebagData;     // of the last fetch that brought one
+  std::optional<std::string> storebagVersion;  // together with storebagData
+  double storebagFetchTime = 0;                // wall clock, of the last attempt
+  StorebagFetchState storebagFetchState = StorebagFetchState::failure;
+  std::int32_t storebagMaxAge = 0;  // seconds; of the last attempt
+  std::optional<std::string> storebagLastModified;
+};
+
+// Pure: whether the entry serves as it is at `now`, and why not.
+enum class StorebagFreshness { fresh, waiting, expired };
+StorebagFreshness freshnessOf(const StorebagCacheEntry& entry, double now);
+
+// One entry per storebag name; asks the server when an entry has expired, and after a failure not before 900 seconds.
+//
+// Owned by the agent, used under its lock, which is held across a fetch: concurrent sessions never fetch twice for one
+// expiry.
+class StorebagCache {
+ public:
+  using Fetch = std::function<platform::SharedDictionary(std::int32_t clientType, StorebagFetch& fetch)>;
+  StorebagCache(platform::Clock& clock, Fetch fetch) : _clock(clock), _fetch(std::move(fetch)) {}
+
+  // Null when there is none, or the client type has no storebag. `sessionID` is for the log.
+  platform::SharedDictionary storebag(std::uint32_t sessionID, std::int32_t clientType);
+  // Never fetches.
+  std::optional<std::string> version(std::int32_t clientType) const;
+
+  static constexpr int kSecondsBetweenFailedAttempts = 900;
+
+ private:
+  void fetchAndCacheStorebag(std::int32_t clientType);
+
+  platform::Clock& _clock;
+  const Fetch _fetch;
+  std::map<std::string, StorebagCacheEntry, std::less<>> _cachedStorebags;  // guarded by the agent's lock
+};
+
+}  // namespace orvanta
