@@ -1,0 +1,56 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+
+#include "client/CallResult.h"
+#include "client/Records.h"
+#include "interface/ClientSessionInterface.h"
+
+namespace orvanta {
+
+class CallChannel;
+class ClientSession;
+
+// The operations of a session in a form that waits for the answer, however long the daemon takes; closing the
+// connection from another thread ends the wait. While too much waits for the daemon they wait for that too.
+//
+// A view of a ClientSession, made by its blocking() and good for as long as its connection. Any thread may call but the
+// library's callback thread: there they fail at once (wrongThread), since the answer could never come.
+class BlockingCalls {
+ public:
+  BlockingCalls(ClientSession& session, CallChannel& channel);
+
+  // Setting up in one go: setSessionInfo and startConfig, with the daemon told of the session's aggregation handler if
+  // it has one. The names of the reporting backends; none when the daemon has no storebag for the client type.
+  CallResult<BackendNames> configure(const SessionInfo& sessionInfo, const std::optional<UserInfo>& userInfo = {});
+
+  CallResult<Done> setSessionInfo(SharedDictionary sessionInfo, SharedDictionary userInfo,
+                                  SharedArray frameworksToCheck, bool hasAggregationBlock);
+  CallResult<BackendNames> startConfig();
+  CallResult<BackendNames> fetchStates(SharedDictionary userInfo);
+  CallResult<std::optional<std::string>> fetchDisplayURL();
+  CallResult<std::optional<std::string>> sendMessage(std::uint16_t category, std::uint16_t type,
+                                                     SharedDictionary payload);
+  CallResult<std::optional<std::string>> sendMessage(SharedDictionary parameters);
+  CallResult<std::optional<std::string>> sendMessage(const MessageParameters& parameters);
+  CallResult<FlushAnswer> flushMessages();
+  CallResult<std::optional<std::string>> finishSession();
+  // While 16 files are being uploaded, waits for one to end.
+  CallResult<bool> uploadFile(const std::string& path);
+  CallResult<LogDataAnswer> uploadLogData(SharedArray logData);
+  // One event without a session: "finished" or "storebag not available".
+  CallResult<std::optional<std::string>> sendMessage(SharedDictionary sessionInfo, SharedDictionary userInfo,
+                                                     std::uint16_t category, std::uint16_t type,
+                                                     SharedDictionary payload);
+
+ private:
+  template <class Answer, class AnyReply, class MakeCall>
+  CallResult<Answer> wait(MakeCall makeCall);
+
+  ClientSession& _session;
+  CallChannel& _channel;
+};
+
+}  // namespace orvanta

@@ -1,0 +1,62 @@
+#pragma once
+
+#include <chrono>
+#include <cstddef>
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "client/CallResult.h"
+#include "client/CallbackThread.h"
+#include "client/ClientSession.h"
+
+namespace orvanta {
+
+// Every field has an initialiser, so that {.socketDirectory = …} names only what it sets.
+struct ConnectionOptions {
+  // Where the daemon's socket com.kovalt.orvantad is. Empty: the first entry of RUNTIME_DIRECTORY, else /run/orvanta.
+  std::string socketDirectory{};
+  // Null: the connection starts a thread of its own for its callbacks.
+  std::shared_ptr<CallbackThread> callbackThread{};
+  // Bytes of calls that the daemon has not read yet. Above it a call fails at once, and one that waits waits.
+  std::size_t maximumWaitingBytes = 64U << 20U;
+  // How long close() and the destructor let calls that were sent go out to a daemon that is slow to read.
+  std::chrono::milliseconds closingTime{2000};
+};
+
+// A connection to the daemon, which is one session there: it lives from connect() until close(), the destructor, or the
+// daemon's end.
+//
+// Owned by the program. Any thread may call, but not while another destroys it. Destroying it closes it: calls not yet
+// answered fail with connectionLost on the callback thread first, and no callback runs after that. Destroyed in one of
+// its own callbacks it does not wait: those calls fail on the spot, and the thread ends by itself soon after.
+class OrvantaConnection {
+ public:
+  // Does not wait for the daemon to answer, which admits or turns away only after this: the first call will tell.
+  static CallResult<std::unique_ptr<OrvantaConnection>> connect(ConnectionOptions options = {});
+  OrvantaConnection(const OrvantaConnection&) = delete;
+  OrvantaConnection& operator=(const OrvantaConnection&) = delete;
+  ~OrvantaConnection();
+
+  ClientSession& session() { return _session; }
+
+  // Called once, on the callback thread, when the connection ends without close(); at once if it has. The calls that
+  // were waiting have failed by then.
+  void setConnectionLostHandler(std::function<void(const CallError&)> handler);
+  // Whether calls are still taken.
+  bool isOpen() const;
+  // Ends the connection; what was sent still goes out (closingTime). Does not wait. Idempotent.
+  void close();
+
+ private:
+  OrvantaConnection(std::shared_ptr<CallbackThread> thread, std::shared_ptr<CallChannel> channel,
+                    std::chrono::milliseconds closingTime);
+
+  // Constant after construction.
+  std::shared_ptr<CallbackThread> _thread;
+  std::shared_ptr<CallChannel> _channel;
+  const std::chrono::milliseconds _closingTime;
+  ClientSession _session;
+};
+
+}  // namespace orvanta

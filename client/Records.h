@@ -1,0 +1,54 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+
+#include "platform/Value.h"
+
+namespace orvanta {
+
+// The records that a client hands to the daemon, as plain structs; dictionary() gives them the keys of
+// OrvantaConstants.h.
+
+// Links the session to related ones of other clients.
+struct HierarchyToken {
+  std::string tokenID = {};
+  std::uint32_t level = 0;  // 0 is the root
+};
+
+struct SessionInfo {
+  std::uint32_t sessionID = 0;
+  std::int32_t clientType = 0;
+  std::int32_t clientVersion = 0;  // the low 16 bits count
+  bool requireUserInfo = false;
+  bool batchEvent = false;
+  std::optional<HierarchyToken> hierarchyToken = std::nullopt;
+
+  platform::SharedDictionary dictionary() const;
+};
+
+struct UserInfo {
+  std::optional<std::string> clientName = std::nullopt;
+  std::optional<std::string> serviceName = std::nullopt;
+  platform::Dictionary others = {};  // merged into the events; the two names above win over equal keys
+
+  platform::SharedDictionary dictionary() const;
+};
+
+struct MessageParameters {
+  std::uint16_t category = 0;
+  std::uint16_t type = 0;
+  std::optional<platform::Dictionary> payload = std::nullopt;
+  // Shorthand for the two bits that flags have; joined with `flag`.
+  bool realtime = false;  // goes out at once, by way of the realtime URL
+  bool promote = false;   // makes a session that holds its events back report from now on
+  std::uint32_t flag = 0;
+
+  platform::SharedDictionary dictionary() const;
+};
+
+inline constexpr std::uint32_t kMessageFlagRealtime = 1;
+inline constexpr std::uint32_t kMessageFlagPromote = 2;
+
+}  // namespace orvanta
