@@ -1,0 +1,14 @@
+#pragma once
+
+#include <cstddef>
+#include <string>
+#include <string_view>
+
+#include "platform/Result.h"
+
+namespace orvanta::collector {
+
+// Inflates a gzip or zlib body whole; a failure when it is damaged, has trailing bytes, or would pass `maximumBytes`.
+platform::Result<std::string> inflateBody(std::string_view compressed, std::size_t maximumBytes);
+
+}  // namespace orvanta::collector

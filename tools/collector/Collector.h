@@ -1,0 +1,79 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "platform/Result.h"
+#include "platform/Value.h"
+#include "tools/collector/AcknowledgementSettings.h"
+#include "tools/collector/Behaviours.h"
+#include "tools/collector/CollectorOptions.h"
+#include "tools/collector/ReceivedRecords.h"
+
+namespace orvanta::collector {
+
+// Everything outside a daemon on one machine: storebag server, event server (http and https), upload and log-data
+// server, dashboard server; whatever comes in is recorded. Runs on threads of its own from start() until stop() or
+// destruction. Thread-safe.
+class Collector {
+ public:
+  // Listens when it returns. A failure says what could not be made or bound.
+  static platform::Result<std::unique_ptr<Collector>> start(CollectorOptions options);
+  virtual ~Collector() = default;
+  // Ends all connections and answers nothing any more; what was received can still be read.
+  virtual void stop() = 0;
+
+  // --- Where everything is ---
+
+  virtual const std::string& directory() const = 0;
+  virtual std::string databaseFile() const = 0;
+  virtual std::string caFile() const = 0;         // for ORVANTA_CA_FILE
+  virtual std::string publicKeyFile() const = 0;  // for the framework directory
+  virtual std::string publicKeyPkcs1File() const = 0;
+  virtual std::uint16_t httpPort() const = 0;
+  virtual std::uint16_t httpsPort() const = 0;
+  virtual std::uint16_t dashboardPort() const = 0;
+  std::string httpURL(const std::string& path = {}) const;   // http://127.0.0.1:PORT
+  std::string httpsURL(const std::string& path = {}) const;  // https://localhost:PORT
+  // For the user default "orvanta_storebag_url".
+  std::string storebagURL() const { return httpURL("/storebags"); }
+  std::string eventsURL(bool secure = true) const { return secure ? httpsURL("/events") : httpURL("/events"); }
+
+  // --- How it answers ---
+
+  // Requests to the path (see Behaviours) are treated so from the next one on.
+  virtual void setBehaviour(const std::string& path, PathBehaviour behaviour) = 0;
+  void setStatus(const std::string& path, int status);
+  void setStatus(const std::string& path, int status, std::size_t times);
+  void setFault(const std::string& path, ConnectionFault fault);
+  virtual void clearBehaviours() = 0;
+  virtual void setAcknowledgements(const AcknowledgementSettings& settings) = 0;
+  virtual void setStorebagSettings(const StorebagSettings& settings) = 0;
+  // Serves this inner bag from now on: for one storebag name, or for all without one of their own. Texts may hold the
+  // placeholders "${http}", "${https}" and "${dashboard_port}".
+  virtual void setBag(const std::string& name, platform::Value inner) = 0;
+  void setBag(platform::Value inner) { setBag("", std::move(inner)); }
+  // A bag whose section of every environment is this one.
+  void setSection(platform::Dictionary section);
+  // The signed document as it would be served.
+  virtual std::string storebagDocument(const std::string& name) = 0;
+
+  // --- What it has received ---
+
+  virtual Inbox& inbox() = 0;
+  std::vector<ReceivedRequest> requests(const InboxQuery& query = {}) { return inbox().requests(query); }
+  std::vector<ReceivedRequest> requests(RequestKind kind);
+  std::vector<ReceivedEvent> events(const InboxQuery& query = {}) { return inbox().events(query); }
+  std::vector<ReceivedDatagram> datagrams(const InboxQuery& query = {}) { return inbox().datagrams(query); }
+  // Each waits until at least so many have come since the last clear() (or were there before).
+  bool waitForRequests(std::size_t count, std::chrono::milliseconds limit);
+  bool waitForRequests(RequestKind kind, std::size_t count, std::chrono::milliseconds limit);
+  bool waitForEvents(std::size_t count, std::chrono::milliseconds limit);
+  bool waitForDatagrams(std::size_t count, std::chrono::milliseconds limit);
+  void clear() { inbox().clear(); }
+};
+
+}  // namespace orvanta::collector

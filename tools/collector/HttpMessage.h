@@ -1,0 +1,54 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/Result.h"
+#include "tools/collector/ReceivedRecords.h"
+
+namespace orvanta::collector {
+
+// Reading HTTP/1 messages as bytes, with the header fields in their order. No I/O.
+
+struct RequestHead {
+  std::string method;
+  std::string target;
+  bool http11 = true;
+  HeaderFields headers;
+
+  bool chunked() const;
+  // Whether the sender waits for "100 Continue" before it sends the body.
+  bool expectsContinue() const;
+  bool keepsAlive() const;
+  // None where there is no such header; a failure where it is no number or there are two that differ.
+  platform::Result<std::optional<std::size_t>> contentLength() const;
+};
+
+struct ResponseHead {
+  int status = 0;
+  HeaderFields headers;
+};
+
+// `head` ends with the empty line.
+platform::Result<RequestHead> parseRequestHead(std::string_view head);
+platform::Result<ResponseHead> parseResponseHead(std::string_view head);
+
+// One step of the chunked form: the size line of the next chunk, without its line break.
+std::optional<std::size_t> parseChunkSize(std::string_view line);
+
+// "%41" becomes "A"; what is no escape stays as it is.
+std::string percentDecode(std::string_view text);
+// The path of a request target, percent-decoded.
+std::string pathOfTarget(std::string_view target);
+std::optional<std::string> queryParameter(std::string_view target, std::string_view name);
+
+std::string_view reasonPhrase(int status);
+
+// "Sun, 06 Nov 1994 08:49:37 GMT".
+std::string httpDate(std::int64_t secondsSince1970);
+std::optional<std::int64_t> parseHttpDate(const std::string& text);
+
+}  // namespace orvanta::collector

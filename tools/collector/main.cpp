@@ -1,0 +1,99 @@
+#include <fmt/format.h>
+#include <unistd.h>
+
+#include <CLI/CLI.hpp>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <string>
+
+#include "platform/Json.h"
+#include "tools/collector/Collector.h"
+
+// Runs a collector until SIGTERM or SIGINT. Prints one line of JSON when it listens.
+
+namespace {
+
+using namespace orvanta;
+
+std::string defaultDirectory() {
+  const char* state = std::getenv("XDG_STATE_HOME");
+  const char* home = std::getenv("HOME");
+  if (state != nullptr && *state == '/') return std::string(state) + "/orvanta-collector";
+  return std::string(home != nullptr ? home : ".") + "/.local/state/orvanta-collector";
+}
+
+void printRequest(const collector::ReceivedRequest& request) {
+  fmt::print(stderr, "{:.3f} {} {} {} {} {} bytes{}\n", request.time, request.client, request.method, request.target,
+             request.status, request.rawBody.size(), request.note.empty() ? "" : " (" + request.note + ")");
+}
+
+void printReady(const collector::Collector& running) {
+  const platform::Dictionary ready{{"pid", static_cast<std::int64_t>(::getpid())},
+                                   {"directory", running.directory()},
+                                   {"http", running.httpURL()},
+                                   {"https", running.httpsURL()},
+                                   {"httpPort", int{running.httpPort()}},
+                                   {"httpsPort", int{running.httpsPort()}},
+                                   {"dashboardPort", int{running.dashboardPort()}},
+                                   {"storebagURL", running.storebagURL()},
+                                   {"eventsURL", running.eventsURL()},
+                                   {"uploadURL", running.httpsURL("/upload")},
+                                   {"logDataURL", running.httpsURL("/logdata")},
+                                   {"caFile", running.caFile()},
+                                   {"publicKeyFile", running.publicKeyFile()},
+                                   {"databaseFile", running.databaseFile()}};
+  fmt::print("{}\n", platform::writeJson(ready));
+  std::fflush(stdout);
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  collector::CollectorOptions options;
+  options.directory = defaultDirectory();
+  options.httpPort = 8480;
+  options.httpsPort = 8443;
+  options.dashboardPort = 8481;
+  bool anyPorts = false;
+  bool quiet = false;
+  std::string container = "xml";
+  std::string bag = "xml";
+  std::int64_t maxAge = options.storebag.maxAge.value_or(0);
+
+  CLI::App app("Plays the servers that an orvanta daemon talks to, and records what comes in", "orvanta-collector");
+  app.add_option("-d,--directory", options.directory, "keys, certificates, bags, database")->capture_default_str();
+  app.add_option("--address", options.address, "IPv4 address to listen on")->capture_default_str();
+  app.add_option("--http-port", options.httpPort, "0: any free one")->capture_default_str();
+  app.add_option("--https-port", options.httpsPort, "0: any free one")->capture_default_str();
+  app.add_option("--dashboard-port", options.dashboardPort, "UDP; 0: any free one")->capture_default_str();
+  app.add_flag("--any-ports", anyPorts, "take free ports for all three");
+  app.add_option("--max-age", maxAge, "seconds for which daemons keep a storebag")->capture_default_str();
+  app.add_option("--container", container, "form of the signed document")->check(CLI::IsMember({"xml", "binary"}));
+  app.add_option("--bag", bag, "form of the bag inside")->check(CLI::IsMember({"xml", "binary"}));
+  app.add_flag("-q,--quiet", quiet, "no line per request on standard error");
+  CLI11_PARSE(app, argc, argv);
+  if (anyPorts) options.httpPort = options.httpsPort = options.dashboardPort = 0;
+  options.storebag.maxAge = maxAge;
+  options.storebag.container = *propertyListFormFromText(container);
+  options.storebag.bag = *propertyListFormFromText(bag);
+  if (!quiet) options.observer = printRequest;
+
+  // Blocked before any thread exists, so that only the wait below takes them.
+  sigset_t signals;
+  sigemptyset(&signals);
+  sigaddset(&signals, SIGTERM);
+  sigaddset(&signals, SIGINT);
+  ::pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+
+  const auto running = collector::Collector::start(std::move(options));
+  if (!running) {
+    fmt::print(stderr, "orvanta-collector: {}\n", running.error());
+    return 1;
+  }
+  printReady(**running);
+  int signal = 0;
+  ::sigwait(&signals, &signal);
+  (*running)->stop();
+  return 0;
+}

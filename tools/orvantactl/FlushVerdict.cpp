@@ -1,0 +1,32 @@
+#include "tools/orvantactl/FlushVerdict.h"
+
+#include <fmt/format.h>
+
+#include <utility>
+
+#include "platform/Json.h"
+#include "platform/Value.h"
+
+namespace orvanta::ctl {
+
+using platform::Dictionary;
+using platform::Value;
+
+std::string flushLine(const FlushAnswer& answer) {
+  Dictionary flush{{"result", answer.text ? Value(*answer.text) : Value()}, {"error", Value()}};
+  if (answer.error) {
+    flush.set("error", Dictionary{{"code", answer.error->code}, {"description", answer.error->description}});
+  }
+  return platform::writeJson(Dictionary{{"flush", std::move(flush)}});
+}
+
+std::optional<std::string> flushProblem(const FlushAnswer& answer) {
+  if (!answer.error || answer.error->description.starts_with("Nothing to flush")) return std::nullopt;
+  auto text = fmt::format("the flush failed: {} (code {})", answer.error->description, answer.error->code);
+  if (answer.error->description.find("userInfo is required") != std::string::npos) {
+    text += "; give --client-name and --service-name";
+  }
+  return text;
+}
+
+}  // namespace orvanta::ctl

@@ -1,0 +1,19 @@
+#pragma once
+
+#include <string>
+#include <string_view>
+
+#include "platform/Result.h"
+#include "platform/Value.h"
+
+namespace orvanta::ctl {
+
+// JSON has no dates and no data. In orvantactl's JSON {"$date": 1700000000.5} is a date (seconds since 1970) and
+// {"$data": "AAEC"} is data (base64); both stand alone in their object.
+
+// Parses one JSON document with those two forms.
+platform::Result<platform::Value> parseTaggedJson(std::string_view text);
+// One line of JSON with those two forms.
+std::string writeTaggedJson(const platform::Value& value, bool pretty = false);
+
+}  // namespace orvanta::ctl

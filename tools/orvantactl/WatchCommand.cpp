@@ -1,0 +1,105 @@
+#include <fmt/format.h>
+#include <poll.h>
+#include <signal.h>
+#include <sys/eventfd.h>
+#include <sys/signalfd.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <cerrno>
+#include <cstdint>
+#include <memory>
+#include <string>
+
+#include "platform/UniqueFd.h"
+#include "tools/orvantactl/ClientOptions.h"
+#include "tools/orvantactl/Commands.h"
+#include "tools/orvantactl/EventJson.h"
+#include "tools/orvantactl/ExitStatus.h"
+
+namespace orvanta::ctl {
+
+namespace {
+
+// Waits for whichever comes first: SIGINT or SIGTERM, or finish() from the library's thread.
+class EndOfWatch {
+ public:
+  EndOfWatch() : _finished(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
+    sigset_t signals;
+    sigemptyset(&signals);
+    sigaddset(&signals, SIGINT);
+    sigaddset(&signals, SIGTERM);
+    ::sigprocmask(SIG_BLOCK, &signals, nullptr);
+    _signals.reset(::signalfd(-1, &signals, SFD_CLOEXEC));
+  }
+  bool usable() const { return _finished && _signals; }
+
+  void finish(int status) {
+    _status = status;
+    const std::uint64_t one = 1;
+    [[maybe_unused]] const auto written = ::write(_finished.get(), &one, sizeof one);
+  }
+  // The exit status: 0 after a signal.
+  int wait() {
+    pollfd waits[] = {{_finished.get(), POLLIN, 0}, {_signals.get(), POLLIN, 0}};
+    while (::poll(waits, 2, -1) < 0 && errno == EINTR) {
+    }
+    return _status;
+  }
+
+ private:
+  platform::UniqueFd _finished;
+  platform::UniqueFd _signals;
+  std::atomic<int> _status{kAllTaken};
+};
+
+int watch(const ClientOptions& options) {
+  const auto userInfo = options.userInfo();
+  if (!userInfo) {
+    complain(userInfo.error());
+    return kUsage;
+  }
+  EndOfWatch end;  // outlives the connection, whose handlers use it
+  if (!end.usable()) {
+    complain("the system gives no descriptors to wait with");
+    return kSomethingNotTaken;
+  }
+  int status = kAllTaken;
+  const auto connection = connectOrComplain(options, status);
+  if (!connection) return status;
+  auto& session = connection->session();
+  session.setAggregationHandler(
+      [&end](const AggregatedEvent& event) {
+        if (!printLine(aggregatedEventLine(event))) end.finish(kAllTaken);
+      },
+      [&end] {
+        printLine("{\"end\":true}");
+        end.finish(kAllTaken);
+      });
+  const auto set = session.blocking().setSessionInfo(options.sessionInfo().dictionary(),
+                                                     *userInfo ? (*userInfo)->dictionary() : nullptr, nullptr, true);
+  if (!set) return complain(set.error());
+  printLine(watchingLine(options.hierarchyToken, options.level));
+  connection->setConnectionLostHandler([&end](const CallError& error) { end.finish(complain(error)); });
+  return end.wait();
+}
+
+}  // namespace
+
+void addWatchCommand(CLI::App& app, int& status) {
+  auto options = std::make_shared<ClientOptions>();
+  auto& command = *app.add_subcommand("watch", "Joins a group of sessions as its aggregator and shows their events");
+  command.footer(
+      "Writes {\"watching\":…} once it has joined, then one line an event:\n"
+      "  {\"timestamp\":…,\"category\":…,\"type\":…,\"payload\":…,\"session\":{…}}\n"
+      "and {\"end\":true} when the daemon ends the aggregation. Ctrl-C leaves.\n"
+      "Events come from sessions that give the same token with a higher level and have user info.");
+  options->addConnectionTo(command);
+  options->addSessionTo(command);
+  options->addUserInfoTo(command);
+  options->addHierarchyTo(command, "--token");
+  command.get_option("--token")->required();
+  command.callback([options, &status] { status = watch(*options); });
+}
+
+}  // namespace orvanta::ctl

@@ -1,0 +1,117 @@
+#include "tools/storebag/SigningKey.h"
+
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <openssl/err.h>
+#include <openssl/evp.h>
+#include <openssl/pem.h>
+#include <openssl/rsa.h>
+#include <openssl/x509.h>
+#include <sys/stat.h>
+
+#include <array>
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <utility>
+
+#include "platform/Digest.h"
+
+namespace orvanta {
+
+using platform::Failure;
+using platform::Result;
+
+namespace {
+
+using KeyPointer = std::unique_ptr<EVP_PKEY, decltype(&EVP_PKEY_free)>;
+using ContextPointer = std::unique_ptr<EVP_PKEY_CTX, decltype(&EVP_PKEY_CTX_free)>;
+using FilePointer = std::unique_ptr<std::FILE, decltype(&std::fclose)>;
+
+// What stands before the 20 digest bytes in the signed block: the DER of DigestInfo for SHA-1.
+constexpr std::array<std::uint8_t, 15> kSha1DigestInfo{0x30, 0x21, 0x30, 0x09, 0x06, 0x05, 0x2b, 0x0e,
+                                                       0x03, 0x02, 0x1a, 0x05, 0x00, 0x04, 0x14};
+
+std::string lastOpenSslError() {
+  const char* reason = ERR_reason_error_string(ERR_get_error());
+  ERR_clear_error();
+  return reason != nullptr ? reason : "unknown reason";
+}
+
+class OpenSslSigningKey final : public SigningKey {
+ public:
+  explicit OpenSslSigningKey(KeyPointer key) : _key(std::move(key)) {}
+
+  std::optional<Failure> write(const std::string& path) const override {
+    const int fd = ::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
+    const FilePointer file(fd < 0 ? nullptr : ::fdopen(fd, "w"), &std::fclose);
+    if (!file) return Failure{fmt::format("cannot write {}: {}", path, std::strerror(errno))};
+    if (PEM_write_PrivateKey(file.get(), _key.get(), nullptr, nullptr, 0, nullptr, nullptr) != 1 ||
+        std::fflush(file.get()) != 0) {
+      return Failure{fmt::format("cannot write {}: {}", path, lastOpenSslError())};
+    }
+    return std::nullopt;
+  }
+
+  std::vector<std::uint8_t> publicKeyDer(PublicKeyLayout layout) const override {
+    unsigned char* der = nullptr;
+    const int size = layout == PublicKeyLayout::pkcs1 ? i2d_PublicKey(_key.get(), &der) : i2d_PUBKEY(_key.get(), &der);
+    std::vector<std::uint8_t> bytes;
+    if (size > 0) bytes.assign(der, der + size);
+    OPENSSL_free(der);
+    return bytes;
+  }
+
+  Result<std::vector<std::uint8_t>> sign(std::span<const std::uint8_t> bytes) const override {
+    const auto digest = platform::sha1(bytes);
+    std::array<std::uint8_t, kSha1DigestInfo.size() + digest.size()> block{};
+    std::copy(kSha1DigestInfo.begin(), kSha1DigestInfo.end(), block.begin());
+    std::copy(digest.begin(), digest.end(), block.begin() + kSha1DigestInfo.size());
+    // Without a digest set the block is padded and signed as it is, which no digest policy looks at.
+    const ContextPointer context(EVP_PKEY_CTX_new(_key.get(), nullptr), &EVP_PKEY_CTX_free);
+    std::size_t size = 0;
+    if (!context || EVP_PKEY_sign_init(context.get()) != 1 ||
+        EVP_PKEY_CTX_set_rsa_padding(context.get(), RSA_PKCS1_PADDING) != 1 ||
+        EVP_PKEY_sign(context.get(), nullptr, &size, block.data(), block.size()) != 1) {
+      return Failure{"cannot sign: " + lastOpenSslError()};
+    }
+    std::vector<std::uint8_t> signature(size);
+    if (EVP_PKEY_sign(context.get(), signature.data(), &size, block.data(), block.size()) != 1) {
+      return Failure{"cannot sign: " + lastOpenSslError()};
+    }
+    signature.resize(size);
+    return signature;
+  }
+
+ private:
+  const KeyPointer _key;
+};
+
+}  // namespace
+
+Result<std::shared_ptr<const SigningKey>> SigningKey::generate(unsigned bits) {
+  KeyPointer key(EVP_RSA_gen(bits), &EVP_PKEY_free);
+  if (!key) return Failure{"cannot make an RSA key: " + lastOpenSslError()};
+  return std::shared_ptr<const SigningKey>(std::make_shared<OpenSslSigningKey>(std::move(key)));
+}
+
+Result<std::shared_ptr<const SigningKey>> SigningKey::read(const std::string& path) {
+  const FilePointer file(std::fopen(path.c_str(), "re"), &std::fclose);
+  if (!file) return Failure{fmt::format("cannot read {}: {}", path, std::strerror(errno))};
+  // The empty pass phrase keeps OpenSSL from asking for one on the terminal.
+  KeyPointer key(PEM_read_PrivateKey(file.get(), nullptr, nullptr, const_cast<char*>("")), &EVP_PKEY_free);
+  if (!key) return Failure{fmt::format("{} is no private key in PEM form: {}", path, lastOpenSslError())};
+  if (EVP_PKEY_get_base_id(key.get()) != EVP_PKEY_RSA) return Failure{path + " is no RSA key"};
+  return std::shared_ptr<const SigningKey>(std::make_shared<OpenSslSigningKey>(std::move(key)));
+}
+
+Result<std::shared_ptr<const SigningKey>> SigningKey::readOrMake(const std::string& path) {
+  struct stat status {};
+  if (::stat(path.c_str(), &status) == 0 || errno != ENOENT) return read(path);
+  auto made = generate();
+  if (!made) return made;
+  if (auto failure = made.value()->write(path)) return std::move(*failure);
+  return made;
+}
+
+}  // namespace orvanta

@@ -1,0 +1,124 @@
+#include "tools/storebag/StorebagFile.h"
+
+#include <fmt/format.h>
+
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+
+#include "platform/Json.h"
+#include "platform/PropertyList.h"
+
+namespace orvanta {
+
+using platform::Failure;
+using platform::Result;
+using platform::Value;
+
+namespace {
+
+constexpr std::uintmax_t kMaximumFileBytes = 64U << 20U;
+
+Result<std::vector<std::uint8_t>> decodedField(const platform::Dictionary& document, std::string_view key) {
+  const Value* field = document.find(key);
+  if (field == nullptr) return Failure{fmt::format("the document has no \"{}\"", key)};
+  if (field->string() == nullptr) return Failure{fmt::format("the document's \"{}\" is no text", key)};
+  auto bytes = platform::decodeBase64(*field->string());
+  if (!bytes) return Failure{fmt::format("the document's \"{}\" is no base64", key)};
+  return std::move(*bytes);
+}
+
+}  // namespace
+
+std::optional<PropertyListForm> propertyListFormFromText(std::string_view text) {
+  if (text == "xml") return PropertyListForm::xml;
+  if (text == "binary") return PropertyListForm::binary;
+  return std::nullopt;
+}
+
+std::string_view propertyListFormText(PropertyListForm form) {
+  return form == PropertyListForm::xml ? "xml" : "binary";
+}
+
+Result<std::vector<std::uint8_t>> writePropertyList(const Value& value, PropertyListForm form) {
+  if (form == PropertyListForm::binary) return platform::writeBinaryPropertyList(value);
+  const auto text = platform::writeXmlPropertyList(value);
+  if (!text) return Failure{text.error()};
+  return std::vector<std::uint8_t>(text.value().begin(), text.value().end());
+}
+
+Result<std::vector<std::uint8_t>> makeStorebag(const Value& inner, const SigningKey& key, PropertyListForm container,
+                                               PropertyListForm bag) {
+  if (inner.dictionary() == nullptr) return Failure{"a bag must be a dictionary"};
+  const auto bagBytes = writePropertyList(inner, bag);
+  if (!bagBytes) return bagBytes;
+  const auto signature = key.sign(bagBytes.value());
+  if (!signature) return signature;
+  return writePropertyList(platform::Dictionary{{"signature", platform::encodeBase64(signature.value())},
+                                                {"bag", platform::encodeBase64(bagBytes.value())}},
+                           container);
+}
+
+Result<StorebagContent> openStorebag(std::span<const std::uint8_t> document) {
+  const auto parsed = platform::parsePropertyList(document);
+  if (!parsed) return Failure{"the document is no property list: " + parsed.error()};
+  const platform::Dictionary* fields = parsed.value().dictionary();
+  if (fields == nullptr) return Failure{"the document is no dictionary"};
+  auto signature = decodedField(*fields, "signature");
+  if (!signature) return Failure{signature.error()};
+  auto bag = decodedField(*fields, "bag");
+  if (!bag) return Failure{bag.error()};
+  auto inner = platform::parsePropertyList(bag.value());
+  if (!inner) return Failure{"the bag inside is no property list: " + inner.error()};
+  return StorebagContent{std::move(bag.value()), std::move(signature.value()), std::move(inner.value())};
+}
+
+Result<Value> parseBagSource(std::span<const std::uint8_t> bytes) {
+  std::string_view text(reinterpret_cast<const char*>(bytes.data()), bytes.size());
+  const auto first = text.find_first_not_of(" \t\r\n");
+  auto parsed = first != std::string_view::npos && text[first] == '{' ? platform::parseJson(text)
+                                                                      : platform::parsePropertyList(bytes);
+  if (parsed && parsed.value().dictionary() == nullptr) return Failure{"a bag must be a dictionary"};
+  return parsed;
+}
+
+Result<Value> readBagSource(const std::string& path) {
+  const auto bytes = readFile(path);
+  if (!bytes) return Failure{bytes.error()};
+  auto bag = parseBagSource(bytes.value());
+  if (!bag) return Failure{fmt::format("{}: {}", path, bag.error())};
+  return bag;
+}
+
+Result<std::vector<std::uint8_t>> readFile(const std::string& path) {
+  std::error_code error;
+  const auto size = std::filesystem::file_size(path, error);
+  if (error) return Failure{fmt::format("cannot read {}: {}", path, error.message())};
+  if (size > kMaximumFileBytes) return Failure{fmt::format("{} is larger than {} MiB", path, kMaximumFileBytes >> 20U)};
+  std::ifstream file(path, std::ios::binary);
+  if (!file) return Failure{fmt::format("cannot read {}: {}", path, std::strerror(errno))};
+  std::vector<std::uint8_t> bytes(size);
+  file.read(reinterpret_cast<char*>(bytes.data()), static_cast<std::streamsize>(size));
+  bytes.resize(static_cast<std::size_t>(file.gcount()));
+  return bytes;
+}
+
+std::optional<Failure> writeFile(const std::string& path, std::span<const std::uint8_t> bytes) {
+  const std::string temporary = path + ".new";
+  {
+    std::ofstream file(temporary, std::ios::binary | std::ios::trunc);
+    file.write(reinterpret_cast<const char*>(bytes.data()), static_cast<std::streamsize>(bytes.size()));
+    file.flush();
+    if (!file) {
+      return Failure{fmt::format("cannot write {}: {}", temporary, std::strerror(errno))};
+    }
+  }
+  std::error_code error;
+  std::filesystem::rename(temporary, path, error);
+  if (error) return Failure{fmt::format("cannot write {}: {}", path, error.message())};
+  return std::nullopt;
+}
+
+}  // namespace orvanta
