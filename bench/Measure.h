@@ -1,0 +1,56 @@
+#pragma once
+
+#include <sys/types.h>
+
+#include <chrono>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+namespace orvanta::bench {
+
+// CPU time that a process has used so far, all its threads together, in microseconds; the calling process for pid 0.
+double cpuMicroseconds(pid_t pid = 0);
+
+// Wall and CPU time of a stretch of work, of this process or another one.
+class Stretch {
+ public:
+  explicit Stretch(pid_t pid = 0) : _pid(pid), _cpu(cpuMicroseconds(pid)), _begun(std::chrono::steady_clock::now()) {}
+  double wallMicroseconds() const {
+    return std::chrono::duration<double, std::micro>(std::chrono::steady_clock::now() - _begun).count();
+  }
+  double cpu() const { return cpuMicroseconds(_pid) - _cpu; }
+
+ private:
+  const pid_t _pid;
+  const double _cpu;
+  const std::chrono::steady_clock::time_point _begun;
+};
+
+// What one measurement gave, per event.
+struct Figure {
+  double perSecond = 0;
+  double cpuPerEvent = 0;  // microseconds
+};
+Figure figureOf(const Stretch& stretch, std::uint64_t events);
+
+double median(std::vector<double> values);
+double percentile(std::vector<double> values, double share);
+
+// One line of the table: the figure, the raw limit measured in the same run, their ratio and the goal.
+void printHeading(const std::string& title);
+void printFigure(const std::string& name, const Figure& figure);
+void printRatio(const std::string& name, double value, double rawLimit, double goal, const char* unit = "us");
+
+// Runs `once` until at least `seconds` have passed; how often it ran is in the result's events.
+template <class Once>
+Figure measure(double seconds, Once once) {
+  const Stretch stretch;
+  std::uint64_t events = 0;
+  do {
+    events += once();
+  } while (stretch.wallMicroseconds() < seconds * 1e6);
+  return figureOf(stretch, events);
+}
+
+}  // namespace orvanta::bench

@@ -1,0 +1,432 @@
+#include "backends/EventRecord.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cmath>
+#include <limits>
+#include <random>
+
+#include "backends/EventField.h"
+#include "backends/PostMessage.h"
+#include "platform/Json.h"
+#include "tests/backends/HTTPSFixture.h"
+#include "tests/support/LogCapture.h"
+
+namespace orvanta::test {
+namespace {
+
+constexpr const char* kRemovedLine =
+    "<4>HTTPSPostBackend(createMessageForPostAndLogging): Tressel unable to handle key: ";
+
+// Makes records the obvious way: one flat dictionary, changed step by step.
+struct Reference {
+  Dictionary fields;
+
+  void filter(const Array& definitions) {
+    const auto numberAt = [&](const Dictionary& from, const char* key, int otherwise) {
+      const Value* value = from.find(key);
+      return value == nullptr ? otherwise : static_cast<int>(value->integerValue());
+    };
+    const int method = numberAt(fields, "_method", 0);
+    const int status = numberAt(fields, "_status", 0);
+    const Dictionary snapshot = fields;
+    for (const auto& [key, value] : snapshot) {
+      for (const Value& element : definitions) {
+        const Dictionary& rule = *element.dictionary();
+        const int ruleMethod = numberAt(rule, "method", -1);
+        const int ruleStatus = numberAt(rule, "status", -1);
+        if (lower(*rule.find("key")->string()) != lower(key)) continue;
+        if (ruleMethod >= 0 && ruleMethod != method) continue;
+        if (ruleStatus >= 0 && ruleStatus != status) continue;
+        const std::string action = *rule.find("action")->string();
+        if (action == "remove" || (action == "sha256" && !sendable(value))) fields.erase(key);
+        if (action == "sha256" && sendable(value)) {
+          const Value text = value.date() != nullptr ? Value(value.date()->secondsSince1970) : value;
+          fields.set(key, OrvantaBackend::convertIntoSHA256(text.description()));
+        }
+        break;
+      }
+    }
+  }
+
+  // What is left after cleaning; how many were removed.
+  std::pair<Dictionary, std::size_t> cleaned() const {
+    std::pair<Dictionary, std::size_t> result;
+    for (const auto& [key, value] : fields) {
+      if (!sendable(value)) {
+        ++result.second;
+      } else {
+        result.first.set(key, value.date() != nullptr ? Value(value.date()->secondsSince1970) : value);
+      }
+    }
+    return result;
+  }
+
+  static bool sendable(const Value& value) {
+    const double* real = std::get_if<double>(&value.storage());
+    if (real != nullptr) return std::isfinite(*real);
+    return value.string() != nullptr || value.isNumber() || value.date() != nullptr;
+  }
+  static std::string lower(std::string text) {
+    std::transform(text.begin(), text.end(), text.begin(),
+                   [](char c) { return c >= 'A' && c <= 'Z' ? char(c + 32) : c; });
+    return text;
+  }
+};
+
+// JSON has one kind of number: both sides are compared as they read back.
+Value readBack(const Dictionary& dictionary) {
+  return *platform::parseJson(platform::writeJson(Value(dictionary)));
+}
+
+class EventRecordTest : public HTTPSFixture {
+ protected:
+  std::shared_ptr<const SessionFields> fieldsOf(const BackendIdentity& identity, bool internalBuild = false,
+                                                const std::string& family = "Parva") {
+    OrvantaBackend backend(platform, "http_post", shared({}), family);
+    backend.setIdentity(identity);
+    return SessionFields::of(backend, internalBuild);
+  }
+  static Dictionary parsed(const std::string& json) {
+    auto value = platform::parseJson(json);
+    if (!value || value->dictionary() == nullptr) {
+      ADD_FAILURE() << json;
+      return {};
+    }
+    return *value->dictionary();
+  }
+  static std::string write(const EventRecord& record, FieldWriter::Form form,
+                           const EventRecord::Overlay& overlay = {}) {
+    std::string json;
+    FieldWriter writer(json, form);
+    record.write(writer, overlay);
+    writer.finish();
+    return json;
+  }
+};
+
+TEST_F(EventRecordTest, EveryReservedKeyWithItsType) {
+  const auto fields = fieldsOf(defaultIdentity());
+  EventRecord::Numbers numbers;
+  numbers.method = 3;
+  numbers.respCode = 4;
+  numbers.eventID = 65535;
+  numbers.timezoneOffset = -3600;
+  numbers.clientTS = fields->clientTS({1'700'000'000, 500'000});
+  EventRecord record(fields, nullptr, "root.own", numbers);
+  record.prepare(nullptr, {});
+  EXPECT_EQ(write(record, FieldWriter::Form::compact),
+            "{\"_startTS\":1699999980,\"_sender\":\"ZK\",\"_clientVersion\":42,\"_productFamily\":\"Parva\","
+            "\"_productModel\":\"Parva3,2\",\"_osVersion\":\"12.5\",\"_build\":\"12F5\",\"_internal\":2,"
+            "\"_reportVers\":\"8.0\",\"_sessionID\":\"root.own\",\"_eventNumber\":65535,\"_method\":3,\"_status\":4,"
+            "\"_clientTS\":1699999990.25,\"eventTime\":1699999990.25,\"_timezoneOffset\":-3600}");
+}
+
+TEST_F(EventRecordTest, ReservedKeysThatDependOnTheSession) {
+  struct Row {
+    const char* what;
+    std::function<void(BackendIdentity&)> change;
+    bool internalBuild;
+    std::optional<std::string> combined;
+    const char* key;
+    Value expected;  // null: absent
+  };
+  const auto type = [](int clientType, bool isInternal) {
+    return [=](BackendIdentity& identity) {
+      identity.compType = clientType;
+      identity.isInternal = isInternal;
+    };
+  };
+  const auto same = [](BackendIdentity&) {};
+  const Row rows[] = {
+      {"combined identifier", same, false, "a.b", "_sessionID", "a.b"},
+      {"no identifier", same, false, std::nullopt, "_sessionID", nullptr},
+      {"type 7", type(7, false), false, "a.b", "_sessionID", 77},
+      {"type 7 without identifier", type(7, false), false, std::nullopt, "_sessionID", 77},
+      {"type 11", type(11, false), false, "a.b", "_sessionID", "a.b"},
+      {"type 11, internal", type(11, true), false, "a.b", "_sessionID", 77},
+      {"type 13, internal", type(13, true), false, std::nullopt, "_sessionID", 77},
+      {"type 12, internal", type(12, true), false, "a.b", "_sessionID", "a.b"},
+      {"largest number",
+       [](auto& identity) {
+         identity.compType = 7;
+         identity.sessionID = 4'294'967'295U;
+       },
+       false, "a", "_sessionID", 4'294'967'295U},
+      {"type 15", type(15, false), false, "a", "_sender", "QB-JOVEX"},
+      {"no such type", type(19, false), false, "a", "_sender", ""},
+      {"negative type", type(-1, false), false, "a", "_sender", ""},
+      {"internal build", same, true, "a", "_internal", 3},
+      {"internal session, customer build", type(5, true), false, "a", "_internal", 2},
+      {"three-part version", [](auto& i) { i.selfVersion = "4.2.1"; }, false, "a", "_reportVers", "4.2.1"},
+      {"two-part version", [](auto& i) { i.selfVersion = "4.2.0"; }, false, "a", "_reportVers", "4.2"},
+      {"no OS version", [](auto& i) { i.productVersion.reset(); }, false, "a", "_osVersion", nullptr},
+      {"no build", [](auto& i) { i.buildVersion.reset(); }, false, "a", "_build", nullptr},
+      {"no model", [](auto& i) { i.hardwareType.reset(); }, false, "a", "_productModel", nullptr},
+      {"start within a minute",
+       [](auto& i) {
+         i.startTimestamp = {1'000'059, 700'000};
+       },
+       false, "a", "_startTS", 1'000'020},
+      {"start before 1970",
+       [](auto& i) {
+         i.startTimestamp = {-61, 0};
+       },
+       false, "a", "_startTS", -60},
+  };
+  for (const auto& row : rows) {
+    BackendIdentity identity = defaultIdentity();
+    row.change(identity);
+    EventRecord record(fieldsOf(identity, row.internalBuild), nullptr, row.combined, {});
+    record.prepare(nullptr, {});
+    const Dictionary event = parsed(write(record, FieldWriter::Form::compact));
+    const Value* value = event.find(row.key);
+    EXPECT_EQ(value == nullptr ? Value() : *value, row.expected) << row.what;
+  }
+}
+
+TEST_F(EventRecordTest, TimesShareAMinuteAlignedOrigin) {
+  BackendIdentity identity = defaultIdentity();
+  identity.startTimestamp = {1'000'059, 700'000};
+  EXPECT_NEAR(fieldsOf(identity)->clientTS({1'000'100, 250'000}), 1'000'060.55, 1e-6);
+}
+
+TEST_F(EventRecordTest, JsonTypesOfPayloads) {
+  const LogCapture log;
+  const auto payload = shared({{"bool", true},
+                               {"date", platform::Date{12.5}},
+                               {"huge", std::numeric_limits<std::uint64_t>::max()},
+                               {"int", -5},
+                               {"never", platform::Date{std::nan("")}},
+                               {"real", 0.1},
+                               {"text", "a\"\n\xC3\xA4"},
+                               {"array", Array{1}},
+                               {"data", platform::Data{{1}}},
+                               {"dictionary", Dictionary{{"a", 1}}},
+                               {"infinite", -std::numeric_limits<double>::infinity()},
+                               {"nan", std::nan("")},
+                               {"null", nullptr}});
+  EventRecord record(fieldsOf(defaultIdentity()), payload, "own", {});
+  record.prepare(nullptr, {});
+  const std::string json = write(record, FieldWriter::Form::compact);
+  EXPECT_NE(json.find("\"bool\":true,\"date\":12.5,\"huge\":18446744073709551615,\"int\":-5,\"never\":-1"),
+            std::string::npos)
+      << json;
+  EXPECT_NE(json.find("\"real\":0.1,\"text\":\"a\\\"\\n\xC3\xA4\"}"), std::string::npos) << json;
+  for (const char* key : {"array", "data", "dictionary", "infinite", "nan", "null"}) {
+    EXPECT_EQ(json.find(std::string("\"") + key), std::string::npos) << key;
+    EXPECT_EQ(log.count(kRemovedLine + std::string(key) + ", value: "), 1U) << key;
+  }
+  EXPECT_EQ(log.count(kRemovedLine), 6U);
+  write(record, FieldWriter::Form::pretty);
+  EXPECT_EQ(log.count(kRemovedLine), 6U) << "the pretty form logs nothing again";
+}
+
+TEST_F(EventRecordTest, AnEventOfWhichNothingIsLeft) {
+  Array rules;
+  for (const auto name : kReservedKeyNames) rules.emplace_back(Dictionary{{"key", name}, {"action", "remove"}});
+  EventRecord record(fieldsOf(defaultIdentity()), nullptr, "own", {});
+  record.prepare(nullptr, *EventFilters::createFiltersFromArray(rules));
+  EXPECT_EQ(write(record, FieldWriter::Form::compact), "{}");
+  EXPECT_EQ(write(record, FieldWriter::Form::pretty), "{}");
+  EXPECT_EQ(record.category(), 0);
+}
+
+TEST_F(EventRecordTest, CategoryIsWhatTheRecordSays) {
+  const auto category = [&](SharedDictionary userInfo, Array rules) {
+    EventRecord::Numbers numbers;
+    numbers.method = 9;
+    EventRecord record(fieldsOf(defaultIdentity()), shared({{"_method", 4}}), "own", numbers);
+    record.prepare(RecordLayer::of(std::move(userInfo)), *EventFilters::createFiltersFromArray(rules));
+    return record.category();
+  };
+  const Value removed = Dictionary{{"key", "_METHOD"}, {"action", "remove"}};
+  const Value hashed = Dictionary{{"key", "_METHOD"}, {"action", "sha256"}};
+  EXPECT_EQ(category(nullptr, {}), 9);
+  EXPECT_EQ(category(shared({{"_method", "70000"}}), {}), 70000);
+  EXPECT_EQ(category(shared({{"_METHOD", 5}}), {}), 9);
+  EXPECT_EQ(category(nullptr, {removed}), 0);
+  EXPECT_EQ(category(nullptr, {hashed}),
+            static_cast<std::int32_t>(Value(OrvantaBackend::convertIntoSHA256("9")).integerValue()));
+}
+
+class RandomRecords {
+ public:
+  explicit RandomRecords(unsigned seed) : _random(seed) {}
+
+  std::size_t upTo(std::size_t n) { return std::uniform_int_distribution<std::size_t>(0, n)(_random); }
+  bool chance(double p) { return std::bernoulli_distribution(p)(_random); }
+
+  std::string key() {
+    static const std::vector<std::string> kKeys{"a",
+                                                "A",
+                                                "b",
+                                                "userName",
+                                                "USERNAME",
+                                                "clientName",
+                                                "serviceName",
+                                                "_method",
+                                                "_status",
+                                                "_sessionID",
+                                                "_METHOD",
+                                                "_build",
+                                                "_osVersion",
+                                                "eventTime",
+                                                "EVENTTIME",
+                                                "_startTS",
+                                                "_clientTS",
+                                                "_internal",
+                                                "_sender",
+                                                "_custom",
+                                                "",
+                                                "gr\xC3\xB6\xC3\x9F"
+                                                "e",
+                                                "long key with blanks"};
+    return kKeys[upTo(kKeys.size() - 1)];
+  }
+  Value value() {
+    switch (upTo(13)) {
+      case 0:
+        return std::nan("");
+      case 1:
+        return std::numeric_limits<double>::infinity();
+      case 2:
+        return Array{1, "x"};
+      case 3:
+        return Dictionary{{"x", 1}};
+      case 4:
+        return nullptr;
+      case 5:
+        return platform::Data{{1, 2, 3}};
+      case 6:
+        return platform::Date{1.5 * static_cast<double>(upTo(100))};
+      case 7:
+        return chance(0.5);
+      case 8:
+        return 0.25 * static_cast<double>(upTo(1000));
+      case 9:
+        return static_cast<unsigned long long>(upTo(5)) + (1ULL << 63U);
+      case 10:
+        return std::to_string(upTo(6));
+      case 11:
+        return std::string("quote \" and \xE2\x82\xAC ") + std::to_string(upTo(9));
+      default:
+        return static_cast<int>(upTo(6));
+    }
+  }
+  Dictionary dictionary(std::size_t most) {
+    Dictionary made;
+    for (std::size_t i = upTo(most); i > 0; --i) made.set(key(), value());
+    return made;
+  }
+  Array rules() {
+    Array made;
+    for (std::size_t i = upTo(6); i > 0; --i) {
+      Dictionary rule{{"key", key()}, {"action", chance(0.2) ? "none" : chance(0.5) ? "remove" : "sha256"}};
+      if (chance(0.4)) rule.set("method", static_cast<int>(upTo(5)) - 1);
+      if (chance(0.3)) rule.set("status", static_cast<int>(upTo(4)) - 1);
+      made.emplace_back(rule);
+    }
+    return made;
+  }
+
+ private:
+  std::mt19937 _random;
+};
+
+// However payload, user info, filters, relabelling and flush meet, the record is the flat dictionary that the steps one
+// after another make.
+TEST_F(EventRecordTest, EqualsTheStepwiseDictionary) {
+  for (unsigned seed = 0; seed < 4000; ++seed) {
+    RandomRecords random(seed);
+    BackendIdentity identity = defaultIdentity();
+    if (random.chance(0.3)) identity.productVersion.reset();
+    if (random.chance(0.3)) identity.buildVersion.reset();
+    if (random.chance(0.3)) identity.compType = 7;
+    const auto fields = fieldsOf(identity);
+    const SharedDictionary payload = random.chance(0.1) ? nullptr : shared(random.dictionary(12));
+    const SharedDictionary userInfo = random.chance(0.2) ? nullptr : shared(random.dictionary(5));
+    const std::optional<std::string> combined = random.chance(0.3) ? std::nullopt : std::optional<std::string>("own");
+    EventRecord::Numbers numbers;
+    numbers.method = static_cast<std::uint16_t>(random.upTo(4));
+    numbers.respCode = static_cast<std::uint16_t>(random.upTo(3));
+    numbers.eventID = static_cast<std::uint16_t>(seed);
+    numbers.clientTS = 1000.5;
+    const Array rules = random.rules();
+    const Array flushRules = random.chance(0.5) ? rules : random.rules();
+    const SharedDictionary flushUserInfo = random.chance(0.7) ? userInfo : shared(random.dictionary(4));
+
+    EventRecord record(fields, payload, combined, numbers);
+    const auto layer = RecordLayer::of(userInfo);
+    record.prepare(layer, *EventFilters::createFiltersFromArray(rules));
+
+    Reference reference;
+    if (payload) reference.fields = *payload;
+    for (std::size_t i = 0; i < kReservedKeyCount; ++i) {
+      const Value constant = fields->value(static_cast<ReservedKey>(i));
+      if (!constant.isNull()) reference.fields.set(kReservedKeyNames[i], constant);
+    }
+    if (combined) reference.fields.set("_sessionID", *combined);
+    if (fields->numericSessionID) reference.fields.set("_sessionID", *fields->numericSessionID);
+    reference.fields.set("_eventNumber", static_cast<int>(numbers.eventID));
+    reference.fields.set("_method", static_cast<int>(numbers.method));
+    reference.fields.set("_status", static_cast<int>(numbers.respCode));
+    reference.fields.set("_clientTS", numbers.clientTS);
+    reference.fields.set("eventTime", numbers.clientTS);
+    reference.fields.set("_timezoneOffset", 0);
+    if (userInfo) reference.fields.merge(*userInfo);
+    reference.filter(rules);
+    const Value* method = reference.fields.find("_method");
+    ASSERT_EQ(record.category(), method == nullptr ? 0 : static_cast<std::int32_t>(method->integerValue())) << seed;
+
+    EventRecord::Overlay overlay;
+    const std::string label = "root.own";
+    std::shared_ptr<const RecordLayer> flushLayer;
+    if (random.chance(0.4)) {
+      overlay.relabelled = true;
+      overlay.sessionID = random.chance(0.3) ? nullptr : &label;
+      reference.fields.erase("_sessionID");
+      if (overlay.sessionID != nullptr) reference.fields.set("_sessionID", label);
+    }
+    if (flushUserInfo && random.chance(0.6)) {
+      Reference filtered{*flushUserInfo};
+      filtered.filter(flushRules);
+      reference.fields.merge(filtered.fields);
+      auto made = std::make_shared<Dictionary>(*flushUserInfo);
+      EventFilters::createFiltersFromArray(flushRules)->filterEvent(*made);
+      ASSERT_EQ(Value(*made).description(), Value(filtered.fields).description()) << seed;
+      // As a flush without rules does.
+      flushLayer = flushUserInfo == userInfo && flushRules.empty() ? layer : RecordLayer::of(made);
+      overlay.userInfo = flushLayer.get();
+    }
+
+    const LogCapture log;
+    const auto [expected, removed] = reference.cleaned();
+    const Dictionary compact = parsed(write(record, FieldWriter::Form::compact, overlay));
+    ASSERT_EQ(log.count(kRemovedLine), removed) << seed;
+    ASSERT_EQ(Value(compact), readBack(expected)) << seed << "\n"
+                                                  << platform::writeJson(Value(compact)) << "\n"
+                                                  << platform::writeJson(Value(expected));
+    ASSERT_EQ(Value(parsed(write(record, FieldWriter::Form::pretty, overlay))), Value(compact)) << seed;
+  }
+}
+
+TEST_F(EventRecordTest, Message) {
+  EventRecord record(fieldsOf(defaultIdentity()), shared({{"a", 1}}), "own", {});
+  Array rules;
+  for (const auto name : kReservedKeyNames) rules.emplace_back(Dictionary{{"key", name}, {"action", "remove"}});
+  record.prepare(nullptr, *EventFilters::createFiltersFromArray(rules));
+  const OutgoingEvent events[] = {{&record, {}}, {&record, {}}};
+  const auto message = createMessageForPostAndLogging(1700000000.25, "ID\"1", events, true);
+  EXPECT_EQ(message.json, "{\"postTime\":1700000000.25,\"clientId\":\"ID\\\"1\",\"events\":[{\"a\":1},{\"a\":1}]}");
+  EXPECT_EQ(message.prettyJsonString,
+            "{\n  \"postTime\": 1700000000.25,\n  \"clientId\": \"ID\\\"1\",\n  \"events\": [\n    {\n      \"a\": 1\n"
+            "    },\n    {\n      \"a\": 1\n    }\n  ]\n}");
+  const auto bare = createMessageForPostAndLogging(std::nan(""), "x", {}, false);
+  EXPECT_EQ(parsed(bare.json), (Dictionary{{"postTime", -1}, {"clientId", "x"}, {"events", Array{}}}));
+  EXPECT_FALSE(bare.prettyJsonString);
+}
+
+}  // namespace
+}  // namespace orvanta::test

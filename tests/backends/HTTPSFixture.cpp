@@ -1,0 +1,125 @@
+#include "tests/backends/HTTPSFixture.h"
+
+#include <zlib.h>
+
+#include <stdexcept>
+
+#include "platform/Json.h"
+
+namespace orvanta::test {
+
+std::string gunzip(const std::string& bytes) {
+  z_stream stream{};
+  if (::inflateInit2(&stream, 15 + 16) != Z_OK) throw std::runtime_error("inflateInit2 failed");
+  std::string out;
+  std::string chunk(65536, '\0');
+  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes.data()));
+  stream.avail_in = static_cast<uInt>(bytes.size());
+  int result = Z_OK;
+  while (result == Z_OK) {
+    stream.next_out = reinterpret_cast<Bytef*>(chunk.data());
+    stream.avail_out = static_cast<uInt>(chunk.size());
+    result = ::inflate(&stream, Z_NO_FLUSH);
+    out.append(chunk, 0, chunk.size() - stream.avail_out);
+  }
+  ::inflateEnd(&stream);
+  if (result != Z_STREAM_END) throw std::runtime_error("not a whole gzip member");
+  return out;
+}
+
+std::string headerOf(const platform::HttpRequest& request, std::string_view name) {
+  for (const auto& header : request.headers) {
+    if (header.name == name) return header.value;
+  }
+  return "(absent)";
+}
+
+std::string plainBody(const platform::HttpRequest& request) {
+  return headerOf(request, "Content-Encoding") == "gzip" ? gunzip(request.body) : request.body;
+}
+
+Array postedEvents(const platform::HttpRequest& request) {
+  const auto body = platform::parseJson(plainBody(request));
+  if (!body) {
+    ADD_FAILURE() << body.error();
+    return {};
+  }
+  const Value* events = body->dictionary()->find("events");
+  return *events->array();
+}
+
+Dictionary HTTPSFixture::openSection() {
+  return {{"locale_whitelist", Array{"DE"}},
+          {"filters", Array{Value(Dictionary{{"key", "nothingOfThatName"}, {"action", "remove"}})}},
+          {"override_dnu", 1},
+          {"sampling_threshold", 1},
+          {"event_threshold", 49},
+          {"post_url", "https://events.example/batch"},
+          {"realtime_post_url", "https://events.example/realtime"}};
+}
+
+BackendIdentity HTTPSFixture::defaultIdentity() {
+  BackendIdentity identity;
+  identity.sessionID = 77;
+  identity.compType = 5;
+  identity.clientVersion = 42;
+  identity.udid = "0123456789abcdef0123456789abcdef01234567";
+  identity.productVersion = "12.5";
+  identity.buildVersion = "12F5";
+  identity.hardwareType = "Parva3,2";
+  identity.selfVersion = "8.0.0";
+  identity.startTimestamp = {1'699'999'990, 250'000};
+  return identity;
+}
+
+std::shared_ptr<HTTPSPostBackend> HTTPSFixture::makeBackend(const Setup& setup) {
+  auto backend = HTTPSPostBackend::create(platform, setup.name, shared(setup.profile), "Parva");
+  if (!backend) return nullptr;
+  backend->setIdentity(setup.identity);
+  backend->setBatchEvents(setup.batchEvents);
+  backend->setUserInfoDict(setup.userInfo);
+  backend->setSamplingFactor(setup.samplingFactor);
+  backend->setCombinedSessionIDString("own");
+  if (setup.evaluate) backend->updateState();
+  return backend;
+}
+
+std::optional<std::string> HTTPSFixture::send(OrvantaBackend& backend, std::uint16_t method, std::int32_t flag,
+                                              SharedDictionary payload, std::uint16_t respCode) {
+  return backend.sendMessage(payload, platform.clock.timeOfDay(), method, respCode, flag);
+}
+
+FlushAnswer HTTPSFixture::flush(HTTPSPostBackend& backend) {
+  auto answer = std::make_shared<FlushAnswer>();
+  backend.flushMessagesWithCompletion([answer](std::optional<std::string> text, std::optional<OrvantaError> error) {
+    ++answer->calls;
+    answer->text = std::move(text);
+    answer->error = std::move(error);
+  });
+  settle();
+  return *answer;
+}
+
+void HTTPSFixture::settle() {
+  ASSERT_TRUE(PendingPosts::of(platform).waitUntilHandedIn(kHangGuard));
+}
+
+HTTPSFixture::Posts HTTPSFixture::categories() {
+  Posts all;
+  for (const auto& request : requests()) {
+    std::string text;
+    for (const Value& event : postedEvents(request)) {
+      const Value* method = event.dictionary()->find("_method");
+      text += (text.empty() ? "" : " ") + (method == nullptr ? "none" : method->description());
+    }
+    all.push_back(std::move(text));
+  }
+  return all;
+}
+
+std::vector<platform::HttpRequest> HTTPSFixture::requests() {
+  settle();
+  return platform.http.requests();
+}
+
+}  // namespace orvanta::test

@@ -1,0 +1,89 @@
+#include <gtest/gtest.h>
+
+#include "tests/backends/HTTPSFixture.h"
+
+namespace orvanta::test {
+namespace {
+
+const std::string kSecret = "s3cr3t-value-of-a-person";
+
+class HTTPSPostPrivacyTest : public HTTPSFixture {
+ protected:
+  static Setup filtering(const char* action) {
+    Dictionary section = openSection();
+    section.set("filters", Array{Value(Dictionary{{"key", "PersonName"}, {"action", action}})});
+    section.set("event_threshold", 2);
+    Setup setup;
+    setup.profile = profileOf({Value(section)});
+    setup.identity.requireUserInfo = true;
+    setup.batchEvents = true;
+    setup.userInfo = shared({{"clientName", "Mail"}, {"personName", kSecret}});
+    return setup;
+  }
+  // How many posts carry the text, as they stand, uncompressed, in the address or in a header.
+  std::size_t postsWith(const std::string& text) {
+    std::size_t count = 0;
+    for (const auto& request : requests()) {
+      std::string all = request.url + request.body + plainBody(request);
+      for (const auto& header : request.headers) all += header.name + header.value;
+      count += all.find(text) != std::string::npos ? 1 : 0;
+    }
+    return count;
+  }
+};
+
+TEST_F(HTTPSPostPrivacyTest, FilteredFieldsLeaveOnNoWay) {
+  for (const char* action : {"remove", "sha256"}) {
+    platform.http.clear();
+    const auto backend = makeBackend(filtering(action));
+    const auto payload = shared({{"PERSONNAME", kSecret}, {"personName", kSecret}, {"open", "visible"}});
+    send(*backend, 1, 1, payload);                              // direct
+    send(*backend, 1, 0, payload);                              // batched,
+    send(*backend, 2, 3, payload);                              // forced out
+    for (int i = 0; i < 5; ++i) send(*backend, 3, 0, payload);  // threshold
+    backend->setUserInfoDict(shared({{"clientName", "Mail"}, {"PersonName", kSecret}}));
+    flush(*backend);                   // user info merged again
+    send(*backend, 0, 1, payload, 1);  // the session's end
+    EXPECT_GE(requests().size(), 6U) << action;
+    EXPECT_EQ(postsWith(kSecret), 0U) << action;
+    EXPECT_EQ(postsWith("visible"), requests().size()) << action;
+    const std::string digest = OrvantaBackend::convertIntoSHA256(kSecret);
+    EXPECT_EQ(postsWith(digest), std::string(action) == "sha256" ? requests().size() : 0U);
+    EXPECT_EQ(postsWith(OrvantaBackend::convertIntoSHA256(digest)), 0U) << "no digest of a digest";
+  }
+}
+
+TEST_F(HTTPSPostPrivacyTest, WhatEventsBeforeUserInfoAndOtherSessionsKeep) {
+  // The filters come with the evaluation that has user info; what was batched before was prepared without them.
+  Setup setup = filtering("remove");
+  const SharedDictionary userInfo = setup.userInfo;
+  setup.userInfo = nullptr;
+  const auto backend = makeBackend(setup);
+  send(*backend, 1, 0, shared({{"personName", kSecret}}));
+  backend->setUserInfoDict(shared({{"clientName", "Mail"}}));
+  backend->updateState();
+  flush(*backend);
+  EXPECT_EQ(postsWith(kSecret), 1U);
+
+  platform.http.clear();
+  setup.identity.requireUserInfo = false;
+  setup.userInfo = userInfo;
+  send(*makeBackend(setup), 1, 1);
+  EXPECT_EQ(postsWith(kSecret), 1U);
+}
+
+TEST_F(HTTPSPostPrivacyTest, FiltersForOneCategory) {
+  Dictionary section = openSection();
+  section.set("filters", Array{Value(Dictionary{{"key", "personName"}, {"method", 3}, {"action", "remove"}})});
+  Setup setup = filtering("remove");
+  setup.profile = profileOf({Value(section)});
+  const auto backend = makeBackend(setup);
+  send(*backend, 3, 1);
+  EXPECT_EQ(postsWith(kSecret), 0U);
+  send(*backend, 3);
+  flush(*backend);
+  EXPECT_EQ(postsWith(kSecret), 1U) << "a flush merges user info under no category";
+}
+
+}  // namespace
+}  // namespace orvanta::test

@@ -1,0 +1,84 @@
+#include "backends/StringMatching.h"
+
+#include <gtest/gtest.h>
+
+namespace orvanta {
+namespace {
+
+struct EqualRow {
+  const char* a;
+  const char* b;
+  bool equal;
+};
+
+TEST(StringMatching, EqualsIgnoringCase) {
+  const EqualRow rows[] = {
+      {"", "", true},
+      {"userName", "USERNAME", true},
+      {"Größe", "GRÖSSE", false},  // letters are folded one by one
+      {"GRÖẞE", "größe", false},
+      {"ÄÖÜ", "äöü", true},
+      {"ŁÓDŹ", "łódź", true},
+      {"ŽIVOT", "život", true},
+      {"ΑΘΉΝΑΣ", "αθήνας", true},  // a final sigma is a sigma
+      {"ПРИВЕТ", "привет", true},
+      {"ЁЖ", "ёж", true},
+      {"ՀԱՅ", "հայ", true},
+      {"Ÿ", "ÿ", true},
+      {"×", "÷", false},  // no letters, in the middle of a run of letters
+      {"[", "{", false},
+      {"@", "`", false},
+      {"a", "ab", false},
+      {"ab", "a", false},
+      {"\xC3", "\xC3", true},  // stray bytes stand for themselves
+      {"\xC3", "\xC2", false},
+      {"\xE2\x82", "\xE2\x82\xAC", false},
+  };
+  for (const auto& row : rows) {
+    EXPECT_EQ(equalsIgnoringCase(row.a, row.b), row.equal) << row.a << " and " << row.b;
+    EXPECT_EQ(foldCase(row.a) == foldCase(row.b), row.equal) << row.a << " and " << row.b;
+  }
+}
+
+struct ListRow {
+  TextList list;
+  std::optional<std::string> whole;
+  bool whitelist;
+  bool exact;
+  bool fragment;
+};
+
+TEST(StringMatching, Lists) {
+  const ListRow rows[] = {
+      {{}, "DE", true, true, true},
+      {{}, "DE", false, false, false},
+      {{}, std::nullopt, true, true, true},
+      {{}, std::nullopt, false, false, false},
+      {{"a", "b"}, std::nullopt, true, false, false},
+      {{"a", "b"}, std::nullopt, false, true, true},
+      {{"a", "b"}, "B", true, true, true},
+      {{"a", "b"}, "B", false, true, true},
+      {{"a", "b"}, "c", true, false, false},
+      {{"a", "b"}, "c", false, false, false},
+      {{"ab"}, "xABy", true, false, true},
+      {{"abc"}, "ab", true, false, false},
+      {{"ü"}, "XÜX", true, false, true},
+      {{" b"}, "b", true, false, false},
+      {{""}, "Mail", true, false, true},
+      {{""}, "", true, true, true},
+      {{""}, std::nullopt, true, false, false},
+  };
+  for (const auto& row : rows) {
+    const std::string what = (row.list.empty() ? "[]" : row.list.front()) + " / " + row.whole.value_or("(none)");
+    EXPECT_EQ(matchExactStringWithList(row.list, row.whole, row.whitelist), row.exact) << what;
+    EXPECT_EQ(matchStringWithList(row.list, row.whole, row.whitelist), row.fragment) << what;
+  }
+}
+
+TEST(StringMatching, SplitsWithoutTrimming) {
+  EXPECT_EQ(splitAtCommas("Mail, News,"), (TextList{"Mail", " News", ""}));
+  EXPECT_EQ(splitAtCommas(""), (TextList{""}));
+}
+
+}  // namespace
+}  // namespace orvanta

@@ -1,0 +1,273 @@
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+
+#include <atomic>
+#include <future>
+#include <thread>
+
+#include "platform/Connect.h"
+#include "platform/Connection.h"
+#include "platform/MessagePack.h"
+#include "tests/integration/IntegrationFixture.h"
+
+namespace orvanta::test {
+namespace {
+
+using Bytes = std::vector<std::uint8_t>;
+
+// A client that speaks bytes, as good or as bad as a test wants.
+class RawClient {
+ public:
+  explicit RawClient(const std::string& directory) {
+    auto socket = platform::connectToService(directory, "com.kovalt.orvantad");
+    EXPECT_TRUE(socket) << socket.error();
+    if (socket) _socket = std::move(*socket);
+    const int flags = ::fcntl(_socket.get(), F_GETFL);
+    ::fcntl(_socket.get(), F_SETFL, flags & ~O_NONBLOCK);
+  }
+  bool write(const Bytes& bytes) {
+    return ::send(_socket.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
+  }
+  // What comes until the daemon closes the connection.
+  Bytes readToEnd() {
+    Bytes all;
+    std::uint8_t buffer[4096];
+    for (ssize_t length; (length = ::read(_socket.get(), buffer, sizeof buffer)) > 0;) {
+      all.insert(all.end(), buffer, buffer + length);
+    }
+    return all;
+  }
+  // The next answer; none at the end.
+  std::optional<platform::Frame> answer() {
+    for (;;) {
+      auto outcome = _decoder.next();
+      if (auto* frame = std::get_if<platform::Frame>(&outcome)) return std::move(*frame);
+      std::uint8_t buffer[4096];
+      const ssize_t length = ::read(_socket.get(), buffer, sizeof buffer);
+      if (length <= 0) return std::nullopt;
+      _decoder.append({buffer, static_cast<std::size_t>(length)});
+    }
+  }
+  void shutdownSending() { ::shutdown(_socket.get(), SHUT_WR); }
+
+ private:
+  platform::UniqueFd _socket;
+  platform::FrameDecoder _decoder;
+};
+
+Bytes request(std::uint32_t id, const char* method, const Array& params = {}) {
+  Bytes message;
+  platform::appendRequestHeader(message, id, method, params.size());
+  platform::MessagePackWriter out(message);
+  for (const auto& param : params) out.value(param);
+  return message;
+}
+
+class ConnectionTest : public IntegrationFixture {
+ protected:
+  void SetUp() override {
+    IntegrationFixture::SetUp();
+    startDaemon();
+  }
+  RawClient rawClient() { return RawClient(daemon->runtimeDirectory()); }
+};
+
+TEST_F(ConnectionTest, AThousandPipelinedSendsAreAnsweredOnceEachInOrder) {
+  auto session = openSession({.sessionID = 1});
+  std::vector<int> order;
+  std::promise<void> done;
+  constexpr int kCalls = 1000;
+  for (int i = 0; i < kCalls; ++i) {
+    session->session().sendMessageWithDictionary(event(1, 1, {{"n", i}}).dictionary(),
+                                                 StringReply([&, i](auto outcome) {
+                                                   EXPECT_TRUE(outcome.values) << outcome.error.text;
+                                                   order.push_back(i);
+                                                   if (i == kCalls - 1) done.set_value();
+                                                 }));
+  }
+  ASSERT_EQ(done.get_future().wait_for(kPatience), std::future_status::ready);
+  ASSERT_EQ(order.size(), static_cast<std::size_t>(kCalls));
+  for (int i = 0; i < kCalls; ++i) EXPECT_EQ(order[i], i);
+}
+
+TEST_F(ConnectionTest, FiftyConnectionsAtOnceAreAllServed) {
+  std::atomic<int> answered{0};
+  std::vector<std::thread> clients;
+  for (int c = 0; c < 50; ++c) {
+    clients.emplace_back([this, c, &answered] {
+      auto session = openSession({.sessionID = static_cast<std::uint32_t>(c), .batchEvent = true});
+      for (int i = 0; i < 20; ++i) answered += session->session().blocking().sendMessage(event(1, 1)) ? 1 : 0;
+    });
+  }
+  for (auto& client : clients) client.join();
+  EXPECT_EQ(answered, 1000);
+}
+
+TEST_F(ConnectionTest, BrokenInputClosesItsConnectionWithOneLineAndNoOther) {
+  auto bystander = openSession({.sessionID = 1, .batchEvent = true});
+  const auto descriptorsBefore = daemon->descriptorCount();
+  Bytes deep(100'000, 0x91);
+  const Bytes claimsFourGiB{0xc6, 0xff, 0xff, 0xff, 0xff};
+  const Bytes claimsFourGiArray{0x94, 0x00, 0x01, 0xa1, 'x', 0xdd, 0xff, 0xff, 0xff, 0xff};
+  const struct {
+    const char* what;
+    Bytes bytes;
+    bool halfClose;  // the client stops in the middle
+  } rows[] = {
+      {"garbage", {'G', 'E', 'T', ' ', '/'}, false},
+      {"a number", {0x05}, false},
+      {"a frame of another shape", {0x93, 0x00, 0x01, 0x02}, false},
+      {"a response", {0x94, 0x01, 0x01, 0xc0, 0x90}, false},
+      {"nesting of 100,000", deep, false},
+      {"a byte that is never used", {0xc1}, false},
+      {"a claim of 4 GiB", claimsFourGiB, false},
+      {"an array of 4 GiB", claimsFourGiArray, true},
+      {"truncated", {0x94, 0x00, 0x01, 0xaf, 'f'}, true},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.what);
+    const auto closings = daemon->count("listener: Closing connection to");
+    auto client = rawClient();
+    client.write(request(1, "fetchDisplayURL"));
+    client.write(row.bytes);
+    auto first = client.answer();
+    ASSERT_TRUE(first) << "whole calls before the broken one are carried out";
+    EXPECT_EQ(first->messageID, 1U);
+    if (row.halfClose) {
+      client.shutdownSending();
+    } else {
+      client.readToEnd();
+      EXPECT_TRUE(daemon->logged("listener: Closing connection to", closings + 1));
+    }
+    EXPECT_TRUE(bystander->session().blocking().sendMessage(event(1, 1)));
+  }
+  EXPECT_TRUE(daemon->settles([this] { return daemon->descriptorCount(); }, descriptorsBefore));
+}
+
+TEST_F(ConnectionTest, RefusedCallsAreAnsweredAndTheConnectionGoesOn) {
+  auto client = rawClient();
+  const struct {
+    Bytes bytes;
+    const char* error;
+  } rows[] = {
+      {request(2, "noSuchOperation"), "unknown method 'noSuchOperation'"},
+      {request(2, "sendMessageWithCategory", {70000, 1, nullptr}), "integer from 0 to 65535"},
+      {request(2, "sendMessageWithCategory", {1, 1}), "takes 3 arguments"},
+      {request(2, "setSessionInfo", {1, nullptr, nullptr, false}), "must be a map"},
+      // {"a": 1, "a": 2} as message parameters.
+      {{0x94, 0x00, 0x02, 0xb9, 's', 'e', 'n', 'd', 'M', 'e', 's',  's',  'a',  'g', 'e',  'W',  'i', 't', 'h',
+        'D',  'i',  'c',  't',  'i', 'o', 'n', 'a', 'r', 'y', 0x91, 0x82, 0xa1, 'a', 0x01, 0xa1, 'a', 0x02},
+       "the key \"a\" twice"},
+  };
+  for (const auto& row : rows) {
+    client.write(row.bytes);
+    const auto answer = client.answer();
+    ASSERT_TRUE(answer) << row.error;
+    EXPECT_EQ(answer->messageID, 2U);
+    ASSERT_NE(answer->error.string(), nullptr);
+    EXPECT_NE(answer->error.string()->find(row.error), std::string::npos) << *answer->error.string();
+  }
+  client.write(request(3, "fetchDisplayURL"));
+  EXPECT_EQ(client.answer()->result, Value(Array{"URL not available"}));
+}
+
+TEST_F(ConnectionTest, BytesMayComeOneAtATime) {
+  auto client = rawClient();
+  for (const auto byte : request(9, "fetchDisplayURL")) client.write({byte});
+  const auto answer = client.answer();
+  ASSERT_TRUE(answer);
+  EXPECT_EQ(answer->messageID, 9U);
+}
+
+TEST_F(ConnectionTest, AfterAHalfCloseAnswersStillComeAndTheSessionStays) {
+  auto client = rawClient();
+  client.write(request(1, "fetchDisplayURL"));
+  client.write(request(2, "fetchDisplayURL"));
+  client.shutdownSending();
+  EXPECT_EQ(client.answer()->messageID, 1U);
+  EXPECT_EQ(client.answer()->messageID, 2U);
+  EXPECT_TRUE(daemon->logged("was interrupted"));
+  EXPECT_EQ(daemon->count("was invalidated"), 0U);
+}
+
+TEST_F(ConnectionTest, AClientThatNeverReadsStopsBeingReadAndHarmsNobody) {
+  auto bystander = openSession({.sessionID = 1, .batchEvent = true});
+  const auto residentBefore = daemon->residentKiB();
+  auto silent = rawClient();
+  Bytes burst;
+  for (int i = 0; i < 1000; ++i) {
+    const auto call = request(5, "fetchDisplayURL");
+    burst.insert(burst.end(), call.begin(), call.end());
+  }
+  std::atomic<bool> stopped{false};
+  std::thread writer([&] {
+    // Goes on until the daemon takes no more; the end of the connection wakes it.
+    while (!stopped && silent.write(burst)) {
+    }
+  });
+  for (int i = 0; i < 200; ++i) EXPECT_TRUE(bystander->session().blocking().sendMessage(event(1, 1)));
+  EXPECT_LT(daemon->residentKiB(), residentBefore + 32 * 1024);
+  stopped = true;
+  EXPECT_EQ(daemon->terminate(), 0);
+  writer.join();
+}
+
+TEST_F(ConnectionTest, AKilledClientsSessionEnds) {
+  ChildProcess::Options options;
+  options.program = DaemonProcess::programPath("orvantactl");
+  options.arguments = {"session", "--client-type", "5", "--session-id", "4242"};
+  options.environment = daemon->environment();
+  ChildProcess client(std::move(options));
+  // Its input has ended, so it may be anywhere between connecting and finishing.
+  ASSERT_TRUE(daemon->logged("initWithSessionDelegate: Initialized session with UUID"));
+  client.signal(SIGKILL);
+  client.wait();
+  EXPECT_TRUE(daemon->logged("was invalidated"));
+}
+
+class UnentitledTest : public IntegrationFixture {};
+
+TEST_F(UnentitledTest, NothingIsGrantedByDefault) {
+  options.entitled = false;
+  startDaemon();
+  auto connection = connect();
+  const auto answer = connection->session().blocking().fetchDisplayURL();
+  ASSERT_FALSE(answer);
+  EXPECT_FALSE(answer.error().text.empty());
+  EXPECT_TRUE(daemon->logged("does not have required orvanta entitlement. Closing connection..."));
+  EXPECT_EQ(daemon->count("initWithSessionDelegate"), 0U);
+}
+
+class BlockedFetchTest : public IntegrationFixture {};
+
+TEST_F(BlockedFetchTest, OneSessionsFetchHoldsUpNoOtherSessionsEventsAndEndsAtItsLimit) {
+  startDaemon();
+  auto working = openSession({.sessionID = 1, .clientType = 5, .batchEvent = true});
+  server->setFault("/storebags/brindle", collector::ConnectionFault::silent);
+  std::vector<std::unique_ptr<OrvantaConnection>> blocked;
+  std::promise<BackendNames> answered;
+  for (int i = 0; i < 8; ++i) {  // more than the pool has threads
+    blocked.push_back(connect());
+    blocked.back()->session().setSessionInfo(SessionInfo{.sessionID = 2, .clientType = 6}.dictionary(), nullptr,
+                                             nullptr, false, {});
+    blocked.back()->session().startConfigWithCompletionHandler(
+        i > 0 ? BackendNamesReply{} : BackendNamesReply([&answered](auto outcome) {
+          answered.set_value(outcome.values ? std::get<0>(*outcome.values) : BackendNames{});
+        }));
+  }
+  ASSERT_TRUE(daemon->logged("fetchAndCacheStorebag: Fetching storebag for client type 6"));
+  auto outcome = answered.get_future();
+  int sent = 0;
+  while (outcome.wait_for(std::chrono::milliseconds(0)) != std::future_status::ready) {
+    ASSERT_TRUE(working->session().blocking().sendMessage(event(1, 1)));
+    ++sent;
+    ASSERT_LT(sent, 50'000'000);
+  }
+  EXPECT_GT(sent, 100) << "events went on during the 15 seconds of the fetch";
+  EXPECT_EQ(outcome.get(), std::nullopt);
+  EXPECT_EQ(server->requests(RequestKind::storebag).size(), 2U) << "after a failure nobody asks again at once";
+}
+
+}  // namespace
+}  // namespace orvanta::test

@@ -1,0 +1,139 @@
+#include <gtest/gtest.h>
+
+#include <csignal>
+#include <filesystem>
+
+#include "platform/PropertyList.h"
+#include "tests/integration/IntegrationFixture.h"
+
+namespace orvanta::test {
+namespace {
+
+class LifecycleTest : public IntegrationFixture {
+ protected:
+  // The bookkeeping records (category 0) of that type that were posted.
+  std::size_t records(std::int64_t type) {
+    std::size_t found = 0;
+    for (const auto& received : server->events()) {
+      if (received.event.find("_method")->integerValue() == 0 &&
+          received.event.find("_status")->integerValue() == type) {
+        ++found;
+      }
+    }
+    return found;
+  }
+};
+
+TEST_F(LifecycleTest, SessionsSendTheirStartFinishAndEnd) {
+  startDaemon();
+  auto session = openSession({.sessionID = 1});
+  ASSERT_TRUE(session->session().blocking().finishSession());
+  session.reset();
+  ASSERT_TRUE(server->waitForEvents(3, kPatience));
+  EXPECT_EQ(records(0), 1U);
+  EXPECT_EQ(records(2), 1U);
+  EXPECT_EQ(records(1), 1U);
+  for (const auto& received : server->events()) {
+    if (received.event.find("_status")->integerValue() != 1) continue;
+    EXPECT_TRUE(received.event.contains("StorebagVersion"));
+    EXPECT_EQ(received.event.find("SamplingThreshold")->integerValue(), -1);
+    EXPECT_EQ(received.event.find("OverrideSampling")->integerValue(), -1);
+    EXPECT_EQ(received.event.find("Batch")->integerValue(), 0);
+    EXPECT_EQ(received.event.find("Opt")->integerValue(), 0);
+  }
+}
+
+TEST_F(LifecycleTest, SIGTERMEndsSessionsWhileTheirClientsAreConnected) {
+  startDaemon();
+  std::vector<std::unique_ptr<OrvantaConnection>> sessions;
+  for (std::uint32_t i = 0; i < 5; ++i) sessions.push_back(openSession({.sessionID = i, .batchEvent = true}));
+  send(*sessions[0], event(9, 9));
+  collector::PathBehaviour slow;
+  slow.delay = std::chrono::milliseconds(300);
+  server->setBehaviour("/events", slow);
+  EXPECT_EQ(daemon->terminate(), 0) << daemon->process().allLines();
+  EXPECT_EQ(records(1), 5U);
+  EXPECT_EQ(clientEvents().size(), 1U) << "what was batched went out with the last flush";
+}
+
+TEST_F(LifecycleTest, SIGTERMWhileAStorebagIsFetchedEndsTheFetch) {
+  server->setFault("/storebags/*", collector::ConnectionFault::silent);
+  startDaemon();
+  auto connection = connect();
+  connection->session().setSessionInfo(SessionInfo{.sessionID = 1, .clientType = 5}.dictionary(), nullptr, nullptr,
+                                       false, {});
+  connection->session().startConfigWithCompletionHandler({});
+  ASSERT_TRUE(daemon->logged("fetchAndCacheStorebag: Fetching storebag"));
+  EXPECT_EQ(daemon->terminate(), 0);
+}
+
+TEST_F(LifecycleTest, AfterSIGKILLAStaleSocketIsReplacedAndTheDefaultsAreWhole) {
+  startDaemon();
+  openSession({.sessionID = 1, .clientType = 5, .requireUserInfo = true}, UserInfo{"c", "s", {}});
+  daemon->process().signal(SIGKILL);
+  EXPECT_EQ(daemon->process().wait(), -SIGKILL);
+  EXPECT_TRUE(std::filesystem::exists(daemon->socketPath()));
+  ASSERT_TRUE(daemon->start()) << daemon->process().allLines();
+  EXPECT_TRUE(openSession({.sessionID = 2}));
+  EXPECT_TRUE(platform::readPropertyListFile(daemon->stateDirectory() + "/com.kovalt.orvanta.plist"));
+}
+
+TEST_F(LifecycleTest, ASecondDaemonOnTheSameSocketSaysWhoIsThere) {
+  startDaemon();
+  ChildProcess::Options second;
+  second.program = DaemonProcess::programPath("orvantad");
+  second.environment = daemon->environment();
+  ChildProcess other(std::move(second));
+  EXPECT_EQ(other.wait(), 1);
+  EXPECT_NE(other.allLines().find(std::to_string(daemon->process().pid())), std::string::npos) << other.allLines();
+  EXPECT_TRUE(openSession({.sessionID = 1}));
+}
+
+TEST_F(LifecycleTest, WithoutItsSandboxProfileItDoesNotRun) {
+  options.environment["ORVANTA_FRAMEWORK"] = "/nonexistent";
+  daemon = std::make_unique<DaemonProcess>(options);
+  EXPECT_FALSE(daemon->start());
+  EXPECT_EQ(daemon->process().wait(), 255);
+  EXPECT_EQ(daemon->count("<3>main: Failed to enter sandbox com.kovalt.orvantad: "), 1U);
+}
+
+TEST_F(LifecycleTest, OutsideTheSandboxItRunsWithAWarningAndLeaksNothing) {
+  options.sandbox = false;
+  startDaemon();
+  EXPECT_EQ(daemon->count("<4>main: ORVANTA_SANDBOX is off"), 1U);
+  for (int i = 0; i < 20; ++i) {
+    auto session = openSession({.sessionID = 1, .batchEvent = true});
+    send(*session, event(1, 1));
+  }
+  EXPECT_EQ(daemon->terminate(), 0);  // a sanitizer that finds a leak gives another status
+}
+
+TEST_F(LifecycleTest, AUserDefaultsFileThatDoesNotParseIsKeptAside) {
+  daemon = std::make_unique<DaemonProcess>(options);
+  std::ofstream(daemon->stateDirectory() + "/com.kovalt.orvanta.plist") << "<plist><dict><key>";
+  ASSERT_TRUE(daemon->start());
+  auto connection = connect();
+  connection->session().blocking().configure({.sessionID = 1, .clientType = 7});
+  EXPECT_TRUE(std::filesystem::exists(daemon->stateDirectory() + "/com.kovalt.orvanta.plist.corrupt"));
+  EXPECT_TRUE(daemon->logged("com.kovalt.orvanta.plist"));
+}
+
+TEST_F(LifecycleTest, ClosedSessionsLeaveNothingBehind) {
+  startDaemon();
+  constexpr std::size_t kSessions = 60;
+  const auto openAndClose = [this](std::size_t ended) {
+    for (std::size_t i = 0; i < kSessions; ++i) openSession({.sessionID = 1});
+    return daemon->logged("dealloc: OrvantadSession dealloc", ended);
+  };
+  // The first round also opens what is kept: connections to the event server, threads' buffers.
+  ASSERT_TRUE(openAndClose(kSessions));
+  const auto descriptors = daemon->descriptorCount();
+  ASSERT_TRUE(openAndClose(2 * kSessions));
+  ASSERT_TRUE(openAndClose(3 * kSessions));
+  constexpr std::size_t kKeptAlive = 8;  // more connections to the event server, never one a session
+  EXPECT_TRUE(daemon->settles([this] { return daemon->descriptorCount(); }, descriptors + kKeptAlive));
+  EXPECT_TRUE(daemon->settles([this] { return daemon->threadCount(); }, 8));
+}
+
+}  // namespace
+}  // namespace orvanta::test

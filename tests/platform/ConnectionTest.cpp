@@ -1,0 +1,332 @@
+#include "platform/Connection.h"
+
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <thread>
+
+#include "tests/platform/ConnectionFixture.h"
+#include "tests/support/LogCapture.h"
+
+namespace orvanta::test {
+namespace {
+
+using platform::BlockingScope;
+using platform::Connection;
+using platform::Frame;
+using platform::Outbox;
+using platform::UniqueFd;
+using platform::Value;
+using namespace std::chrono_literals;
+
+using ConnectionTest = ConnectionFixture;
+
+TEST_F(ConnectionTest, AnswersPipelinedCallsInOrder) {
+  auto made = open(
+      [](Connection& connection, Frame& frame) { connection.outbox()->send(response(frame.messageID, frame.method)); });
+  Bytes calls;
+  Bytes answers;
+  for (std::uint32_t id = 0; id < 1000; ++id) {
+    calls = std::move(calls) + request(id, "call");
+    answers = std::move(answers) + response(id, "call");
+  }
+  std::thread writer([&] { EXPECT_TRUE(made.peer.write(calls)); });
+  EXPECT_EQ(made.peer.read(answers.size()), answers);
+  writer.join();
+}
+
+TEST_F(ConnectionTest, TakesFramesApartHoweverTheyArrive) {
+  const Bytes stream = notification("first", "text") + request(7, "second") + notification("third", Value(1.5));
+  auto made = open();
+  for (const std::uint8_t byte : stream) ASSERT_TRUE(made.peer.write(Bytes{byte}));
+  ASSERT_TRUE(made.peer.write(repeated(stream, 100)));
+  ASSERT_TRUE(made.delegate->waitForFrames(303));
+  const auto methods = made.delegate->methods();
+  for (std::size_t i = 0; i < methods.size(); ++i) {
+    ASSERT_EQ(methods[i], (i % 3 == 0 ? "first" : i % 3 == 1 ? "second" : "third")) << i;
+  }
+}
+
+TEST_F(ConnectionTest, TakesAFrameOfMegabytes) {
+  auto made = open();
+  const Bytes large = notification("large", Value(std::string(8U << 20U, 'x')));
+  ASSERT_TRUE(made.peer.write(notification("before") + large + notification("after")));
+  ASSERT_TRUE(made.delegate->waitForFrames(3));
+  EXPECT_EQ(made.delegate->methods(), (std::vector<std::string>{"before", "large", "after"}));
+}
+
+struct BrokenStream {
+  const char* name;
+  Bytes bytes;
+};
+
+class BrokenStreamTest : public ConnectionFixture, public ::testing::WithParamInterface<BrokenStream> {};
+
+TEST_P(BrokenStreamTest, EndsTheConnectionAfterTheFramesBefore) {
+  LogCapture log;
+  auto made =
+      open([](Connection& connection, Frame& frame) { connection.outbox()->send(response(frame.messageID, "done")); });
+  ASSERT_TRUE(made.peer.write(request(1, "a") + request(2, "b") + GetParam().bytes));
+  ASSERT_TRUE(made.delegate->waitForInvalidation());
+  EXPECT_EQ(made.delegate->methods(), (std::vector<std::string>{"a", "b"}));
+  EXPECT_TRUE(made.delegate->protocolError().has_value());
+  EXPECT_EQ(made.delegate->interruptions(), 0);
+  EXPECT_EQ(log.count("Connection fd "), 1U);
+  // The answers to what came before are not lost.
+  EXPECT_EQ(made.peer.readToEnd(), response(1, "done") + response(2, "done"));
+  EXPECT_FALSE(made.connection->outbox()->send(response(3, "late")));
+}
+
+INSTANTIATE_TEST_SUITE_P(Streams, BrokenStreamTest,
+                         ::testing::Values(BrokenStream{"noMessagePack", {0xc1}},
+                                           BrokenStream{"text", {'G', 'E', 'T', ' ', '/'}},
+                                           BrokenStream{"noFrame", {0x91, 0x01}}, BrokenStream{"map", {0x80}},
+                                           BrokenStream{"unknownType", {0x93, 0x05, 0xa1, 'm', 0x90}},
+                                           BrokenStream{"hugeArray", {0xdd, 0xff, 0xff, 0xff, 0xff, 0x02}},
+                                           BrokenStream{"hugeText", {0x93, 0x02, 0xdb, 0xff, 0xff, 0xff, 0xff, 'x'}},
+                                           BrokenStream{"tooDeep", Bytes{0x93, 0x02, 0xa1, 'm'} + Bytes(64, 0x91)}),
+                         [](const auto& info) { return std::string(info.param.name); });
+
+TEST_F(ConnectionTest, EndsQuietlyWhenThePeerClosesWithinAFrame) {
+  LogCapture log(platform::LogLevel::info);
+  auto made = open();
+  const Bytes whole = notification("whole");
+  ASSERT_TRUE(made.peer.write(whole + Bytes(whole.begin(), whole.end() - 2)));
+  made.peer.close();
+  ASSERT_TRUE(made.delegate->waitForInvalidation());
+  EXPECT_EQ(made.delegate->methods(), std::vector<std::string>{"whole"});
+  EXPECT_EQ(made.delegate->protocolError(), std::nullopt);
+  EXPECT_EQ(made.delegate->interruptions(), 0);
+  EXPECT_TRUE(log.lines().empty());
+}
+
+TEST_F(ConnectionTest, CarriesOutEverythingThatArrivedBeforeTheClose) {
+  Counter entered;
+  Counter closed;
+  auto made = open([&](Connection&, Frame& frame) {
+    if (frame.method != "first") return;
+    entered.add();
+    closed.waitFor(1);
+  });
+  ASSERT_TRUE(made.peer.write(notification("first")));
+  ASSERT_TRUE(entered.waitFor(1));
+  ASSERT_TRUE(made.peer.write(repeated(notification("more"), 1000)));
+  made.peer.close();
+  closed.add();
+  ASSERT_TRUE(made.delegate->waitForInvalidation());
+  EXPECT_EQ(made.delegate->frameCount(), 1001U);
+}
+
+TEST_F(ConnectionTest, OutlivesAHalfCloseUntilTheRealOne) {
+  std::shared_ptr<Outbox> outbox;
+  auto made = open();
+  outbox = made.connection->outbox();
+  ASSERT_TRUE(made.peer.write(request(1, "call") + request(2, "call")));
+  made.peer.shutdownSending();
+  ASSERT_TRUE(made.delegate->waitForInterruption());
+  EXPECT_EQ(made.delegate->frameCount(), 2U);
+  // Answers made later, on other threads, still arrive.
+  std::thread([&] { EXPECT_TRUE(outbox->send(response(2, "late"))); }).join();
+  EXPECT_TRUE(outbox->send(response(1, "later")));
+  const Bytes expected = response(2, "late") + response(1, "later");
+  EXPECT_EQ(made.peer.read(expected.size()), expected);
+  onQueueOf(*made.connection, [] {});
+  EXPECT_EQ(made.delegate->invalidations(), 0);
+  made.peer.close();
+  ASSERT_TRUE(made.delegate->waitForInvalidation());
+  EXPECT_EQ(made.delegate->interruptions(), 1);
+  EXPECT_EQ(made.delegate->protocolError(), std::nullopt);
+}
+
+TEST_F(ConnectionTest, AFailedWriteAfterAHalfCloseEndsIt) {
+  auto made = open();
+  made.peer.shutdownSending();
+  ASSERT_TRUE(made.delegate->waitForInterruption());
+  made.peer.shutdownReceiving();
+  made.connection->outbox()->send(response(1, "nobody"));
+  EXPECT_TRUE(made.delegate->waitForInvalidation());
+}
+
+TEST_F(ConnectionTest, AFailedWriteOnlyStopsWriting) {
+  std::vector<bool> sent;
+  auto made = open([&](Connection& connection, Frame& frame) {
+    sent.push_back(connection.outbox()->send(response(frame.messageID, "nobody reads")));
+  });
+  made.peer.shutdownReceiving();
+  ASSERT_TRUE(made.peer.write(request(1, "a")));
+  ASSERT_TRUE(made.delegate->waitForFrames(1));
+  onQueueOf(*made.connection, [] {});
+  EXPECT_FALSE(made.connection->outbox()->send(response(1, "again")));
+  EXPECT_EQ(made.connection->outbox()->pending(), 0U);
+  ASSERT_TRUE(made.peer.write(repeated(request(2, "b"), 200)));
+  ASSERT_TRUE(made.delegate->waitForFrames(201));
+  EXPECT_EQ(made.delegate->invalidations(), 0);
+  made.peer.close();
+  ASSERT_TRUE(made.delegate->waitForInvalidation());
+  EXPECT_FALSE(sent.back());
+}
+
+TEST_F(ConnectionTest, NoticesThatThePeerWasKilled) {
+  auto made = make();
+  const Bytes call = notification("lastWords");
+  const pid_t child = ::fork();
+  if (child == 0) {
+    // Nobody else may hold this end, or it would stay open.
+    const bool written = ::write(made.peer.fd(), call.data(), call.size()) == static_cast<ssize_t>(call.size());
+    if (!written) ::_exit(1);
+    for (;;) ::pause();
+  }
+  ASSERT_GT(child, 0);
+  made.peer.close();
+  made.connection->resume(made.delegate);
+  ASSERT_TRUE(made.delegate->waitForFrames(1));
+  EXPECT_EQ(made.delegate->invalidations(), 0);
+  ::kill(child, SIGKILL);
+  ::waitpid(child, nullptr, 0);
+  EXPECT_TRUE(made.delegate->waitForInvalidation());
+}
+
+TEST_F(ConnectionTest, GathersTheAnswersOfATurnUntilItBlocks) {
+  Counter checked;
+  bool gathered = false;
+  bool written = false;
+  Peer* peer = nullptr;
+  auto made = make();
+  peer = &made.peer;
+  made.delegate->onFrame = [&, outbox = std::weak_ptr(made.connection->outbox())](Frame& frame) {
+    if (const auto strong = outbox.lock()) strong->send(response(frame.messageID, "x"));
+    if (frame.messageID != 2) return;
+    gathered = !peer->hasBytes();
+    const BlockingScope scope;
+    written = peer->hasBytes();
+    checked.add();
+  };
+  ASSERT_TRUE(made.peer.write(request(1, "a") + request(2, "b") + request(3, "c")));
+  made.connection->resume(made.delegate);
+  ASSERT_TRUE(checked.waitFor(1));
+  const Bytes expected = response(1, "x") + response(2, "x") + response(3, "x");
+  EXPECT_EQ(made.peer.read(expected.size()), expected);
+  EXPECT_TRUE(gathered);
+  EXPECT_TRUE(written);
+  _pool->stop();
+}
+
+TEST_F(ConnectionTest, ABusyConnectionLetsOthersHaveTheirTurn) {
+  startPool(1);
+  std::vector<std::string> order;  // one thread
+  auto other = open([&](Connection&, Frame& frame) { order.push_back(frame.method); });
+  auto busy = make();
+  busy.delegate->onFrame = [&](Frame& frame) {
+    if (order.empty()) {
+      EXPECT_TRUE(other.peer.write(notification("other")));
+    }
+    order.push_back(frame.method);
+  };
+  ASSERT_TRUE(busy.peer.write(repeated(notification("busy"), 1000)));
+  busy.connection->resume(busy.delegate);
+  ASSERT_TRUE(busy.delegate->waitForFrames(1000));
+  ASSERT_TRUE(other.delegate->waitForFrames(1));
+  _pool->stop();
+  const auto turn = std::find(order.begin(), order.end(), "other") - order.begin();
+  EXPECT_LE(turn, 4 * Connection::kFramesPerTurn);
+}
+
+TEST_F(ConnectionTest, CancelFromSeveralThreadsEndsItOnce) {
+  auto made = open();
+  ASSERT_TRUE(made.peer.write(notification("call")));
+  std::vector<std::thread> threads;
+  for (int i = 0; i < 4; ++i) threads.emplace_back([&] { made.connection->cancel(); });
+  for (auto& thread : threads) thread.join();
+  ASSERT_TRUE(made.delegate->waitForInvalidation());
+  EXPECT_TRUE(made.peer.atEnd());
+  onQueueOf(*made.connection, [] {});
+  EXPECT_EQ(made.delegate->invalidations(), 1);
+  EXPECT_EQ(made.delegate->protocolError(), std::nullopt);
+}
+
+TEST_F(ConnectionTest, CancelBeforeResumeInvalidatesOnResume) {
+  auto made = make();
+  made.connection->cancel(1s);
+  EXPECT_TRUE(made.peer.atEnd());
+  made.connection->resume(made.delegate);
+  EXPECT_TRUE(made.delegate->waitForInvalidation());
+}
+
+TEST_F(ConnectionTest, ClosesTheSocketWhenDroppedUnresumed) {
+  auto made = make();
+  made.connection.reset();
+  EXPECT_TRUE(made.peer.atEnd());
+}
+
+TEST_F(ConnectionTest, WhatIsSentOnInvalidationStillReachesAPeerThatListens) {
+  auto made = make();
+  made.delegate->onInvalidated = [outbox = made.connection->outbox()] {
+    EXPECT_TRUE(outbox->send(notification("farewell")));
+  };
+  made.connection->resume(made.delegate);
+  made.connection->cancel();
+  EXPECT_EQ(made.peer.readToEnd(), notification("farewell"));
+}
+
+TEST_F(ConnectionTest, ShutdownSendingLetsThePeerReadOutAndSendOn) {
+  auto made = open();
+  const Bytes reply = response(1, Value(std::string(3U << 20U, 'r')));
+  EXPECT_TRUE(made.connection->outbox()->send(reply));
+  made.connection->shutdownSending();
+  EXPECT_FALSE(made.connection->outbox()->send(response(2, "too late")));
+  EXPECT_EQ(made.peer.readToEnd(), reply);
+  ASSERT_TRUE(made.peer.write(notification("still heard")));
+  EXPECT_TRUE(made.delegate->waitForFrames(1));
+  // Now both directions are shut.
+  made.peer.shutdownSending();
+  EXPECT_TRUE(made.delegate->waitForInvalidation());
+}
+
+TEST_F(ConnectionTest, LetsGoOfItsDelegateAndDescriptors) {
+  const std::size_t before = openDescriptors();
+  {
+    auto made = open();
+    ASSERT_TRUE(made.peer.write(notification("call")));
+    ASSERT_TRUE(made.delegate->waitForFrames(1));
+    const std::weak_ptr<Connection> connection = made.connection;
+    made.connection.reset();
+    EXPECT_FALSE(connection.expired()) << "it lives as long as its peer";
+    made.peer.close();
+    ASSERT_TRUE(made.delegate->waitForInvalidation());
+    EXPECT_TRUE(eventually([&] { return connection.expired() && made.delegate.use_count() == 1; }));
+  }
+  EXPECT_EQ(openDescriptors(), before);
+}
+
+TEST_F(ConnectionTest, GoesWithItsPool) {
+  const std::size_t before = openDescriptors();
+  std::weak_ptr<RecordingDelegate> idle;
+  std::weak_ptr<RecordingDelegate> stuck;
+  {
+    startPool(2);
+    auto first = open();
+    // The second waits for its peer to read.
+    auto second = open([](Connection& connection, Frame&) {
+      connection.outbox()->send(response(1, Value(std::string(2U << 20U, 'r'))));
+    });
+    ASSERT_TRUE(second.peer.write(repeated(request(1, "call"), 3)));
+    ASSERT_TRUE(second.delegate->waitForFrames(1));
+    onQueueOf(*second.connection, [] {});
+    idle = first.delegate;
+    stuck = second.delegate;
+    first.connection.reset();
+    second.connection.reset();
+    _pool->stop();
+    first.delegate.reset();
+    second.delegate.reset();
+    _pool.reset();
+  }
+  EXPECT_TRUE(idle.expired());
+  EXPECT_TRUE(stuck.expired());
+  EXPECT_LE(openDescriptors(), before);
+}
+
+}  // namespace
+}  // namespace orvanta::test

@@ -1,0 +1,296 @@
+#include "platform/DeviceProperties.h"
+
+#include <gtest/gtest.h>
+#include <sched.h>
+#include <sys/mount.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <cstdlib>
+#include <filesystem>
+#include <limits>
+#include <thread>
+
+#include "platform/SystemFacts.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace platform {
+namespace {
+
+using orvanta::test::LogCapture;
+using orvanta::test::TemporaryDirectory;
+using Text = std::optional<std::string>;
+
+const std::string kMachineId = "0123456789abcdef0123456789abcdef\n";
+
+std::string plist(const std::string& entries) {
+  return "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\"><dict>" + entries + "</dict></plist>\n";
+}
+
+TEST(SystemFacts, OsRelease) {
+  const std::string content =
+      "# a comment\nNAME=\"A System\"\nVERSION_ID=\"12\"\n BUILD_ID=rolling \nQUOTED='a b'\nESCAPED=\"x\\\"y\"\n"
+      "EMPTY=\"\"\nTWICE=1\nTWICE=2\nXVERSION_ID=9\nLAST=end";
+  const struct {
+    const char* key;
+    Text expected;
+  } rows[] = {{"VERSION_ID", "12"}, {"BUILD_ID", "rolling"}, {"QUOTED", "a b"}, {"ESCAPED", "x\"y"},
+              {"EMPTY", {}},        {"TWICE", "2"},          {"LAST", "end"},   {"NAME", "A System"},
+              {"VERSION", {}},      {"# a comment", {}},     {"RSION_ID", {}}};
+  for (const auto& row : rows) EXPECT_EQ(osReleaseValue(content, row.key), row.expected) << row.key;
+}
+
+TEST(SystemFacts, CountryOfALocale) {
+  const struct {
+    const char* locale;
+    Text expected;
+  } rows[] = {{"de_DE.UTF-8", "DE"},
+              {"de_AT@euro", "AT"},
+              {"en_us", "US"},
+              {"sr_RS.UTF-8@latin", "RS"},
+              {"C", {}},
+              {"C.UTF-8", {}},
+              {"", {}},
+              {"de", {}},
+              {"es_419", {}},
+              {"_", {}},
+              {"de_D1.UTF-8", {}},
+              {"de_DEU", {}}};
+  for (const auto& row : rows) EXPECT_EQ(countryOfLocale(row.locale), row.expected) << row.locale;
+}
+
+TEST(SystemFacts, FirmwareTexts) {
+  const struct {
+    std::string content;
+    Text expected;
+  } rows[] = {{"Board X1\n", "Board X1"},    {std::string("maker,board\0maker,soc\0", 22), "maker,board"},
+              {" padded  \n", "padded"},     {"To Be Filled By O.E.M.\n", {}},
+              {"System Product Name\n", {}}, {"\n", {}},
+              {std::string(1, '\0'), {}},    {"", {}}};
+  for (const auto& row : rows) EXPECT_EQ(firmwareText(row.content), row.expected) << row.content;
+}
+
+TEST(SystemFacts, DerivedIdentifiers) {
+  const Text first = deriveDeviceIdentifier(kMachineId, "app.one");
+  ASSERT_TRUE(first);
+  EXPECT_EQ(first->size(), 40U);
+  EXPECT_EQ(first->find_first_not_of("0123456789abcdef"), std::string::npos);
+  EXPECT_EQ(first, deriveDeviceIdentifier("0123456789abcdef0123456789abcdef", "app.one")) << "the line end is no part";
+  EXPECT_NE(first, deriveDeviceIdentifier(kMachineId, "app.two"));
+  EXPECT_NE(first, deriveDeviceIdentifier("1123456789abcdef0123456789abcdef", "app.one"));
+  EXPECT_EQ(first->find("0123456789abcdef"), std::string::npos);
+  for (const char* none : {"", "\n", "uninitialized\n", "00000000000000000000000000000000\n", "0123", "zz"}) {
+    EXPECT_EQ(deriveDeviceIdentifier(none, "app.one"), std::nullopt) << none;
+  }
+}
+
+class DevicePropertiesTest : public testing::Test {
+ protected:
+  LinuxDeviceProperties make() const { return {_configuration.path(), "app.test", _root.path()}; }
+  void configure(const std::string& content) const {
+    _configuration.write("new", content);
+    std::filesystem::rename(_configuration / "new", _configuration / "device.plist");
+  }
+  TemporaryDirectory _configuration;
+  TemporaryDirectory _root;
+  LogCapture _log;
+};
+
+TEST_F(DevicePropertiesTest, NothingIsKnownOfABareSystem) {
+  const auto device = make();
+  EXPECT_EQ(device.uniqueDeviceID(), std::nullopt);
+  EXPECT_EQ(device.productVersion(), std::nullopt);
+  EXPECT_EQ(device.buildVersion(), std::nullopt);
+  EXPECT_EQ(device.hardwareModel(), std::nullopt);
+  EXPECT_EQ(device.serialNumber(), std::nullopt);
+  EXPECT_EQ(device.productType(), std::nullopt);
+  EXPECT_EQ(device.deviceName(), std::nullopt);
+  EXPECT_EQ(device.releaseType(), std::nullopt);
+  EXPECT_EQ(device.automaticTimeZone(), std::nullopt);
+  EXPECT_FALSE(device.diagnosticsSubmissionAllowed());
+  EXPECT_TRUE(_log.lines().empty());
+}
+
+TEST_F(DevicePropertiesTest, SystemFilesStandInForWhatIsNotConfigured) {
+  _root.write("usr/lib/os-release", "VERSION_ID=11\nIMAGE_VERSION=7\n");
+  _root.write("etc/machine-id", kMachineId);
+  _root.write("proc/device-tree/model", std::string("Maker Board Rev 2\0", 18));
+  _root.write("proc/device-tree/compatible", std::string("maker,board\0maker,soc\0", 22));
+  _root.write("proc/device-tree/serial-number", std::string("SN77\0", 5));
+  const auto device = make();
+  EXPECT_EQ(device.uniqueDeviceID(), deriveDeviceIdentifier(kMachineId, "app.test"));
+  EXPECT_EQ(device.productVersion(), "11");
+  EXPECT_EQ(device.buildVersion(), "7");
+  EXPECT_EQ(device.hardwareModel(), "Maker Board Rev 2");
+  EXPECT_EQ(device.productType(), "maker,board");
+  EXPECT_EQ(device.serialNumber(), "SN77");
+  EXPECT_EQ(device.deviceName(), std::nullopt);
+  _root.write("etc/os-release", "VERSION_ID=12\nBUILD_ID=b9\n");
+  _root.write("sys/class/dmi/id/product_name", "Machine 9\n");
+  _root.write("sys/class/dmi/id/product_serial", "Default string\n");
+  _root.write("sys/class/dmi/id/product_family", "Machines\n");
+  EXPECT_EQ(device.productVersion(), "12");
+  EXPECT_EQ(device.buildVersion(), "b9");
+  EXPECT_EQ(device.hardwareModel(), "Machine 9");
+  EXPECT_EQ(device.productType(), "Machine 9");
+  EXPECT_EQ(device.serialNumber(), "SN77") << "a filler is no answer";
+  EXPECT_EQ(device.deviceName(), "Machines");
+}
+
+TEST_F(DevicePropertiesTest, ConfiguredFactsComeFirstAndAreReadAgain) {
+  _root.write("etc/os-release", "VERSION_ID=12\n");
+  _root.write("etc/machine-id", kMachineId);
+  const auto device = make();
+  configure(
+      plist("<key>UniqueDeviceID</key><string>given</string><key>ProductVersion</key><string>9.1</string>"
+            "<key>BuildVersion</key><string>9A1</string><key>HardwareModel</key><string>M</string>"
+            "<key>SerialNumber</key><string>S</string><key>ProductType</key><string>T</string>"
+            "<key>DeviceName</key><string>N</string><key>ReleaseType</key><string>Internal</string>"
+            "<key>CountryCode</key><string>FR</string><key>AutomaticTimeZone</key><false/>"
+            "<key>DiagnosticsSubmissionAllowed</key><true/>"));
+  EXPECT_EQ(device.uniqueDeviceID(), "given");
+  EXPECT_EQ(device.productVersion(), "9.1");
+  EXPECT_EQ(device.buildVersion(), "9A1");
+  EXPECT_EQ(device.hardwareModel(), "M");
+  EXPECT_EQ(device.serialNumber(), "S");
+  EXPECT_EQ(device.productType(), "T");
+  EXPECT_EQ(device.deviceName(), "N");
+  EXPECT_EQ(device.releaseType(), "Internal");
+  EXPECT_EQ(device.countryCode(), "FR");
+  EXPECT_EQ(device.automaticTimeZone(), false);
+  EXPECT_TRUE(device.diagnosticsSubmissionAllowed());
+  configure(plist("<key>DiagnosticsSubmissionAllowed</key><false/>"));
+  EXPECT_FALSE(device.diagnosticsSubmissionAllowed());
+  EXPECT_EQ(device.productVersion(), "12");
+  EXPECT_TRUE(_log.lines().empty());
+}
+
+TEST_F(DevicePropertiesTest, ConsentNeedsAnHonestTrue) {
+  const auto device = make();
+  const struct {
+    const char* content;
+    bool expected;
+  } rows[] = {{"<true/>", true},
+              {"<false/>", false},
+              {"<string>YES</string>", false},
+              {"<integer>1</integer>", false},
+              {"<array/>", false}};
+  for (const auto& row : rows) {
+    configure(plist(std::string("<key>DiagnosticsSubmissionAllowed</key>") + row.content));
+    EXPECT_EQ(device.diagnosticsSubmissionAllowed(), row.expected) << row.content;
+  }
+  configure("<plist version=\"1.0\"><dict><key>DiagnosticsSubmissionAllowed</key><true/>");
+  EXPECT_FALSE(device.diagnosticsSubmissionAllowed());
+}
+
+TEST_F(DevicePropertiesTest, SaysWhatItDoesNotUnderstand) {
+  const auto device = make();
+  configure(plist("<key>ProductVersoin</key><string>1</string><key>SerialNumber</key><integer>7</integer>"));
+  EXPECT_EQ(device.serialNumber(), std::nullopt);
+  EXPECT_EQ(_log.count("<4>DeviceProperties: unknown key ProductVersoin in " + (_configuration / "device.plist")), 1U);
+  EXPECT_EQ(_log.count("<4>DeviceProperties: SerialNumber is not a string"), 1U);
+  configure("garbage");
+  EXPECT_EQ(device.serialNumber(), std::nullopt);
+  EXPECT_EQ(device.serialNumber(), std::nullopt);
+  EXPECT_EQ(_log.count("<3>DeviceProperties: " + (_configuration / "device.plist") + " counts as empty"), 1U);
+  std::filesystem::remove(_configuration / "device.plist");
+  std::filesystem::create_directory(_configuration / "device.plist");
+  EXPECT_EQ(device.serialNumber(), std::nullopt);
+  EXPECT_EQ(device.serialNumber(), std::nullopt);
+  EXPECT_EQ(_log.count("not a regular file"), 1U);
+}
+
+TEST_F(DevicePropertiesTest, IdentifiersAreCutAtFortyBytesBetweenCharacters) {
+  const auto device = make();
+  configure(plist("<key>UniqueDeviceID</key><string>" + std::string(50, 'a') + "</string>"));
+  EXPECT_EQ(device.uniqueDeviceID(), std::string(40, 'a'));
+  configure(plist("<key>UniqueDeviceID</key><string>" + std::string(39, 'a') + "\xc3\xa4" + "</string>"));
+  EXPECT_EQ(device.uniqueDeviceID(), std::string(39, 'a'));
+}
+
+// Environment and system files belong to the whole process, so these run in a child.
+template <class Body>
+void inChild(Body body) {
+  const pid_t child = ::fork();
+  if (child == 0) ::_exit(body());
+  int status = 0;
+  ASSERT_EQ(::waitpid(child, &status, 0), child);
+  ASSERT_TRUE(WIFEXITED(status));
+  if (WEXITSTATUS(status) == 77) GTEST_SKIP() << "no mount namespaces here";
+  EXPECT_EQ(WEXITSTATUS(status), 0) << "the number of the check that failed";
+}
+
+TEST_F(DevicePropertiesTest, CountryFollowsTheLocaleVariables) {
+  inChild([&] {
+    for (const char* name : {"LC_ALL", "LC_ADDRESS", "LC_MONETARY", "LANG"}) ::unsetenv(name);
+    if (make().countryCode()) return 1;
+    ::setenv("LANG", "de_DE.UTF-8", 1);
+    if (make().countryCode() != "DE") return 2;
+    ::setenv("LC_MONETARY", "fr_FR.UTF-8", 1);
+    if (make().countryCode() != "FR") return 3;
+    ::setenv("LC_ALL", "", 1);
+    if (make().countryCode() != "FR") return 4;
+    ::setenv("LC_ALL", "C", 1);
+    return make().countryCode() ? 5 : 0;
+  });
+}
+
+TEST_F(DevicePropertiesTest, TimeZoneOffsetsOfAMoment) {
+  inChild([&] {
+    ::setenv("TZ", "CET-1CEST,M3.5.0,M10.5.0/3", 1);
+    const auto device = make();
+    if (device.timeZoneOffset(1'700'000'000) != 3600) return 1;  // November
+    if (device.timeZoneOffset(1'690'000'000) != 7200) return 2;  // July
+    if (device.timeZoneOffset(-0.5) != 3600) return 3;
+    if (device.timeZoneOffset(std::numeric_limits<double>::quiet_NaN()) != 0) return 4;
+    if (device.timeZoneOffset(std::numeric_limits<double>::infinity()) != 0) return 5;
+    if (device.timeZoneOffset(-1e300) != 0) return 6;
+    ::setenv("TZ", "XXX+3:30", 1);
+    return device.timeZoneOffset(1'700'000'000) == -12600 ? 0 : 7;
+  });
+}
+
+TEST_F(DevicePropertiesTest, TimeZoneFollowsTheSystemsFile) {
+  inChild([&] {
+    ::unsetenv("TZ");
+    // A view of the file system of our own, in which /etc/localtime may change.
+    if (::unshare(CLONE_NEWNS) != 0 || ::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0) return 77;
+    const auto device = make();
+    const auto show = [](const char* zone) {
+      return ::mount((std::string("/usr/share/zoneinfo/") + zone).c_str(), "/etc/localtime", nullptr, MS_BIND,
+                     nullptr) == 0;
+    };
+    if (!show("Asia/Tokyo")) return 77;
+    if (device.timeZoneOffset(1'700'000'000) != 9 * 3600) return 1;
+    if (!show("Asia/Kolkata")) return 2;
+    return device.timeZoneOffset(1'700'000'000) == 19800 ? 0 : 3;
+  });
+}
+
+TEST_F(DevicePropertiesTest, SeveralThreadsAsk) {
+  configure(plist("<key>SerialNumber</key><string>S</string>"));
+  const auto device = make();
+  std::atomic<bool> done{false};
+  std::vector<std::thread> threads;
+  std::atomic<int> wrong{0};
+  for (int i = 0; i < 3; ++i) {
+    threads.emplace_back([&] {
+      while (!done) {
+        const Text serial = device.serialNumber();
+        wrong += serial != "S" && serial != "T";
+        device.timeZoneOffset(1'700'000'000);
+      }
+    });
+  }
+  for (int i = 0; i < 50; ++i) {
+    configure(plist(std::string("<key>SerialNumber</key><string>") + (i % 2 ? "S" : "T") + "</string>"));
+  }
+  done = true;
+  for (auto& thread : threads) thread.join();
+  EXPECT_EQ(wrong, 0);
+}
+
+}  // namespace
+}  // namespace platform

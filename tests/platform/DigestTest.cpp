@@ -1,0 +1,263 @@
+#include "platform/Digest.h"
+
+#include <gtest/gtest.h>
+#include <openssl/evp.h>
+#include <openssl/rsa.h>
+#include <openssl/x509.h>
+
+#include <algorithm>
+#include <atomic>
+#include <set>
+#include <thread>
+#include <vector>
+
+namespace platform {
+namespace {
+
+using Bytes = std::vector<std::uint8_t>;
+
+Bytes bytesOf(std::string_view text) {
+  return {text.begin(), text.end()};
+}
+Bytes fromHex(std::string_view hex) {
+  Bytes bytes;
+  for (std::size_t i = 0; i + 1 < hex.size(); i += 2) {
+    bytes.push_back(static_cast<std::uint8_t>(std::stoi(std::string(hex.substr(i, 2)), nullptr, 16)));
+  }
+  return bytes;
+}
+Bytes joined(std::initializer_list<Bytes> parts) {
+  Bytes all;
+  for (const Bytes& part : parts) all.insert(all.end(), part.begin(), part.end());
+  return all;
+}
+
+TEST(Digest, KnownAnswers) {
+  const struct {
+    std::string text, sha1, sha256;
+  } rows[] = {
+      {"", "da39a3ee5e6b4b0d3255bfef95601890afd80709",
+       "e3b0c44298fc1c149afbf4c8996fb92427ae41e4649b934ca495991b7852b855"},
+      {"abc", "a9993e364706816aba3e25717850c26c9cd0d89d",
+       "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad"},
+      {"abcdbcdecdefdefgefghfghighijhijkijkljklmklmnlmnomnopnopq", "84983e441c3bd26ebaae4aa1f95129e5e54670f1",
+       "248d6a61d20638b8e5c026930c3e6039a33ce45964ff2167f6ecedd419db06c1"},
+  };
+  for (const auto& row : rows) {
+    EXPECT_EQ(hexDigits(sha1(bytesOf(row.text))), row.sha1) << row.text;
+    EXPECT_EQ(hexDigits(sha256(bytesOf(row.text))), row.sha256) << row.text;
+  }
+}
+
+TEST(Digest, ThreadsDoNotDisturbEachOther) {
+  const auto expected = sha256(bytesOf("x"));
+  std::vector<std::thread> threads;
+  std::atomic<int> wrong{0};
+  for (int i = 0; i < 4; ++i) {
+    threads.emplace_back([&] {
+      for (int n = 0; n < 500; ++n) wrong += sha256(bytesOf("x")) != expected || sha1(bytesOf("y")) == sha1({});
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  EXPECT_EQ(wrong, 0);
+}
+
+TEST(Digest, UuidsAreVersionFourAndDiffer) {
+  std::set<std::string> seen;
+  for (int i = 0; i < 100; ++i) {
+    const auto uuid = randomUuid();
+    const std::string text = uuidText(uuid);
+    ASSERT_EQ(text.size(), 36U);
+    EXPECT_EQ(text[14], '4') << text;
+    EXPECT_NE(std::string("89AB").find(text[19]), std::string::npos) << text;
+    EXPECT_EQ(text.find_first_not_of("0123456789ABCDEF-"), std::string::npos) << text;
+    seen.insert(text);
+  }
+  EXPECT_EQ(seen.size(), 100U);
+  EXPECT_EQ(uuidText({0x01, 0x23, 0x45, 0x67, 0x89, 0xab, 0xcd, 0xef, 0, 1, 2, 3, 4, 5, 6, 7}),
+            "01234567-89AB-CDEF-0001-020304050607");
+}
+
+// An RSA key pair that signs any block, malformed ones too.
+class KeyPair {
+ public:
+  explicit KeyPair(unsigned bits = 1024) : _key(EVP_RSA_gen(bits)) {}
+  ~KeyPair() { EVP_PKEY_free(_key); }
+  KeyPair(const KeyPair&) = delete;
+  KeyPair& operator=(const KeyPair&) = delete;
+
+  Bytes subjectPublicKeyInfo() const { return encoded(i2d_PUBKEY); }
+  Bytes pkcs1() const { return encoded(i2d_PublicKey); }
+  std::size_t size() const { return static_cast<std::size_t>(EVP_PKEY_get_size(_key)); }
+
+  // The private operation on a whole block of the key's size.
+  Bytes signBlock(const Bytes& block) const {
+    EVP_PKEY_CTX* context = EVP_PKEY_CTX_new(_key, nullptr);
+    Bytes signature(size());
+    std::size_t length = signature.size();
+    EXPECT_EQ(block.size(), size());
+    EXPECT_EQ(EVP_PKEY_sign_init(context), 1);
+    EXPECT_EQ(EVP_PKEY_CTX_set_rsa_padding(context, RSA_NO_PADDING), 1);
+    EXPECT_EQ(EVP_PKEY_sign(context, signature.data(), &length, block.data(), block.size()), 1);
+    EVP_PKEY_CTX_free(context);
+    return signature;
+  }
+
+ private:
+  template <class Encoder>
+  Bytes encoded(Encoder encode) const {
+    unsigned char* der = nullptr;
+    const int length = encode(_key, &der);
+    Bytes bytes(der, der + length);
+    OPENSSL_free(der);
+    return bytes;
+  }
+
+  EVP_PKEY* _key;
+};
+
+const Bytes kDigestInfo = fromHex("3021300906052b0e03021a05000414");
+
+class RsaTest : public testing::Test {
+ protected:
+  static const KeyPair& pair() {
+    static const KeyPair* const pair = new KeyPair();
+    return *pair;
+  }
+  // 00 TYPE FF... 00 TAIL, filled up to the key's size.
+  static Bytes block(const Bytes& tail, std::uint8_t type = 1) {
+    Bytes all{0, type};
+    all.resize(pair().size() - tail.size() - 1, 0xff);
+    return joined({all, Bytes{0}, tail});
+  }
+  static Bytes keyWithExponentOne() {
+    Bytes der = pair().pkcs1();  // 30 81 LENGTH ... and at the end INTEGER 65537: 02 03 01 00 01
+    der.resize(der.size() - 5);
+    der.insert(der.end(), {0x02, 0x01, 0x01});
+    der[2] = static_cast<std::uint8_t>(der[2] - 2);
+    return der;
+  }
+  static Bytes digestBytes() {
+    const auto digest = sha1(bytesOf("signed text"));
+    return {digest.begin(), digest.end()};
+  }
+  const std::unique_ptr<RsaPublicKey> _key = RsaPublicKey::fromDer(pair().subjectPublicKeyInfo());
+};
+
+TEST_F(RsaTest, AcceptsBothKeyFormsAndTheRightSignature) {
+  const Bytes digest = digestBytes();
+  const Bytes signature = pair().signBlock(block(joined({kDigestInfo, digest})));
+  for (const Bytes& der : {pair().subjectPublicKeyInfo(), pair().pkcs1()}) {
+    const auto key = RsaPublicKey::fromDer(der);
+    ASSERT_NE(key, nullptr);
+    EXPECT_TRUE(key->verifySha1(digest, signature));
+  }
+}
+
+TEST_F(RsaTest, RefusesForgedPaddingAndForeignDigests) {
+  ASSERT_NE(_key, nullptr);
+  const Bytes digest = digestBytes();
+  const Bytes good = joined({kDigestInfo, digest});
+  const std::size_t size = pair().size();
+  Bytes changedDigest = digest;
+  changedDigest[7] ^= 1U;
+  Bytes zeroPadding(size, 0);
+  zeroPadding[1] = 1;
+  std::copy(good.begin(), good.end(), zeroPadding.end() - static_cast<std::ptrdiff_t>(good.size()));
+  // What a verifier that stops reading behind the digest takes: few padding bytes, the digest, then free space.
+  Bytes garbageBehind = joined({fromHex("0001ffffffffffffffff00"), good});
+  garbageBehind.resize(size, 0x5a);
+  const struct {
+    const char* what;
+    Bytes block;
+  } rows[] = {
+      {"garbage behind the digest", garbageBehind},
+      {"one byte behind the digest", block(joined({good, Bytes{0}}))},
+      {"seven bytes of padding", joined({fromHex("0001ffffffffffffff00"), Bytes(size - 10 - good.size(), 0), good})},
+      {"padding of zeros", zeroPadding},
+      {"block type 2", block(good, 2)},
+      {"block type 0", block(good, 0)},
+      {"no NULL parameter", block(joined({fromHex("301f300706052b0e03021a0414"), digest}))},
+      {"SHA-256's identifier", block(joined({fromHex("302130"
+                                                     "0d"
+                                                     "06"
+                                                     "09"
+                                                     "608648016503040201"
+                                                     "0500"
+                                                     "0414"),
+                                             digest}))},
+      {"the bare digest", block(digest)},
+      {"another digest", block(joined({kDigestInfo, changedDigest}))},
+      {"all zeros", Bytes(size, 0)},
+  };
+  for (const auto& row : rows) EXPECT_FALSE(_key->verifySha1(digest, pair().signBlock(row.block))) << row.what;
+}
+
+TEST_F(RsaTest, RefusesSignaturesThatAreNone) {
+  ASSERT_NE(_key, nullptr);
+  const Bytes digest = digestBytes();
+  const Bytes signature = pair().signBlock(block(joined({kDigestInfo, digest})));
+  Bytes flipped = signature;
+  flipped.back() ^= 1U;
+  const Bytes shorter(signature.begin(), signature.end() - 1);
+  const Bytes extended = joined({Bytes{0}, signature});
+  for (const Bytes& bad : {Bytes{}, flipped, shorter, extended, Bytes(pair().size(), 0xff), Bytes(5000, 1)}) {
+    EXPECT_FALSE(_key->verifySha1(digest, bad)) << bad.size();
+  }
+  EXPECT_FALSE(_key->verifySha1({}, signature));
+  EXPECT_FALSE(_key->verifySha1(sha256(bytesOf("signed text")), signature));
+  EXPECT_FALSE(RsaPublicKey::fromDer(KeyPair(1024).pkcs1())->verifySha1(digest, signature)) << "another key";
+}
+
+// A signature number below 256^(size-1) may be written with fewer bytes by a sloppy signer; only the full length
+// counts.
+TEST_F(RsaTest, RefusesASignatureWithoutItsLeadingZero) {
+  for (int i = 0; i < 20000; ++i) {
+    const auto digest = sha1(bytesOf(std::to_string(i)));
+    const Bytes signature = pair().signBlock(block(joined({kDigestInfo, Bytes(digest.begin(), digest.end())})));
+    if (signature[0] != 0) continue;
+    EXPECT_TRUE(_key->verifySha1(digest, signature));
+    EXPECT_FALSE(_key->verifySha1(digest, Bytes(signature.begin() + 1, signature.end())));
+    return;
+  }
+  FAIL() << "no signature began with a zero";
+}
+
+TEST_F(RsaTest, RefusesWhatIsNoUsableKey) {
+  const Bytes good = pair().subjectPublicKeyInfo();
+  EVP_PKEY* elliptic = EVP_EC_gen("P-256");
+  unsigned char* der = nullptr;
+  const int length = i2d_PUBKEY(elliptic, &der);
+  const Bytes ellipticDer(der, der + length);
+  OPENSSL_free(der);
+  EVP_PKEY_free(elliptic);
+  const struct {
+    const char* what;
+    Bytes der;
+  } rows[] = {
+      {"nothing", {}},
+      {"text", bytesOf("-----BEGIN PUBLIC KEY-----\n")},
+      {"cut off", Bytes(good.begin(), good.end() - 1)},
+      {"bytes behind it", joined({good, Bytes{0}})},
+      {"an elliptic-curve key", ellipticDer},
+      {"an exponent that lets anybody sign", keyWithExponentOne()},
+  };
+  for (const auto& row : rows) EXPECT_EQ(RsaPublicKey::fromDer(row.der), nullptr) << row.what;
+}
+
+TEST_F(RsaTest, SeveralThreadsVerifyWithOneKey) {
+  const Bytes digest = digestBytes();
+  const Bytes signature = pair().signBlock(block(joined({kDigestInfo, digest})));
+  std::atomic<int> good{0};
+  std::vector<std::thread> threads;
+  for (int i = 0; i < 4; ++i) {
+    threads.emplace_back([&] {
+      for (int n = 0; n < 50; ++n) good += _key->verifySha1(digest, signature);
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  EXPECT_EQ(good, 200);
+}
+
+}  // namespace
+}  // namespace platform

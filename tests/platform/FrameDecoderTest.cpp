@@ -1,0 +1,260 @@
+#include "platform/FrameDecoder.h"
+
+#include <gtest/gtest.h>
+
+#include <limits>
+
+#include "platform/Connection.h"
+#include "tests/platform/RandomValue.h"
+#include "tests/support/Bytes.h"
+
+namespace platform {
+namespace {
+
+using Bytes = std::vector<std::uint8_t>;
+using orvanta::test::fromHex;
+
+std::string describe(const Frame& frame) {
+  std::string text;
+  switch (frame.kind) {
+    case Frame::Kind::request:
+      text = "request " + std::to_string(frame.messageID) + " " + frame.method + " ";
+      break;
+    case Frame::Kind::response:
+      text = "response " + std::to_string(frame.messageID) + " ";
+      break;
+    case Frame::Kind::notification:
+      text = "notification " + frame.method + " ";
+      break;
+  }
+  if (frame.refusal) return text + "refused: " + *frame.refusal;
+  if (frame.kind == Frame::Kind::response) return text + frame.error.description() + " " + frame.result.description();
+  return text + Value(frame.params).description();
+}
+
+// Everything that comes out when `stream` is appended in pieces that end at `cuts`: one line a frame, and the error.
+std::vector<std::string> decode(const Bytes& stream, const std::vector<std::size_t>& cuts, FrameLimits limits = {}) {
+  FrameDecoder decoder(limits);
+  std::vector<std::string> lines;
+  std::size_t begin = 0;
+  std::size_t taken = 0;
+  std::vector<std::size_t> ends = cuts;
+  ends.push_back(stream.size());
+  for (const std::size_t end : ends) {
+    decoder.append(std::span(stream).subspan(begin, end - begin));
+    begin = end;
+    for (;;) {
+      FrameDecoder::Outcome outcome = decoder.next();
+      if (const auto* error = std::get_if<FrameDecoder::ProtocolError>(&outcome)) {
+        lines.push_back("error: " + error->text);
+        return lines;
+      }
+      if (std::holds_alternative<FrameDecoder::NeedMore>(outcome)) break;
+      const Frame& frame = std::get<Frame>(outcome);
+      taken += frame.wireSize;
+      lines.push_back(describe(frame));
+    }
+    EXPECT_EQ(decoder.pending(), end - taken);
+  }
+  if (taken < stream.size()) lines.emplace_back("more");
+  return lines;
+}
+
+// The same at once and byte by byte, which take different ways through the decoder.
+std::vector<std::string> decodeBothWays(const Bytes& stream, FrameLimits limits = {}) {
+  std::vector<std::size_t> everywhere;
+  for (std::size_t i = 1; i < stream.size(); ++i) everywhere.push_back(i);
+  std::vector<std::string> atOnce = decode(stream, {}, limits);
+  EXPECT_EQ(decode(stream, everywhere, limits), atOnce);
+  return atOnce;
+}
+
+TEST(FrameDecoder, TakesTheThreeShapes) {
+  const std::pair<const char*, const char*> rows[] = {
+      {"94 00 07 a1 'f' 91 01", "request 7 f {1}"},
+      {"94 00 ce ff ff ff ff a0 90", "request 4294967295  {}"},
+      {"dd 00 00 00 04 cc 00 d0 07 d9 01 'f' dc 00 01 c0", "request 7 f {null}"},
+      {"93 02 a1 'f' 91 81 a1 'k' c3", "notification f {{k = 1}}"},
+      {"94 01 07 c0 91 a1 'x'", "response 7 null {x}"},
+      {"94 01 07 a1 'e' c0", "response 7 e null"},
+      {"94 01 07 83 a1 'a' 01 a1 'b' 02 a1 'c' 03 c0", "response 7 {a = 1, b = 2, c = 3} null"},
+  };
+  for (const auto& [hex, expected] : rows) {
+    EXPECT_EQ(decodeBothWays(fromHex(hex)), std::vector<std::string>{expected}) << hex;
+  }
+}
+
+// Refused calls keep their message id, and the stream goes on behind them.
+TEST(FrameDecoder, RefusesCallsForTheirArguments) {
+  const std::pair<const char*, const char*> rows[] = {
+      {"94 00 07 a1 'f' c0", "request 7 f refused: params that are no array at byte 5"},
+      {"94 00 07 a1 'f' 81 a1 'a' 91 01", "request 7 f refused: params that are no array at byte 5"},
+      {"94 00 07 a1 'f' 91 82 a1 'k' 01 a1 'k' 02", "request 7 f refused: a map with the key \"k\" twice at byte 6"},
+      {"94 00 07 a1 'f' 91 d4 05 00", "request 7 f refused: extension type 5 at byte 6"},
+      {"94 00 07 a1 'f' 91 ca 00 00 00 00",
+       "request 7 f refused: a float32, where numbers with a fraction are float64, at byte 6"},
+      {"94 00 07 a1 'f' 91 81 92 01 02 90", "request 7 f refused: a map key that is not text at byte 7"},
+      {"94 00 07 a1 'f' 91 a1 ff", "request 7 f refused: text that is not UTF-8 at byte 7"},
+      {"94 00 07 a1 ff 90", "request 7  refused: text that is not UTF-8 at byte 4"},
+      {"93 02 a1 'f' 92 d4 05 00 a1 ff", "notification f refused: extension type 5 at byte 5"},
+      {"94 01 07 c0 d5 ff 00 00", "response 7 refused: a timestamp of 2 bytes at byte 4"},
+  };
+  const Bytes next = fromHex("93 02 a1 'n' 90");
+  for (const auto& [hex, expected] : rows) {
+    Bytes stream = fromHex(hex);
+    stream.insert(stream.end(), next.begin(), next.end());
+    EXPECT_EQ(decodeBothWays(stream), (std::vector<std::string>{expected, "notification n {}"})) << hex;
+  }
+}
+
+TEST(FrameDecoder, EndsWithAProtocolErrorAfterTheWholeFramesBefore) {
+  const std::pair<const char*, const char*> rows[] = {
+      {"c1", "begins no MessagePack value"},
+      {"'GET / HTTP/1.1'", "no array"},
+      {"c0", "no array"},
+      {"84 00 07 a1 'f' 90", "no array"},
+      {"90", "no array of three or four"},
+      {"92 02 a1 'f'", "no array of three or four"},
+      {"dd 00 00 ff ff", "no array of three or four"},
+      {"95 00 07 a1 'f' 90 c0", "no array of three or four"},
+      {"dd ff ff ff ff", "bytes in memory"},
+      {"94 03", "message type"},
+      {"94 ff", "message type"},
+      {"94 a1 00", "message type"},
+      {"93 00 07 a1", "type 0 with 3 elements"},
+      {"93 01", "type 1 with 3 elements"},
+      {"94 02", "type 2 with 4 elements"},
+      {"94 00 ff", "message id"},
+      {"94 00 cf 00 00 00 01 00 00 00 00", "message id"},
+      {"94 00 a1 '7'", "message id"},
+      {"94 00 07 c4 01 'f'", "method name"},
+      {"93 02 07", "method name"},
+      {"94 00 07 a1 'f' 92 01 c1", "begins no MessagePack value at byte 7"},
+      {"94 00 07 a1 'f' 92 d4 05 00 c1", "begins no MessagePack value"},
+      {"94 00 07 a1 'f' dd ff ff ff ff", "bytes in memory"},
+      {"94 00 07 a1 'f' 91 db ff ff ff ff", "bytes"},
+      {"94 00 07 a1 'f' 91 c9 ff ff ff ff 05", "bytes"},
+  };
+  const Bytes before = fromHex("93 02 a1 'n' 90 93 02 a1 'm' 90");
+  for (const auto& [hex, expected] : rows) {
+    Bytes stream = before;
+    const Bytes bad = fromHex(hex);
+    stream.insert(stream.end(), bad.begin(), bad.end());
+    const std::vector<std::string> lines = decodeBothWays(stream);
+    ASSERT_EQ(lines.size(), 3U) << hex;
+    EXPECT_EQ(lines[0], "notification n {}");
+    EXPECT_EQ(lines[1], "notification m {}");
+    EXPECT_NE(lines[2].find(expected), std::string::npos) << hex << ": " << lines[2];
+  }
+}
+
+TEST(FrameDecoder, ErrorsAreFinal) {
+  FrameDecoder decoder;
+  decoder.append(fromHex("94 05"));
+  const FrameDecoder::Outcome first = decoder.next();
+  decoder.append(fromHex("93 02 a1 'n' 90"));
+  const FrameDecoder::Outcome second = decoder.next();
+  ASSERT_TRUE(std::holds_alternative<FrameDecoder::ProtocolError>(second));
+  EXPECT_EQ(std::get<FrameDecoder::ProtocolError>(first).text, std::get<FrameDecoder::ProtocolError>(second).text);
+  EXPECT_EQ(decoder.pending(), 0U);
+}
+
+Bytes nested(std::size_t depth, const char* open) {
+  Bytes bytes = fromHex("93 02 a1 'f' 91");  // two deep
+  const Bytes piece = fromHex(open);
+  for (std::size_t i = 3; i < depth; ++i) bytes.insert(bytes.end(), piece.begin(), piece.end());
+  bytes.push_back(0x80);
+  return bytes;
+}
+
+TEST(FrameDecoder, BoundsDepthCountingTheFrame) {
+  for (const char* open : {"91", "81 a0"}) {
+    EXPECT_NE(decodeBothWays(nested(64, open)).front().find("notification"), std::string::npos);
+    EXPECT_NE(decodeBothWays(nested(65, open)).front().find("deeper than 64"), std::string::npos);
+  }
+  // Too deep already, although the frame goes on.
+  Bytes open = fromHex("93 02 a1 'f'");
+  open.insert(open.end(), 64, 0x92);
+  EXPECT_NE(decodeBothWays(open).front().find("deeper than 64"), std::string::npos);
+}
+
+TEST(FrameDecoder, BoundsTheFrameOnTheWire) {
+  const FrameLimits limits{32, 1U << 20U, 64};
+  const auto frameOf = [](std::size_t size) {
+    Bytes bytes;
+    appendNotificationHeader(bytes, "f", 1);
+    MessagePackWriter(bytes).data(Bytes(size - bytes.size() - 2));
+    return bytes;
+  };
+  Bytes two = frameOf(32);
+  const Bytes second = frameOf(31);
+  two.insert(two.end(), second.begin(), second.end());
+  EXPECT_EQ(decodeBothWays(two, limits).size(), 2U);
+  EXPECT_NE(decodeBothWays(frameOf(33), limits).front().find("more than 32 bytes"), std::string::npos);
+  // A claim is enough, whether of bytes or of values.
+  for (const char* hex : {"93 02 a1 'f' c4 1b", "93 02 a1 'f' dc 00 1a", "93 02 d9 30", "93 02 a1 'f' 91 de 00 0e"}) {
+    EXPECT_NE(decodeBothWays(fromHex(hex), limits).front().find("more than 32 bytes"), std::string::npos) << hex;
+  }
+}
+
+TEST(FrameDecoder, ChargesValuesAtTheirSizeInMemory) {
+  Bytes bytes;
+  appendNotificationHeader(bytes, "f", 1);
+  MessagePackWriter(bytes).array(Array(1000));
+  EXPECT_EQ(decodeBothWays(bytes, {64U << 20U, 1000 * sizeof(Value) + 1000, 64}).front().find("error"),
+            std::string::npos);
+  EXPECT_NE(decodeBothWays(bytes, {64U << 20U, 1000 * sizeof(Value) - 1, 64}).front().find("in memory"),
+            std::string::npos);
+  // What the default limits are there for: a frame of nils as large as a frame may be.
+  bytes.clear();
+  appendNotificationHeader(bytes, "f", (64U << 20U) - 20);
+  EXPECT_NE(decode(bytes, {}).front().find("in memory"), std::string::npos);
+
+  FrameDecoder decoder;
+  bytes.clear();
+  appendNotificationHeader(bytes, "f", 1);
+  MessagePackWriter(bytes).string(std::string(5000, 'x'));
+  decoder.append(bytes);
+  const FrameDecoder::Outcome outcome = decoder.next();
+  EXPECT_GT(std::get<Frame>(outcome).charge, 5000 + sizeof(Frame) + sizeof(Value));
+  EXPECT_LT(std::get<Frame>(outcome).charge, 5500U);
+  EXPECT_EQ(std::get<Frame>(outcome).wireSize, bytes.size());
+}
+
+TEST(FrameDecoder, AllocatesNothingForMissingBytes) {
+  constexpr std::size_t kHuge = std::numeric_limits<std::size_t>::max() / 2;
+  for (const char* hex : {"93 02 a1 'f' dd ff ff ff ff", "93 02 a1 'f' 91 df ff ff ff ff", "94 01 07 dd ff ff ff ff",
+                          "93 02 db ff ff ff ff", "93 02 a1 'f' 92 dd ff ff ff ff c0"}) {
+    EXPECT_EQ(decodeBothWays(fromHex(hex), {kHuge, kHuge, 64}), std::vector<std::string>{"more"}) << hex;
+  }
+}
+
+TEST(FrameDecoder, GivesTheSameFramesHoweverTheStreamIsCut) {
+  orvanta::test::RandomValues values(3);
+  Bytes stream;
+  std::vector<std::string> expected;
+  for (std::uint32_t i = 0; i < 40; ++i) {
+    const Array params{values.next(), values.next()};
+    const std::string method = "method" + std::to_string(i);
+    if (i % 2 == 0) {
+      appendRequestHeader(stream, i, method, params.size());
+      expected.push_back("request " + std::to_string(i) + " " + method + " " + Value(params).description());
+    } else {
+      appendNotificationHeader(stream, method, params.size());
+      expected.push_back("notification " + method + " " + Value(params).description());
+    }
+    for (const Value& value : params) MessagePackWriter(stream).value(value);
+    appendErrorResponse(stream, i, "no such method");
+    expected.push_back("response " + std::to_string(i) + " no such method null");
+  }
+  EXPECT_EQ(decodeBothWays(stream), expected);
+  std::mt19937 random(4);
+  for (int round = 0; round < 50; ++round) {
+    std::vector<std::size_t> cuts;
+    for (std::size_t at = random() % 5000; at < stream.size(); at += 1 + random() % 5000) cuts.push_back(at);
+    EXPECT_EQ(decode(stream, cuts), expected);
+  }
+}
+
+}  // namespace
+}  // namespace platform

@@ -1,0 +1,251 @@
+#include <atomic>
+#include <mutex>
+#include <thread>
+
+#include "tests/platform/HttpFixture.h"
+
+namespace platform {
+namespace {
+
+using orvanta::test::RawConnection;
+using orvanta::test::RawServer;
+
+// A door that scripts wait at until the test opens it.
+class Gate {
+ public:
+  void open() { _promise.set_value(); }
+  void pass() const { _opened.wait_for(std::chrono::seconds(30)); }
+
+ private:
+  std::promise<void> _promise;
+  std::shared_future<void> _opened = _promise.get_future().share();
+};
+
+std::string pathOf(const std::string& request) {
+  const std::size_t begin = request.find(' ') + 1;
+  return request.substr(begin, request.find(' ', begin) - begin);
+}
+
+class HttpLaneTest : public HttpFixture {
+ protected:
+  // Answers everything, what begins with /held only once the gate is open.
+  RawServer::Script holding(const Gate& gate) {
+    return [&gate](RawConnection& connection) {
+      while (const auto request = connection.readRequest()) {
+        if (pathOf(*request).rfind("/held", 0) == 0) gate.pass();
+        connection.write(RawServer::response("200 OK"));
+      }
+    };
+  }
+  static std::vector<std::string> paths(const RawServer& server) {
+    std::vector<std::string> all;
+    for (const std::string& request : server.requests()) all.push_back(pathOf(request));
+    return all;
+  }
+};
+
+TEST_F(HttpLaneTest, ALaneKeepsItsOrderToTheLastCompletion) {
+  constexpr int kLanes = 4;
+  constexpr int kRequests = 100;
+  RawServer server(RawServer::answering(RawServer::response("200 OK")));
+  std::mutex mutex;
+  std::vector<std::string> completed[kLanes];
+  std::atomic<int> left{kLanes * kRequests};
+  std::promise<void> done;
+  {
+    std::vector<std::shared_ptr<HttpLane>> lanes;
+    for (int lane = 0; lane < kLanes; ++lane) lanes.push_back(client().makeLane());
+    for (int i = 0; i < kRequests; ++i) {
+      for (int lane = 0; lane < kLanes; ++lane) {
+        const std::string path = "/" + std::to_string(lane) + "/" + std::to_string(i);
+        client().start(lanes[static_cast<std::size_t>(lane)], post(server.url(path)), {}, [&, lane, path](HttpResult) {
+          const std::lock_guard lock(mutex);
+          completed[lane].push_back(path);
+          if (--left == 0) done.set_value();
+        });
+      }
+    }
+  }  // nobody holds the lanes any more
+  ASSERT_EQ(done.get_future().wait_for(std::chrono::seconds(30)), std::future_status::ready);
+  std::vector<std::string> arrived[kLanes];
+  for (const std::string& path : paths(server)) arrived[path[1] - '0'].push_back(path);
+  for (int lane = 0; lane < kLanes; ++lane) {
+    std::vector<std::string> expected;
+    for (int i = 0; i < kRequests; ++i) expected.push_back("/" + std::to_string(lane) + "/" + std::to_string(i));
+    EXPECT_EQ(arrived[lane], expected);
+    EXPECT_EQ(completed[lane], expected);
+  }
+  EXPECT_LE(server.connectionCount(), std::size_t{kLanes});
+}
+
+TEST_F(HttpLaneTest, TheNextWaitsForTheOneBeforeOtherLanesDoNot) {
+  Gate gate;
+  RawServer server(holding(gate));
+  const auto lane = client().makeLane();
+  auto first = start(lane, post(server.url("/held")));
+  auto second = start(lane, post(server.url("/second")));
+  ASSERT_TRUE(server.waitForRequests(1));
+  for (int i = 0; i < 5; ++i) EXPECT_EQ(statusOf(perform(get(server.url("/other")))), 200);
+  EXPECT_EQ(paths(server).size(), 6U) << "the second of the lane was not sent";
+  gate.open();
+  EXPECT_EQ(statusOf(await(first)), 200);
+  EXPECT_EQ(statusOf(await(second)), 200);
+  EXPECT_EQ(paths(server).back(), "/second");
+}
+
+TEST_F(HttpLaneTest, AFailureLetsTheNextGo) {
+  RawServer server([](RawConnection& connection) {
+    while (const auto request = connection.readRequest()) {
+      if (pathOf(*request) == "/broken") return connection.reset();
+      connection.write(RawServer::response("500 No"));
+    }
+  });
+  const auto lane = client().makeLane();
+  auto broken = start(lane, post(server.url("/broken")));
+  auto unsendable = start(lane, post("http://127.0.0.1:1/"));
+  auto good = start(lane, post(server.url("/good")));
+  EXPECT_FALSE(await(broken).response);
+  EXPECT_FALSE(await(unsendable).response);
+  EXPECT_EQ(statusOf(await(good)), 500);
+}
+
+TEST_F(HttpLaneTest, TheObserverComesFirstOnAThreadOfTheClient) {
+  RawServer server(RawServer::answering(RawServer::response("503 Off")));
+  for (const std::string& url : {server.url(), std::string("http://127.0.0.1:1/")}) {
+    std::atomic<bool> observed{false};
+    std::thread::id observer;
+    std::promise<std::thread::id> completer;
+    client().start(
+        client().makeLane(), post(url),
+        [&](const HttpResult& result) {
+          EXPECT_EQ(result.response.has_value(), result.error.empty());
+          observer = std::this_thread::get_id();
+          observed = true;
+        },
+        [&](HttpResult) {
+          EXPECT_TRUE(observed);
+          completer.set_value(std::this_thread::get_id());
+        });
+    auto future = completer.get_future();
+    ASSERT_EQ(future.wait_for(std::chrono::seconds(30)), std::future_status::ready);
+    EXPECT_NE(future.get(), observer);
+    EXPECT_NE(observer, std::this_thread::get_id());
+  }
+}
+
+TEST_F(HttpLaneTest, NeitherObserverNorCompletionIsNeeded) {
+  RawServer server(RawServer::answering(RawServer::response("200 OK")));
+  client().start(client().makeLane(), post(server.url()), {}, {});
+  ASSERT_TRUE(server.waitForRequests(1));
+}
+
+TEST_F(HttpLaneTest, ARefusalIsObservedAtOnceAndCompletesOnThePool) {
+  std::thread::id observer;
+  std::promise<std::string> error;
+  client().start(
+      client().makeLane(), post("ftp://127.0.0.1/"), [&](const HttpResult&) { observer = std::this_thread::get_id(); },
+      [&](HttpResult result) { error.set_value(result.error); });
+  EXPECT_EQ(observer, std::this_thread::get_id());
+  EXPECT_TRUE(has(error.get_future().get(), "neither http nor https"));
+}
+
+TEST_F(HttpLaneTest, LimitsOnWaitingBytes) {
+  HttpLimits limits;
+  limits.laneBytes = 10'000;
+  limits.totalBytes = 15'000;
+  makeClient(limits);
+  Gate gate;
+  RawServer server(holding(gate));
+  const std::string body(5'000 - 1024, 'b');  // each request is charged 5000
+  const auto lane = client().makeLane();
+  const auto other = client().makeLane();
+  const auto free = client().makeLane(HttpClient::LaneKind::unrefused);
+  std::vector<std::future<HttpResult>> accepted;
+  accepted.push_back(start(lane, post(server.url("/held"), body)));
+  accepted.push_back(start(lane, post(server.url("/held"), body)));
+  auto laneFull = start(lane, post(server.url("/refused"), ""));
+  accepted.push_back(start(other, post(server.url("/held"), body)));
+  auto allFull = start(other, post(server.url("/refused"), ""));
+  for (int i = 0; i < 5; ++i) accepted.push_back(start(free, post(server.url("/held/free"), body + body)));
+  EXPECT_EQ(await(laneFull).error, "Refused: 10000 bytes wait in this lane, 1024 more would exceed its limit of 10000");
+  EXPECT_EQ(await(allFull).error, "Refused: 15000 bytes wait in all lanes, 1024 more would exceed the limit of 15000");
+  gate.open();
+  for (auto& result : accepted) EXPECT_EQ(statusOf(await(result)), 200);
+  auto again = start(lane, post(server.url("/fits"), std::string(10'000 - 1024, 'b')));
+  EXPECT_EQ(statusOf(await(again)), 200) << "what has ended waits no more";
+  auto tooLarge = start(lane, post(server.url("/refused"), std::string(10'000 - 1023, 'b')));
+  EXPECT_TRUE(has(await(tooLarge).error, "Refused: 0 bytes wait"));
+  for (const std::string& path : paths(server)) EXPECT_NE(path, "/refused");
+}
+
+// Servers that never answer hold as many requests as may be in flight; those of unrefused lanes must get past them.
+TEST_F(HttpLaneTest, SilentServersDoNotHoldUpUnrefusedLanes) {
+  constexpr std::size_t kMaximumInFlight = 64;
+  Gate gate;
+  RawServer server(holding(gate));
+  RawServer storebags(RawServer::answering(RawServer::response("200 OK")));
+  std::vector<std::future<HttpResult>> results;
+  for (std::size_t i = 0; i < kMaximumInFlight + 10; ++i) {
+    results.push_back(start(client().makeLane(), post(server.url("/held"))));
+  }
+  ASSERT_TRUE(server.waitForRequests(kMaximumInFlight));
+  const auto lane = client().makeLane(HttpClient::LaneKind::unrefused);
+  EXPECT_EQ(statusOf(client().perform(lane, get(storebags.url()))), 200);
+  EXPECT_EQ(server.requests().size(), kMaximumInFlight);
+  gate.open();
+  for (auto& result : results) EXPECT_EQ(statusOf(await(result)), 200);
+}
+
+TEST_F(HttpLaneTest, TimeSpentWaitingInTheLaneCounts) {
+  Gate gate;
+  RawServer server(holding(gate));
+  const auto lane = client().makeLane();
+  auto first = start(lane, post(server.url("/held")));
+  auto late = start(lane, within(std::chrono::milliseconds(50), get(server.url("/late"))));
+  auto patient = start(lane, within(std::chrono::seconds(60), get(server.url("/patient"))));
+  EXPECT_EQ(await(late).error, "Timed out after 50 ms, waiting for its turn");
+  gate.open();
+  EXPECT_EQ(statusOf(await(first)), 200);
+  EXPECT_EQ(statusOf(await(patient)), 200);
+  EXPECT_EQ(paths(server), (std::vector<std::string>{"/held", "/patient"}));
+}
+
+// Both threads of the pool wait for a request whose completion chain needs the pool.
+TEST_F(HttpLaneTest, BlockedCallersLeaveThePoolAlive) {
+  Gate gate;
+  RawServer server(holding(gate));
+  std::vector<std::future<int>> results;
+  for (int i = 0; i < 4; ++i) {
+    auto promise = std::make_shared<std::promise<int>>();
+    results.push_back(promise->get_future());
+    _pool.post([&, promise] { promise->set_value(statusOf(perform(get(server.url("/held"))))); });
+  }
+  ASSERT_TRUE(server.waitForRequests(4));
+  auto opener = start(client().makeLane(), post(server.url("/free")));
+  EXPECT_EQ(statusOf(await(opener)), 200);
+  gate.open();
+  for (auto& result : results) {
+    ASSERT_EQ(result.wait_for(std::chrono::seconds(30)), std::future_status::ready);
+    EXPECT_EQ(result.get(), 200);
+  }
+}
+
+TEST_F(HttpLaneTest, CompletionsMayHandInTheNext) {
+  HttpLimits limits;
+  limits.laneBytes = 1024;  // one at a time
+  makeClient(limits);
+  RawServer server(RawServer::answering(RawServer::response("200 OK")));
+  const auto lane = client().makeLane();
+  std::promise<int> done;
+  std::function<void(int)> next = [&](int left) {
+    client().start(lane, post(server.url(), ""), {}, [&, left](HttpResult result) {
+      if (left == 0 || statusOf(result) != 200) return done.set_value(left);
+      next(left - 1);
+    });
+  };
+  next(20);
+  EXPECT_EQ(done.get_future().get(), 0);
+}
+
+}  // namespace
+}  // namespace platform

@@ -1,0 +1,163 @@
+#include <fmt/format.h>
+
+#include "tests/platform/HttpFixture.h"
+
+namespace platform {
+namespace {
+
+using orvanta::test::LogCapture;
+using orvanta::test::RawConnection;
+using orvanta::test::RawServer;
+
+class HttpMessageTest : public HttpFixture {
+ protected:
+  // What went over the wire for `request`, and the log lines about it.
+  std::string sent(HttpRequest request) {
+    const std::size_t before = _server.requests().size();
+    const HttpResult result = perform(std::move(request));
+    EXPECT_EQ(statusOf(result), 200) << result.error;
+    const auto requests = _server.requests();
+    return requests.size() == before + 1 ? requests.back() : "";
+  }
+  std::string host() const { return fmt::format("Host: 127.0.0.1:{}\r\n", _server.port()); }
+
+  RawServer _server{RawServer::answering(RawServer::response("200 OK"))};
+  LogCapture _log;
+};
+
+TEST_F(HttpMessageTest, NothingIsAddedButHost) {
+  EXPECT_EQ(sent(get(_server.url("/a?b=c"))), "GET /a?b=c HTTP/1.1\r\n" + host() + "\r\n");
+  EXPECT_EQ(sent(post(_server.url("/"), "")), "POST / HTTP/1.1\r\n" + host() + "Content-Length: 0\r\n\r\n");
+  EXPECT_EQ(sent(post(_server.url("/"), "x")), "POST / HTTP/1.1\r\n" + host() + "Content-Length: 1\r\n\r\nx");
+}
+
+TEST_F(HttpMessageTest, HeadersKeepTheirOrder) {
+  const Headers headers{{"X-ORV-Client-Name", "Mail"},  {"User-Agent", "Orvanta/8.0 (Parva3,2; 12.5)"},
+                        {"X-ORV-Sender", "7"},          {"X-ORV-Event-Map", "3 1"},
+                        {"Accept", "application/json"}, {"Content-Type", "application/json"},
+                        {"Content-Length", "4"},        {"Content-Encoding", "gzip"}};
+  std::string expected = "POST /p HTTP/1.1\r\n" + host();
+  for (const HttpHeader& header : headers) expected += header.name + ": " + header.value + "\r\n";
+  EXPECT_EQ(sent(post(_server.url("/p"), std::string("a\0b\n", 4), headers)),
+            expected + "\r\n" + std::string("a\0b\n", 4));
+}
+
+TEST_F(HttpMessageTest, WhatBecomesOfEachHeader) {
+  const struct {
+    HttpHeader header;
+    std::string expected;  // in place of the header; empty: left out, with a warning
+  } rows[] = {
+      {{"X-A", "plain"}, "X-A: plain\r\n"},
+      {{"X-A", "gr\xc3\xbc\xc3\x9f"}, "X-A: gr\xc3\xbc\xc3\x9f\r\n"},
+      {{"X-A", ""}, "X-A:\r\n"},
+      {{"X-A", "   "}, "X-A:\r\n"},
+      {{"X-A", "a;b: c, \"d\""}, "X-A: a;b: c, \"d\"\r\n"},
+      {{"Connection", "close"}, "Connection: close\r\n"},
+      {{"X-A", "a\r\nX-Evil: 1"}, ""},
+      {{"X-A", "a\nb"}, ""},
+      {{"X-A", std::string("a\0b", 3)}, ""},
+      {{"X-A", "a\tb"}, ""},
+      {{"X-A", "a\x7f"}, ""},
+      {{"", "value"}, ""},
+      {{"X A", "value"}, ""},
+      {{"X-A:", "value"}, ""},
+      {{"X-A\r\nX-Evil", "value"}, ""},
+      {{"X-\xc3\xa4", "value"}, ""},
+      {{"Transfer-Encoding", "chunked"}, ""},
+      {{"expect", "100-continue"}, ""},
+  };
+  for (const auto& row : rows) {
+    _log.clear();
+    const std::string text = sent(get(_server.url(), {{"X-First", "1"}, row.header, {"X-Last", "2"}}));
+    EXPECT_EQ(text, "GET / HTTP/1.1\r\n" + host() + "X-First: 1\r\n" + row.expected + "X-Last: 2\r\n\r\n");
+    EXPECT_EQ(_log.count("<4>HttpClient: Header "), row.expected.empty() ? 1U : 0U) << row.header.name;
+  }
+}
+
+TEST_F(HttpMessageTest, ContentLengthIsTrueWhateverTheCallerSays) {
+  const struct {
+    Headers headers;
+    std::string expected;
+  } rows[] = {
+      {{{"Content-Length", "999"}, {"X-A", "1"}}, "Content-Length: 4\r\nX-A: 1\r\n"},
+      {{{"content-length", ""}, {"X-A", "1"}, {"Content-Length", "7"}}, "content-length: 4\r\nX-A: 1\r\n"},
+      {{{"X-A", "1"}}, "X-A: 1\r\nContent-Length: 4\r\n"},
+  };
+  for (const auto& row : rows) {
+    EXPECT_EQ(sent(post(_server.url(), "body", row.headers)),
+              "POST / HTTP/1.1\r\n" + host() + row.expected + "\r\nbody");
+  }
+  EXPECT_EQ(sent(get(_server.url(), {{"Content-Length", "5"}})), "GET / HTTP/1.1\r\n" + host() + "\r\n");
+}
+
+TEST_F(HttpMessageTest, LargeBodiesGoOutWholeAndWithoutExpect) {
+  const std::string body(3U << 20U, 'b');
+  EXPECT_EQ(sent(post(_server.url(), body)),
+            "POST / HTTP/1.1\r\n" + host() + fmt::format("Content-Length: {}\r\n\r\n", body.size()) + body);
+}
+
+TEST_F(HttpMessageTest, AGivenHostStandsAtItsPlace) {
+  EXPECT_EQ(sent(get(_server.url(), {{"X-A", "1"}, {"Host", "example.org"}})),
+            "GET / HTTP/1.1\r\nHost: example.org\r\nX-A: 1\r\n\r\n");
+}
+
+// The handle and the connection are used again; nothing of one request may show in the next.
+TEST_F(HttpMessageTest, RequestsDoNotMixOnOneConnection) {
+  const auto lane = client().makeLane();
+  const auto run = [&](HttpRequest request) { EXPECT_EQ(statusOf(client().perform(lane, std::move(request))), 200); };
+  run(post(_server.url("/1"), "first", {{"X-A", "1"}, {"Content-Type", "text/plain"}}));
+  run(get(_server.url("/2")));
+  run(post(_server.url("/3"), "third"));
+  const auto requests = _server.requests();
+  ASSERT_EQ(requests.size(), 3U);
+  EXPECT_EQ(requests[1], "GET /2 HTTP/1.1\r\n" + host() + "\r\n");
+  EXPECT_EQ(requests[2], "POST /3 HTTP/1.1\r\n" + host() + "Content-Length: 5\r\n\r\nthird");
+  EXPECT_EQ(_server.connectionCount(), 1U);
+}
+
+// A server may close a kept connection at any moment; the next request then takes a new one.
+TEST_F(HttpMessageTest, AKeptConnectionThatWasClosedIsReplaced) {
+  RawServer once([](RawConnection& connection) {
+    connection.readRequest();
+    connection.write(RawServer::response("200 OK"));
+  });
+  const auto lane = client().makeLane();
+  for (int i = 0; i < 5; ++i) EXPECT_EQ(statusOf(client().perform(lane, post(once.url()))), 200);
+  EXPECT_EQ(once.requests().size(), 5U);
+}
+
+TEST_F(HttpMessageTest, RefusesWhatCannotBeSent) {
+  const struct {
+    const char* method;
+    std::string url;
+    const char* error;
+  } rows[] = {
+      {"PUT", _server.url(), "Unsupported method PUT"},
+      {"get", _server.url(), "Unsupported method get"},
+      {"GET", "", "neither http nor https"},
+      {"GET", "127.0.0.1/x", "neither http nor https"},
+      {"GET", "file:///etc/passwd", "neither http nor https"},
+      {"GET", "ftp://127.0.0.1/", "neither http nor https"},
+      {"GET", "httpx://127.0.0.1/", "neither http nor https"},
+      {"GET", _server.url("/a b"), "Malformed URL"},
+      {"GET", _server.url(std::string("/a\0b", 4)), "Malformed URL"},
+      {"GET", _server.url("/a\r\nX-Evil: 1"), "Malformed URL"},
+      {"GET", "http://", ""},
+      {"GET", "http:///path", ""},
+      {"GET", "http://127.0.0.1:99999/", ""},
+      {"GET", "http://127.0.0.1:1/", "connect"},
+      {"GET", "http://name.invalid./", ""},
+  };
+  for (const auto& row : rows) {
+    HttpRequest request = get(row.url);
+    request.method = row.method;
+    const HttpResult result = perform(std::move(request));
+    EXPECT_FALSE(result.response) << row.url;
+    EXPECT_FALSE(result.error.empty()) << row.url;
+    EXPECT_TRUE(has(result.error, row.error)) << row.url << ": " << result.error;
+  }
+  EXPECT_TRUE(_server.requests().empty());
+}
+
+}  // namespace
+}  // namespace platform

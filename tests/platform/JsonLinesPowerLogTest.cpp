@@ -1,0 +1,126 @@
+#include "platform/JsonLinesPowerLog.h"
+
+#include <gmock/gmock.h>
+
+#include <filesystem>
+#include <fstream>
+#include <set>
+#include <thread>
+#include <vector>
+
+#include "platform/Json.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/TestClock.h"
+
+namespace platform {
+namespace {
+
+using testing::ElementsAre;
+
+class JsonLinesPowerLogTest : public testing::Test {
+ protected:
+  std::vector<std::string> lines(const std::string& name = "powerlog.jsonl") const {
+    std::ifstream file(directory / name);
+    std::vector<std::string> found;
+    for (std::string line; std::getline(file, line);) found.push_back(line);
+    return found;
+  }
+
+  orvanta::test::TemporaryDirectory directory;
+  orvanta::test::TestClock clock{1795532645.5};
+  const std::string path = directory / "powerlog.jsonl";
+};
+
+TEST_F(JsonLinesPowerLogTest, writesOneLineOfJsonPerRecord) {
+  JsonLinesPowerLog log(path, clock);
+  const Dictionary record{{"x", 1}, {"text \"in quotes\"", "two\nlines"}, {"list", Array{true, Value()}}};
+  log.registeredEvent(28, "Vesperd-ORV", record);
+  log.registeredEvent(-1, "", {});
+  EXPECT_THAT(lines(), ElementsAre(R"({"event":28,"sender":"Vesperd-ORV","time":1795532645.5,"record":)"
+                                   R"({"list":[true,null],"text \"in quotes\"":"two\nlines","x":1}})",
+                                   R"({"event":-1,"sender":"","time":1795532645.5,"record":{}})"));
+  const auto parsed = parseJson(lines()[0]);
+  ASSERT_TRUE(parsed) << parsed.error();
+  EXPECT_EQ(*parsed->dictionary()->find("record"), Value(record));
+}
+
+TEST_F(JsonLinesPowerLogTest, keepsTwoGenerations) {
+  const Dictionary record{{"filler", std::string(400, 'f')}};  // two lines fit, three do not
+  {
+    JsonLinesPowerLog log(path, clock, 1000);
+    for (int event = 1; event <= 2; ++event) log.registeredEvent(event, "s", record);
+    EXPECT_FALSE(std::filesystem::exists(path + ".1"));
+    for (int event = 3; event <= 5; ++event) log.registeredEvent(event, "s", record);
+  }
+  const auto eventsOf = [&](const std::string& name) {
+    std::vector<std::string> events;
+    for (const auto& line : lines(name)) events.push_back(line.substr(0, line.find(',')));
+    return events;
+  };
+  EXPECT_THAT(eventsOf("powerlog.jsonl.1"), ElementsAre(R"({"event":3)", R"({"event":4)"));
+  EXPECT_THAT(eventsOf("powerlog.jsonl"), ElementsAre(R"({"event":5)"));
+  // A later process goes on where this one stopped.
+  JsonLinesPowerLog log(path, clock, 1000);
+  for (int event = 6; event <= 7; ++event) log.registeredEvent(event, "s", record);
+  EXPECT_THAT(eventsOf("powerlog.jsonl.1"), ElementsAre(R"({"event":5)", R"({"event":6)"));
+  EXPECT_THAT(eventsOf("powerlog.jsonl"), ElementsAre(R"({"event":7)"));
+}
+
+TEST_F(JsonLinesPowerLogTest, aRecordLargerThanAGenerationIsWrittenAlone) {
+  JsonLinesPowerLog log(path, clock, 100);
+  log.registeredEvent(1, "s", {{"filler", std::string(400, 'f')}});
+  EXPECT_FALSE(std::filesystem::exists(path + ".1")) << "there was nothing to keep";
+  log.registeredEvent(2, "s", {{"filler", std::string(400, 'f')}});
+  EXPECT_EQ(lines("powerlog.jsonl.1").size(), 1);
+  EXPECT_EQ(lines().size(), 1);
+}
+
+TEST_F(JsonLinesPowerLogTest, beginsAnewWhenTheFileIsRemoved) {
+  JsonLinesPowerLog log(path, clock);
+  log.registeredEvent(1, "s", {});
+  std::filesystem::remove(path);
+  log.registeredEvent(2, "s", {});
+  EXPECT_THAT(lines(), ElementsAre(testing::StartsWith(R"({"event":2)")));
+}
+
+TEST_F(JsonLinesPowerLogTest, saysOnceThatRecordsAreLost) {
+  std::filesystem::create_directory(path);
+  const orvanta::test::LogCapture captured;
+  JsonLinesPowerLog log(path, clock);
+  for (int round = 0; round < 3; ++round) log.registeredEvent(1, "s", {});
+  EXPECT_THAT(captured.lines(), ElementsAre("<4>registeredEvent: cannot write to " + path + ": Is a directory"));
+  std::filesystem::remove(path);
+  log.registeredEvent(2, "s", {});
+  EXPECT_EQ(lines().size(), 1);
+}
+
+TEST_F(JsonLinesPowerLogTest, followsNoLink) {
+  std::filesystem::create_symlink(directory / "elsewhere", path);
+  JsonLinesPowerLog log(path, clock);
+  log.registeredEvent(1, "s", {});
+  EXPECT_FALSE(std::filesystem::exists(directory / "elsewhere"));
+}
+
+TEST_F(JsonLinesPowerLogTest, recordsOfSeveralThreadsStayWhole) {
+  JsonLinesPowerLog log(path, clock, 16U << 20U);
+  std::vector<std::thread> threads;
+  for (int thread = 0; thread < 4; ++thread) {
+    threads.emplace_back([&log, thread] {
+      for (int record = 0; record < 100; ++record) {
+        log.registeredEvent(thread * 100 + record, "s", {{"filler", std::string(500, 'f')}});
+      }
+    });
+  }
+  for (std::thread& thread : threads) thread.join();
+  std::set<std::int64_t> events;
+  for (const std::string& line : lines()) {
+    const auto parsed = parseJson(line);
+    ASSERT_TRUE(parsed) << line;
+    events.insert(parsed->dictionary()->find("event")->integerValue());
+  }
+  EXPECT_EQ(events.size(), 400);
+}
+
+}  // namespace
+}  // namespace platform

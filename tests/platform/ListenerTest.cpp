@@ -1,0 +1,411 @@
+#include "platform/Listener.h"
+
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+
+#include <algorithm>
+#include <array>
+#include <atomic>
+#include <cstdlib>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/Connect.h"
+#include "platform/ServiceListener.h"
+#include "platform/ServiceSocket.h"
+#include "platform/UnixAddress.h"
+#include "tests/platform/ConnectionFixture.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace orvanta::test {
+namespace {
+
+using platform::connectToService;
+using platform::Listener;
+using platform::OfferedConnection;
+using platform::ServiceListener;
+using platform::UniqueFd;
+using ::testing::HasSubstr;
+
+const std::string kService = "test.service";
+
+class ListenerTest : public ConnectionFixture {
+ protected:
+  // Admits everybody, and keeps what was admitted.
+  Listener::Handler admitting() {
+    return [this](OfferedConnection&& offered) {
+      const auto delegate = std::make_shared<RecordingDelegate>();
+      offered.connection->resume(delegate);
+      const std::lock_guard lock(_mutex);
+      _peers.push_back(offered.peer);
+      _descriptions.push_back(offered.connection->description());
+      _admitted.add();
+      return true;
+    };
+  }
+  static Listener::Handler refusing() {
+    return [](OfferedConnection&&) { return false; };
+  }
+  std::unique_ptr<Listener> listen(Listener::Handler handler) {
+    auto listener = Listener::create(*_pool, _directory.path(), kService, std::move(handler));
+    EXPECT_TRUE(listener.ok()) << listener.error();
+    if (!listener) return nullptr;
+    (*listener)->resume();
+    return std::move(*listener);
+  }
+  // A blocking socket.
+  Peer connect() {
+    auto socket = connectToService(_directory.path(), kService);
+    EXPECT_TRUE(socket.ok()) << socket.error();
+    if (!socket) return {};
+    ::fcntl(socket->get(), F_SETFL, 0);
+    return Peer(std::move(*socket));
+  }
+  std::string socketPath() const { return _directory / kService; }
+
+  TemporaryDirectory _directory;
+  Counter _admitted;
+  std::mutex _mutex;
+  std::vector<platform::PeerIdentity> _peers;  // guarded by _mutex
+  std::vector<std::string> _descriptions;      // guarded by _mutex
+};
+
+UniqueFd listeningSocket(const std::string& path, bool listening = true) {
+  UniqueFd socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  const auto address = platform::unixAddress(path);
+  EXPECT_EQ(::bind(socket.get(), reinterpret_cast<const sockaddr*>(&*address), sizeof *address), 0);
+  if (listening) {
+    EXPECT_EQ(::listen(socket.get(), 8), 0);
+  }
+  return socket;
+}
+
+TEST_F(ListenerTest, OffersEveryConnectionWithItsPeer) {
+  const auto listener = listen(admitting());
+  std::vector<Peer> peers;
+  for (int i = 0; i < 50; ++i) peers.push_back(connect());
+  ASSERT_TRUE(_admitted.waitFor(50));
+  listener->stop();
+  for (const auto& peer : _peers) {
+    EXPECT_EQ(peer.pid, ::getpid());
+    EXPECT_EQ(peer.uid, ::geteuid());
+  }
+  const std::string who = " (pid " + std::to_string(::getpid()) + ", uid " + std::to_string(::geteuid()) + ")";
+  EXPECT_THAT(_descriptions, ::testing::Each(::testing::AllOf(::testing::StartsWith("fd "), ::testing::EndsWith(who))));
+}
+
+TEST_F(ListenerTest, ClosesWhatTheHandlerRefuses) {
+  const auto listener = listen(refusing());
+  EXPECT_TRUE(connect().atEnd());
+}
+
+TEST_F(ListenerTest, AcceptsNothingBeforeResume) {
+  auto listener = Listener::create(*_pool, _directory.path(), kService, admitting());
+  ASSERT_TRUE(listener.ok());
+  const Peer early = connect();
+  EXPECT_EQ(_admitted.value(), 0);
+  (*listener)->resume();
+  EXPECT_TRUE(_admitted.waitFor(1));
+  (*listener)->stop();
+}
+
+TEST_F(ListenerTest, EverybodyMayConnectWhateverTheMask) {
+  const mode_t before = ::umask(0077);
+  const auto listener = listen(refusing());
+  ::umask(before);
+  struct stat status {};
+  ASSERT_EQ(::stat(socketPath().c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 07777U, 0666U);
+}
+
+TEST_F(ListenerTest, ReplacesAStaleSocket) {
+  { const UniqueFd gone = listeningSocket(socketPath()); }
+  LogCapture log;
+  const auto listener = listen(admitting());
+  EXPECT_EQ(log.count("stale socket"), 1U);
+  const Peer peer = connect();
+  EXPECT_TRUE(_admitted.waitFor(1));
+  listener->stop();
+}
+
+TEST_F(ListenerTest, RefusesToListenBesideALiveOne) {
+  const auto listener = listen(admitting());
+  const auto second = Listener::create(*_pool, _directory.path(), kService, refusing());
+  ASSERT_FALSE(second.ok());
+  EXPECT_THAT(second.error(), HasSubstr("Process " + std::to_string(::getpid()) + " listens at " + socketPath()));
+  const Peer peer = connect();
+  EXPECT_TRUE(_admitted.waitFor(1)) << "the first one listens on";
+  listener->stop();
+}
+
+// One that knows nothing of our lock.
+TEST_F(ListenerTest, LeavesAForeignLiveSocketAlone) {
+  const UniqueFd foreign = listeningSocket(socketPath());
+  const auto listener = Listener::create(*_pool, _directory.path(), kService, refusing());
+  ASSERT_FALSE(listener.ok());
+  EXPECT_THAT(listener.error(), HasSubstr("Process " + std::to_string(::getpid())));
+  EXPECT_TRUE(connectToService(_directory.path(), kService).ok());
+}
+
+TEST_F(ListenerTest, SaysWhatStandsInTheWay) {
+  _directory.write("taken", "a file");
+  const struct {
+    std::string directory;
+    std::string service;
+    const char* reason;
+  } rows[] = {
+      {_directory.path(), "taken", "no socket"},
+      {_directory / "absent", kService, "No such file or directory"},
+      {_directory.path(), std::string(120, 'x'), "File name too long"},
+  };
+  for (const auto& row : rows) {
+    const auto listener = Listener::create(*_pool, row.directory, row.service, refusing());
+    ASSERT_FALSE(listener.ok()) << row.service;
+    EXPECT_THAT(listener.error(), HasSubstr(row.reason));
+  }
+  EXPECT_EQ(::access((_directory / "taken").c_str(), F_OK), 0);
+}
+
+TEST_F(ListenerTest, OfSeveralThatStartAtOnceOneWins) {
+  { const UniqueFd gone = listeningSocket(socketPath()); }
+  constexpr int kStarters = 8;
+  std::vector<std::unique_ptr<Listener>> winners;
+  std::vector<std::string> errors;
+  Counter ready;
+  std::vector<std::thread> starters;
+  for (int i = 0; i < kStarters; ++i) {
+    starters.emplace_back([&] {
+      ready.add();
+      ready.waitFor(kStarters);
+      auto listener = Listener::create(*_pool, _directory.path(), kService, admitting());
+      const std::lock_guard lock(_mutex);
+      if (listener) {
+        winners.push_back(std::move(*listener));
+      } else {
+        errors.push_back(listener.error());
+      }
+    });
+  }
+  for (auto& starter : starters) starter.join();
+  ASSERT_EQ(winners.size(), 1U);
+  EXPECT_THAT(errors, ::testing::Each(HasSubstr("listens at")));
+  winners.front()->resume();
+  const Peer peer = connect();
+  EXPECT_TRUE(_admitted.waitFor(1));
+  winners.front()->stop();
+}
+
+TEST_F(ListenerTest, StopRemovesItsSocketAndFreesTheName) {
+  for (int round = 0; round < 2; ++round) {
+    const auto listener = listen(admitting());
+    listener->stop();
+    listener->stop();
+    int error = 0;
+    EXPECT_FALSE(connectToService(_directory.path(), kService, &error).ok());
+    EXPECT_EQ(error, ENOENT);
+  }
+}
+
+TEST_F(ListenerTest, StopLeavesASocketThatIsNotItsOwn) {
+  const auto listener = listen(refusing());
+  ASSERT_EQ(::unlink(socketPath().c_str()), 0);
+  const UniqueFd foreign = listeningSocket(socketPath());
+  listener->stop();
+  EXPECT_TRUE(connectToService(_directory.path(), kService).ok());
+}
+
+TEST_F(ListenerTest, StopWaitsForHandlersUnderWay) {
+  Counter entered;
+  Counter release;
+  std::atomic<bool> left = false;
+  const auto listener = listen([&](OfferedConnection&&) {
+    entered.add();
+    release.waitFor(1);
+    left = true;
+    return false;
+  });
+  const Peer peer = connect();
+  ASSERT_TRUE(entered.waitFor(1));
+  std::thread releaser([&] { release.add(); });
+  listener->stop();
+  EXPECT_TRUE(left);
+  releaser.join();
+  EXPECT_TRUE(peer.atEnd());
+}
+
+TEST_F(ListenerTest, AHandlerMayStopItsListener) {
+  std::unique_ptr<Listener> listener;
+  Counter stopped;
+  auto made = Listener::create(*_pool, _directory.path(), kService, [&](OfferedConnection&&) {
+    listener->stop();
+    stopped.add();
+    return false;
+  });
+  ASSERT_TRUE(made.ok());
+  listener = std::move(*made);
+  listener->resume();
+  const Peer peer = connect();
+  EXPECT_TRUE(stopped.waitFor(1));
+  _pool->stop();
+}
+
+TEST_F(ListenerTest, OneUserHasOnlySoManyConnectionsAtATime) {
+  LogCapture log;
+  auto socket = platform::openServiceSocket(_directory.path(), kService);
+  ASSERT_TRUE(socket.ok());
+  const auto welcoming = [admit = admitting()](OfferedConnection&& offered) {
+    offered.connection->outbox()->send(notification("welcome"));
+    return admit(std::move(offered));
+  };
+  ServiceListener listener(*_pool, std::move(*socket), welcoming, 3);
+  listener.resume();
+  std::vector<Peer> peers;
+  for (int i = 0; i < 3; ++i) peers.push_back(connect());
+  ASSERT_TRUE(_admitted.waitFor(3));
+  for (int i = 0; i < 5; ++i) EXPECT_TRUE(connect().atEnd());
+  EXPECT_EQ(_admitted.value(), 3);
+  EXPECT_EQ(log.count("User " + std::to_string(::geteuid()) + " has 3 already"), 1U) << "one line a minute";
+  // A place is free again once its connection has gone for good.
+  peers.pop_back();
+  EXPECT_TRUE(eventually([&] { return !connect().atEnd(); }));
+  listener.stop();
+}
+
+// Lets the process open no further descriptor while it lives.
+class DescriptorsExhausted {
+ public:
+  DescriptorsExhausted() {
+    ::getrlimit(RLIMIT_NOFILE, &_before);
+    const int lowestFree = ::dup(STDERR_FILENO);
+    ::close(lowestFree);
+    rlimit limit = _before;
+    limit.rlim_cur = static_cast<rlim_t>(lowestFree);
+    ::setrlimit(RLIMIT_NOFILE, &limit);
+  }
+  ~DescriptorsExhausted() { ::setrlimit(RLIMIT_NOFILE, &_before); }
+  DescriptorsExhausted(const DescriptorsExhausted&) = delete;
+  DescriptorsExhausted& operator=(const DescriptorsExhausted&) = delete;
+
+ private:
+  rlimit _before{};
+};
+
+TEST_F(ListenerTest, PausesWhenDescriptorsRunOutAndGoesOn) {
+  LogCapture log;
+  auto listener = Listener::create(*_pool, _directory.path(), kService, admitting());
+  ASSERT_TRUE(listener.ok());
+  const Peer first = connect();
+  const Peer second = connect();
+  {
+    const DescriptorsExhausted exhausted;
+    (*listener)->resume();
+    ASSERT_TRUE(eventually([&] { return log.contains("<3>Listener: No connection can be accepted"); }));
+    EXPECT_EQ(_admitted.value(), 0);
+  }
+  EXPECT_TRUE(_admitted.waitFor(2));
+  EXPECT_EQ(log.count("No connection can be accepted"), 1U);
+  (*listener)->stop();
+}
+
+// Back-pressure wants a descriptor of its own; without one it must still get on.
+TEST_F(ListenerTest, RepliesStillGoOutWhenDescriptorsRunOut) {
+  auto made = open();
+  const Bytes reply = response(1, platform::Value(std::string(2U << 20U, 'r')));
+  {
+    const DescriptorsExhausted exhausted;
+    EXPECT_TRUE(made.connection->outbox()->send(reply));
+    EXPECT_EQ(made.peer.read(reply.size()), reply);
+  }
+}
+
+// The test starts itself again as the service manager would start the daemon, with the listening socket as
+// descriptor 3.
+TEST_F(ListenerTest, TakesTheSocketOfTheServiceManager) {
+  if (std::getenv("LISTEN_FDS") != nullptr) {
+    const auto listener = Listener::create(*_pool, "/nonexistent", kService, [&](OfferedConnection&& offered) {
+      offered.connection->outbox()->send(notification("activated"));
+      offered.connection->resume(std::make_shared<RecordingDelegate>());
+      _admitted.add();
+      return true;
+    });
+    ASSERT_TRUE(listener.ok()) << listener.error();
+    (*listener)->resume();
+    ASSERT_TRUE(_admitted.waitFor(1));
+    (*listener)->stop();
+    return;
+  }
+
+  const UniqueFd listening = listeningSocket(socketPath());
+  std::array<char, 32> process{};
+  std::vector<std::string> environment = {"LISTEN_FDS=1"};
+  std::vector<char*> variables;
+  for (char** variable = environ; *variable != nullptr; ++variable) variables.push_back(*variable);
+  variables.insert(variables.end(), {environment[0].data(), process.data(), nullptr});
+  const pid_t child = ::fork();
+  if (child == 0) {
+    std::snprintf(process.data(), process.size(), "LISTEN_PID=%d", ::getpid());
+    if (listening.get() == 3) {
+      ::fcntl(3, F_SETFD, 0);
+    } else {
+      ::dup2(listening.get(), 3);
+    }
+    ::execle("/proc/self/exe", "test", "--gtest_filter=ListenerTest.TakesTheSocketOfTheServiceManager",
+             static_cast<char*>(nullptr), variables.data());
+    ::_exit(127);
+  }
+  ASSERT_GT(child, 0);
+  const Peer peer = connect();
+  const Bytes expected = notification("activated");
+  EXPECT_EQ(peer.read(expected.size()), expected);
+  int status = -1;
+  ::waitpid(child, &status, 0);
+  EXPECT_EQ(status, 0);
+  EXPECT_EQ(::access(socketPath().c_str(), F_OK), 0) << "the socket file is the service manager's";
+}
+
+TEST(ConnectToServiceTest, TellsWhyNot) {
+  const TemporaryDirectory directory;
+  const UniqueFd bound = listeningSocket(directory / "deaf", false);
+  directory.write("file", "no socket");
+  const struct {
+    std::string directory;
+    std::string service;
+    int error;
+  } rows[] = {
+      {directory.path(), "absent", ENOENT},     {directory / "absent", "service", ENOENT},
+      {directory.path(), "deaf", ECONNREFUSED}, {directory.path(), "file", ECONNREFUSED},
+      {directory / "file", "service", ENOTDIR}, {directory.path(), std::string(200, 'x'), ENAMETOOLONG},
+  };
+  for (const auto& row : rows) {
+    int error = 0;
+    const auto socket = connectToService(row.directory, row.service, &error);
+    ASSERT_FALSE(socket.ok()) << row.service;
+    EXPECT_EQ(error, row.error) << row.service;
+    EXPECT_THAT(socket.error(), HasSubstr(row.directory + "/" + row.service));
+  }
+}
+
+TEST(ConnectToServiceTest, DoesNotWaitForABusyService) {
+  const TemporaryDirectory directory;
+  const UniqueFd listening = listeningSocket(directory / "busy");
+  std::vector<UniqueFd> waiting;
+  int error = 0;
+  while (waiting.size() < 100) {
+    auto socket = connectToService(directory.path(), "busy", &error);
+    if (!socket) break;
+    EXPECT_EQ(::fcntl(socket->get(), F_GETFD) & FD_CLOEXEC, FD_CLOEXEC);
+    waiting.push_back(std::move(*socket));
+  }
+  EXPECT_EQ(error, EAGAIN);
+}
+
+}  // namespace
+}  // namespace orvanta::test

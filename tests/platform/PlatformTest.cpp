@@ -1,0 +1,144 @@
+#include "platform/Platform.h"
+
+#include <gtest/gtest.h>
+
+#include <cstdlib>
+#include <future>
+#include <string>
+#include <vector>
+
+#include "tests/support/TestPlatform.h"
+
+namespace platform {
+namespace {
+
+// The process's environment with some variables changed, until the object goes.
+class ChangedEnvironment {
+ public:
+  explicit ChangedEnvironment(std::vector<std::pair<const char*, const char*>> changes) {
+    for (const auto& [name, value] : changes) {
+      const char* before = std::getenv(name);
+      _before.emplace_back(name, before == nullptr ? std::nullopt : std::optional<std::string>(before));
+      value == nullptr ? ::unsetenv(name) : ::setenv(name, value, 1);
+    }
+  }
+  ~ChangedEnvironment() {
+    for (const auto& [name, value] : _before) value ? ::setenv(name, value->c_str(), 1) : ::unsetenv(name);
+  }
+
+ private:
+  std::vector<std::pair<const char*, std::optional<std::string>>> _before;
+};
+
+TEST(FileLocations, comeFromTheEnvironment) {
+  struct Row {
+    const char* given;   // to each variable; null: unset
+    std::string listed;  // what becomes of it where systemd may give several; empty: the default
+    std::string single;
+  };
+  const Row rows[] = {
+      {"/srv/a", "/srv/a", "/srv/a"},
+      {"/srv/a/", "/srv/a", "/srv/a"},
+      {"/srv/a///", "/srv/a", "/srv/a"},
+      {"/srv/a:/srv/b", "/srv/a", "/srv/a:/srv/b"},
+      {"/srv/a/:/srv/b", "/srv/a", "/srv/a/:/srv/b"},
+      {"/", "/", "/"},
+      {":/srv/b", "", ":/srv/b"},
+      {"", "", ""},
+      {nullptr, "", ""},
+  };
+  const FileLocations defaults;
+  const auto orDefault = [](const std::string& expected, const std::string& fallback) {
+    return expected.empty() ? fallback : expected;
+  };
+  for (const Row& row : rows) {
+    const ChangedEnvironment environment({{"RUNTIME_DIRECTORY", row.given},
+                                          {"STATE_DIRECTORY", row.given},
+                                          {"CONFIGURATION_DIRECTORY", row.given},
+                                          {"ORVANTA_FRAMEWORK", row.given},
+                                          {"ORVANTA_PLUGINS", row.given},
+                                          {"ORVANTA_CA_FILE", row.given}});
+    const FileLocations locations = FileLocations::fromEnvironment();
+    EXPECT_EQ(locations.runtimeDirectory, orDefault(row.listed, defaults.runtimeDirectory));
+    EXPECT_EQ(locations.stateDirectory, orDefault(row.listed, defaults.stateDirectory));
+    EXPECT_EQ(locations.configurationDirectory, orDefault(row.listed, defaults.configurationDirectory));
+    EXPECT_EQ(locations.frameworkDirectory, orDefault(row.single, defaults.frameworkDirectory));
+    EXPECT_EQ(locations.plugInsDirectory, orDefault(row.single, defaults.plugInsDirectory));
+    EXPECT_EQ(locations.caFile, row.single);
+  }
+}
+
+TEST(Platform, makesEachOnceValueOnceWhateverThreadAsks) {
+  struct Inner {
+    int value;
+  };
+  struct Outer {
+    int value;
+  };
+  orvanta::test::TestPlatform device;
+  Platform& platform = device;
+  std::atomic<int> made{0};
+  const auto ask = [&] {
+    return &platform.once<Outer>([&] { return Outer{platform.once<Inner>([&] { return Inner{++made}; }).value + 10}; });
+  };
+  auto other = std::async(std::launch::async, ask);
+  const Outer* mine = ask();
+  EXPECT_EQ(mine, other.get());
+  EXPECT_EQ(mine->value, 11);
+  EXPECT_EQ(made, 1);
+  orvanta::test::TestPlatform another;
+  EXPECT_EQ(another.get().once<Inner>([] { return Inner{5}; }).value, 5);
+}
+
+// What a once-value holds of the client and the pool must go while they are there: told by the order of the ends.
+struct Ends {
+  std::vector<std::string> order;
+};
+
+class TellingHttpClient final : public HttpClient {
+ public:
+  explicit TellingHttpClient(Ends& ends) : _ends(ends) {}
+  ~TellingHttpClient() override { _ends.order.emplace_back("client destroyed"); }
+  std::shared_ptr<HttpLane> makeLane(LaneKind) override { return std::make_shared<HttpLane>(); }
+  void start(const std::shared_ptr<HttpLane>&, HttpRequest, UniqueFunction<void(const HttpResult&)>,
+             Completion) override {}
+  HttpResult perform(const std::shared_ptr<HttpLane>&, HttpRequest) override { return {}; }
+  void abortBlockingRequests() override {}
+  void shutdown(std::chrono::milliseconds) override { _ends.order.emplace_back("client shut down"); }
+
+ private:
+  Ends& _ends;
+};
+
+struct Telling {
+  explicit Telling(Ends& told) : ends(&told) {}
+  Telling(Telling&& other) noexcept : ends(std::exchange(other.ends, nullptr)) {}
+  Telling& operator=(Telling&&) = delete;
+  ~Telling() {
+    if (ends != nullptr) ends->order.emplace_back("once-value destroyed");
+  }
+  Ends* ends;
+};
+
+TEST(Platform, endsItsPartsInOrder) {
+  Ends ends;
+  {
+    Platform::Parts parts;
+    parts.pool = std::make_unique<WorkPool>(1);
+    parts.pool->start();
+    parts.http = std::make_unique<TellingHttpClient>(ends);
+    Platform platform(std::move(parts));
+    platform.once<Telling>([&] { return Telling(ends); });
+    std::promise<void> ran;
+    platform.pool().post([&] {
+      ends.order.emplace_back("job");
+      ran.set_value();
+    });
+    ran.get_future().get();
+  }
+  EXPECT_EQ(ends.order,
+            (std::vector<std::string>{"job", "client shut down", "once-value destroyed", "client destroyed"}));
+}
+
+}  // namespace
+}  // namespace platform

@@ -1,0 +1,321 @@
+#include "platform/Sandbox.h"
+
+#include <dirent.h>
+#include <dlfcn.h>
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <netdb.h>
+#include <pwd.h>
+#include <sys/prctl.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <ctime>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+
+#include "platform/Landlock.h"
+#include "platform/PropertyList.h"
+#include "platform/UserDefaults.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace platform {
+namespace {
+
+namespace fs = std::filesystem;
+using Variables = std::map<std::string, std::string>;
+
+constexpr const char* kProfile = "com.kovalt.test";
+
+// Runs in a child process of one thread, which ends without exit handlers: what is entered cannot be left again, and
+// leak checks do not work inside. Gives back the text that `body` returns.
+std::string inChild(const std::function<std::string()>& body) {
+  int ends[2];
+  if (::pipe(ends) != 0) return "pipe failed";
+  UniqueFd read(ends[0]);
+  UniqueFd write(ends[1]);
+  const pid_t child = ::fork();
+  if (child == 0) {
+    const std::string text = body();
+    const bool told = ::write(write.get(), text.data(), text.size()) == static_cast<ssize_t>(text.size());
+    ::_exit(told ? 0 : 1);
+  }
+  write.reset();
+  std::string text;
+  char buffer[4096];
+  for (ssize_t count = 0; (count = ::read(read.get(), buffer, sizeof buffer)) > 0;) {
+    text.append(buffer, static_cast<std::size_t>(count));
+  }
+  int status = 0;
+  ::waitpid(child, &status, 0);
+  return WIFEXITED(status) && WEXITSTATUS(status) == 0 ? text : "the child died";
+}
+
+// What a system call's result comes to: "done" or errno's text.
+std::string outcome(bool succeeded) {
+  return succeeded ? "done" : std::string(::strerror(errno));
+}
+
+std::string opening(const std::string& path, int flags) {
+  const UniqueFd file(::open(path.c_str(), flags | O_CLOEXEC, 0600));
+  return outcome(static_cast<bool>(file));
+}
+
+std::string binding(const std::string& path) {
+  const UniqueFd socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  path.copy(address.sun_path, sizeof address.sun_path - 1);
+  return outcome(::bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0);
+}
+
+std::string listing(const std::string& path) {
+  DIR* directory = ::opendir(path.c_str());
+  const std::string result = outcome(directory != nullptr);
+  if (directory != nullptr) ::closedir(directory);
+  return result;
+}
+
+std::string running(const char* program) {
+  const pid_t child = ::fork();
+  if (child == 0) {
+    ::execl(program, program, nullptr);
+    ::_exit(errno);
+  }
+  int status = 0;
+  ::waitpid(child, &status, 0);
+  return ::strerror(WEXITSTATUS(status));
+}
+
+class SandboxTest : public testing::Test {
+ protected:
+  void SetUp() override {
+    if (const auto landlock = Landlock::create(); !landlock) GTEST_SKIP() << landlock.error();
+    for (const char* name : {"open", "readable", "closed"}) {
+      directory.write(std::string(name) + "/file", "content");
+      fs::create_directory(directory / (std::string(name) + "/empty"));
+    }
+  }
+
+  void writeProfile(const Array& files) {
+    const auto text = writeXmlPropertyList(Dictionary{{"version", 1}, {"files", files}});
+    ASSERT_TRUE(text) << text.error();
+    directory.write("profiles/com.kovalt.test.plist", *text);
+  }
+  // "open" may be used in every way but for running programs; "readable" is for reading; all else is closed.
+  void writeUsualProfile() {
+    writeProfile(
+        {Dictionary{{"paths", Array{"${OPEN}"}}, {"access", Array{"read", "write", "create", "remove", "socket"}}},
+         Dictionary{{"paths", Array{directory / "readable", "${ABSENT}", "/no/such/directory"}},
+                    {"access", Array{"read"}},
+                    {"optional", true}}});
+  }
+  Result<std::string> enter() const {
+    return enterSandbox(directory / "profiles", kProfile, {{"OPEN", directory / "open"}, {"ABSENT", ""}});
+  }
+  std::string entered(const std::function<std::string()>& body) const {
+    return inChild([&] {
+      const auto result = enter();
+      return result ? body() : result.error();
+    });
+  }
+
+  orvanta::test::TemporaryDirectory directory;
+};
+
+TEST_F(SandboxTest, allowsWhatTheProfileSaysAndNothingElse) {
+  writeUsualProfile();
+  const std::string open = directory / "open/";
+  const std::string readable = directory / "readable/";
+  const std::string closed = directory / "closed/";
+  const std::string denied = "Permission denied";
+  struct Row {
+    const char* what;
+    std::function<std::string(const std::string&)> operation;
+    std::string inOpen, inReadable, inClosed;
+  };
+  const Row rows[] = {
+      {"read", [](const auto& at) { return opening(at + "file", O_RDONLY); }, "done", "done", denied},
+      {"list", [](const auto& at) { return listing(at); }, "done", "done", denied},
+      {"write", [](const auto& at) { return opening(at + "file", O_WRONLY); }, "done", denied, denied},
+      {"append", [](const auto& at) { return opening(at + "file", O_WRONLY | O_APPEND); }, "done", denied, denied},
+      {"empty", [](const auto& at) { return outcome(::truncate((at + "file").c_str(), 0) == 0); }, "done", denied,
+       denied},
+      {"create", [](const auto& at) { return opening(at + "new", O_WRONLY | O_CREAT); }, "done", denied, denied},
+      {"make a directory", [](const auto& at) { return outcome(::mkdir((at + "new").c_str(), 0700) == 0); }, "done",
+       denied, denied},
+      {"replace", [](const auto& at) { return outcome(::rename((at + "file").c_str(), (at + "other").c_str()) == 0); },
+       "done", denied, denied},
+      {"remove", [](const auto& at) { return outcome(::unlink((at + "file").c_str()) == 0); }, "done", denied, denied},
+      {"remove a directory", [](const auto& at) { return outcome(::rmdir((at + "empty").c_str()) == 0); }, "done",
+       denied, denied},
+      {"bind a socket", [](const auto& at) { return binding(at + "socket"); }, "done", denied, denied},
+      {"link symbolically", [](const auto& at) { return outcome(::symlink("/", (at + "link").c_str()) == 0); }, denied,
+       denied, denied},
+      {"make a pipe", [](const auto& at) { return outcome(::mkfifo((at + "pipe").c_str(), 0600) == 0); }, denied,
+       denied, denied},
+      {"climb out", [](const auto& at) { return opening(at + "../profiles/com.kovalt.test.plist", O_RDONLY); }, denied,
+       denied, denied},
+      {"run", [](const auto&) { return running("/bin/true"); }, denied, denied, denied},
+  };
+  for (const Row& row : rows) {
+    // Each in a process of its own; what one has changed is put back for the next.
+    EXPECT_EQ(entered([&] { return row.operation(open); }), row.inOpen) << row.what;
+    EXPECT_EQ(entered([&] { return row.operation(readable); }), row.inReadable) << row.what;
+    EXPECT_EQ(entered([&] { return row.operation(closed); }), row.inClosed) << row.what;
+    fs::remove_all(directory / "open");
+    directory.write("open/file", "content");
+    fs::create_directory(directory / "open/empty");
+  }
+}
+
+TEST_F(SandboxTest, saysWhatWasEnteredAndWhatIsNotThere) {
+  writeUsualProfile();
+  EXPECT_THAT(inChild([&] { return enter().value(); }),
+              testing::MatchesRegex("sandbox profile com.kovalt.test: 2 file rules, Landlock ABI [0-9]+, not present: "
+                                    "\\$.ABSENT. /no/such/directory"));
+  EXPECT_EQ(entered([] { return std::to_string(::prctl(PR_GET_NO_NEW_PRIVS, 0, 0, 0, 0)); }), "1");
+}
+
+TEST_F(SandboxTest, holdsForProgramsAndThreadsThatComeLater) {
+  writeUsualProfile();
+  EXPECT_EQ(entered([&] { return inChild([&] { return opening(directory / "closed/file", O_RDONLY); }); }),
+            "Permission denied");
+}
+
+TEST_F(SandboxTest, descriptorsOpenedBeforeStayUsable) {
+  writeUsualProfile();
+  const UniqueFd file(::open((directory / "closed/file").c_str(), O_RDONLY | O_CLOEXEC));
+  EXPECT_EQ(entered([&] {
+              char buffer[16] = {};
+              return ::read(file.get(), buffer, sizeof buffer) == 7 ? std::string(buffer) : outcome(false);
+            }),
+            "content");
+}
+
+TEST_F(SandboxTest, aFilesRealDirectoryIsOpenedSoThatItsReplacementIsReadable) {
+  directory.write("real/resolv.conf", "old");
+  fs::create_directory(directory / "etc");
+  fs::create_symlink(directory / "real/resolv.conf", directory / "etc/resolv.conf");
+  writeProfile({Dictionary{{"directoriesOf", Array{directory / "etc/resolv.conf"}}, {"access", Array{"read"}}}});
+  int gate[2];
+  ASSERT_EQ(::pipe(gate), 0);
+  const UniqueFd wait(gate[0]);
+  UniqueFd open(gate[1]);
+  // The child says "e" once it has entered; the file is then replaced by renaming before the child reads it.
+  int told[2];
+  ASSERT_EQ(::pipe(told), 0);
+  const UniqueFd listen(told[0]);
+  const UniqueFd tell(told[1]);
+  const pid_t child = ::fork();
+  if (child == 0) {
+    char byte = enter() ? 'e' : 'f';
+    if (::write(tell.get(), &byte, 1) != 1 || ::read(wait.get(), &byte, 1) != 1) ::_exit(2);
+    ::_exit(opening(directory / "etc/resolv.conf", O_RDONLY) == "done" ? 0 : 1);
+  }
+  char byte = 0;
+  ASSERT_EQ(::read(listen.get(), &byte, 1), 1);
+  EXPECT_EQ(byte, 'e');
+  fs::rename(directory.write("real/fresh", "new"), directory / "real/resolv.conf");
+  ASSERT_EQ(::write(open.get(), "g", 1), 1);
+  int status = 0;
+  ::waitpid(child, &status, 0);
+  EXPECT_EQ(status, 0);
+}
+
+TEST_F(SandboxTest, failsWithTheStepAndTheReason) {
+  const std::string file = directory / "profiles/com.kovalt.test.plist";
+  const auto failure = [&] {
+    return inChild([&] {
+      const auto result = enter();
+      return result ? "entered" : result.error();
+    });
+  };
+  EXPECT_THAT(failure(), testing::AllOf(testing::StartsWith("sandbox profile com.kovalt.test: "),
+                                        testing::HasSubstr(file), testing::HasSubstr("No such file or directory")));
+  directory.write("profiles/com.kovalt.test.plist", "<plist><dict><key>");
+  EXPECT_THAT(failure(),
+              testing::AllOf(testing::StartsWith("sandbox profile com.kovalt.test: "), testing::HasSubstr(file)));
+
+  writeProfile({Dictionary{{"paths", Array{"/"}}, {"acess", Array{"read"}}}});
+  EXPECT_EQ(failure(), "sandbox profile " + file + ": files[0]: unknown key \"acess\", did you mean \"access\"?");
+
+  struct Row {
+    const char* key;
+    std::string path;
+    std::string error;
+  };
+  const Row rows[] = {
+      {"paths", "/no/such/directory", "cannot open /no/such/directory: No such file or directory"},
+      {"paths", "${ABSENT}", "${ABSENT} has a variable without a value"},
+      {"paths", "/", "/ leads to the root directory, which is not opened up"},
+      {"directoriesOf", "/no/such/file", "cannot resolve /no/such/file: No such file or directory"},
+      {"directoriesOf", "${UNKNOWN}/x", "${UNKNOWN}/x has a variable without a value"},
+      {"directoriesOf", "/etc/..", "/etc/.. leads to the root directory, which is not opened up"},
+  };
+  for (const Row& row : rows) {
+    writeProfile({Dictionary{{row.key, Array{row.path}}, {"access", Array{"read"}}}});
+    EXPECT_EQ(failure(), "sandbox profile com.kovalt.test: " + row.error);
+    writeProfile({Dictionary{{row.key, Array{row.path}}, {"access", Array{"read"}}, {"optional", true}}});
+    EXPECT_EQ(failure(), "entered") << row.path;
+  }
+}
+
+TEST_F(SandboxTest, theShippedProfileLetsTheDaemonWork) {
+  const Variables variables = {
+      {"RUNTIME_DIRECTORY", directory / "run"},       {"STATE_DIRECTORY", directory / "state"},
+      {"CONFIGURATION_DIRECTORY", directory / "etc"}, {"ORVANTA_FRAMEWORK", directory / "share"},
+      {"ORVANTA_PLUGINS", directory / "PlugIns"},     {"ORVANTA_CA_DIRECTORY", ""}};
+  for (const char* name : {"run", "state", "etc", "share"}) fs::create_directory(directory / name);
+  directory.write("etc/device.plist", "x");
+  const auto work = [&](const std::function<std::string()>& body) {
+    return inChild([&] {
+      const auto result =
+          enterSandbox(ORVANTA_SOURCE_DIR "/packaging/share/orvanta/sandbox", "com.kovalt.orvantad", variables);
+      return result ? body() : result.error();
+    });
+  };
+  const std::string denied = "Permission denied";
+  EXPECT_EQ(work([&] { return binding(directory / "run/com.kovalt.orvantad"); }), "done");
+  EXPECT_EQ(work([&] { return outcome(::unlink((directory / "run/com.kovalt.orvantad").c_str()) == 0); }), "done");
+  EXPECT_EQ(work([&] {
+              UserDefaults defaults(directory / "state", "com.kovalt.orvanta");
+              const auto stored = defaults.set("key", "value");
+              return stored ? defaults.text("key").value_or("lost") : stored.error();
+            }),
+            "value");
+  EXPECT_EQ(work([&] { return outcome(::mkdir((directory / "state/Logs").c_str(), 0700) == 0); }), "done");
+  EXPECT_EQ(work([&] { return opening(directory / "etc/device.plist", O_RDONLY); }), "done");
+  EXPECT_EQ(work([&] { return opening(directory / "etc/device.plist", O_WRONLY); }), denied);
+  EXPECT_EQ(work([] { return outcome(::getpwnam("root") != nullptr); }), "done");
+  EXPECT_EQ(work([] {
+              addrinfo* found = nullptr;
+              const int error = ::getaddrinfo("localhost", "80", nullptr, &found);
+              return error == 0 ? "done" : ::gai_strerror(error);
+            }),
+            "done");
+  EXPECT_EQ(work([] {
+              ::setenv("TZ", ":Asia/Tokyo", 1);
+              ::tzset();
+              return std::to_string(timezone);
+            }),
+            fs::exists("/usr/share/zoneinfo/Asia/Tokyo") ? "-32400" : "0");
+  EXPECT_EQ(work([] { return outcome(::dlopen("libresolv.so.2", RTLD_NOW) != nullptr); }), "done");
+  EXPECT_EQ(work([] { return opening("/dev/null", O_RDWR); }), "done");
+  EXPECT_EQ(work([] { return opening("/proc/self/status", O_RDONLY); }), "done");
+  // Whoever the daemon runs as.
+  EXPECT_EQ(work([&] { return opening(directory / "closed/file", O_RDONLY); }), denied);
+  EXPECT_EQ(work([] { return listing("/"); }), denied);
+  EXPECT_EQ(work([] { return listing("/home"); }), denied);
+  EXPECT_EQ(work([] { return opening("/etc/orvantad-test", O_WRONLY | O_CREAT); }), denied);
+  EXPECT_EQ(work([] { return opening("/tmp/orvantad-test", O_WRONLY | O_CREAT); }), denied);
+  EXPECT_EQ(work([] { return running("/bin/true"); }), denied);
+}
+
+}  // namespace
+}  // namespace platform

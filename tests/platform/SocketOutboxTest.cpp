@@ -1,0 +1,293 @@
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <atomic>
+#include <thread>
+
+#include "platform/Connection.h"
+#include "platform/FrameDecoder.h"
+#include "tests/platform/ConnectionFixture.h"
+
+namespace orvanta::test {
+namespace {
+
+using platform::Connection;
+using platform::ConnectionLimits;
+using platform::Frame;
+using platform::FrameDecoder;
+using platform::Outbox;
+using platform::UniqueFd;
+using platform::Value;
+using namespace std::chrono_literals;
+
+class OutboxTest : public ConnectionFixture {
+ protected:
+  // Fills the socket's buffer and puts `beyond` bytes more into the outbox; returns what the peer will read.
+  static Bytes fill(Connection& connection, std::size_t beyond) {
+    const Bytes block = response(0, Value(std::string(16U << 10U, 'f')));
+    Bytes all;
+    while (connection.outbox()->pending() < beyond) {
+      EXPECT_TRUE(connection.outbox()->send(block));
+      all.insert(all.end(), block.begin(), block.end());
+    }
+    return all;
+  }
+};
+
+TEST_F(OutboxTest, StopsReadingWhileThePeerReadsNoReplies) {
+  constexpr std::size_t kReply = 64U << 10U;
+  constexpr std::size_t kCalls = 200;
+  const std::size_t limit = ConnectionLimits{}.maximumUnreadReplies;
+  const Bytes reply = response(1, Value(std::string(kReply, 'r')));
+  std::atomic<std::size_t> mostPending = 0;
+  auto made = open([&](Connection& connection, Frame&) {
+    mostPending = std::max(mostPending.load(), connection.outbox()->pending());
+    connection.outbox()->send(reply);
+  });
+  ASSERT_TRUE(made.peer.write(repeated(request(1, "call"), kCalls)));
+  ASSERT_TRUE(eventually([&] { return made.connection->outbox()->pending() > limit; }));
+  onQueueOf(*made.connection, [] {});
+  EXPECT_LT(made.delegate->frameCount(), kCalls / 2);
+  // Once it reads, everything goes on.
+  EXPECT_EQ(made.peer.read(reply.size() * kCalls), repeated(reply, kCalls));
+  ASSERT_TRUE(made.delegate->waitForFrames(kCalls));
+  EXPECT_LE(mostPending, limit) << "a call was carried out while too many replies waited";
+  ASSERT_TRUE(made.peer.write(request(1, "afterwards")));
+  EXPECT_EQ(made.peer.read(reply.size()), reply);
+  _pool->stop();
+}
+
+TEST_F(OutboxTest, APeerThatNeverReadsMayStillClose) {
+  auto made = open([](Connection& connection, Frame&) {
+    connection.outbox()->send(response(1, Value(std::string(256U << 10U, 'r'))));
+  });
+  ASSERT_TRUE(made.peer.write(repeated(request(1, "call"), 20)));
+  ASSERT_TRUE(eventually([&] { return made.connection->outbox()->pending() > (1U << 20U); }));
+  made.peer.close();
+  ASSERT_TRUE(made.delegate->waitForInvalidation());
+  EXPECT_EQ(made.delegate->frameCount(), 20U) << "what had arrived is carried out";
+}
+
+TEST_F(OutboxTest, WritesWhileItsConnectionIsBusy) {
+  Counter entered;
+  Counter release;
+  auto made = open([&](Connection&, Frame&) {
+    entered.add();
+    release.waitFor(1);
+  });
+  ASSERT_TRUE(made.peer.write(notification("long")));
+  ASSERT_TRUE(entered.waitFor(1));
+  const Bytes sent = fill(*made.connection, 512U << 10U);
+  EXPECT_EQ(made.peer.read(sent.size()), sent);
+  EXPECT_TRUE(eventually([&] { return made.connection->outbox()->pending() == 0; }));
+  release.add();
+  _pool->stop();
+}
+
+TEST_F(OutboxTest, DropsOnlyDroppableMessagesWhole) {
+  const std::size_t limit = ConnectionLimits{}.maximumDroppable;
+  auto made = open();
+  const Bytes event = notification("event", Value(std::string(10'000, 'e')));
+  const Bytes notice = notification("notice");
+  Outbox& outbox = *made.connection->outbox();
+  Bytes expected;
+  while (outbox.send(event, Outbox::Urgency::droppable)) expected.insert(expected.end(), event.begin(), event.end());
+  EXPECT_LE(outbox.pending(), limit);
+  EXPECT_GT(outbox.pending(), limit - 2 * event.size());
+  EXPECT_TRUE(outbox.send(event));  // a reply is never dropped
+  EXPECT_FALSE(outbox.send(event, Outbox::Urgency::droppable));
+  EXPECT_TRUE(outbox.send(notice));
+  expected = std::move(expected) + event + notice;
+  EXPECT_EQ(made.peer.read(expected.size()), expected);
+  EXPECT_TRUE(outbox.send(event, Outbox::Urgency::droppable));
+  EXPECT_EQ(made.peer.read(event.size()), event);
+  EXPECT_FALSE(made.peer.hasBytes());
+}
+
+TEST_F(OutboxTest, MessagesOfManyThreadsStayWholeAndInOrder) {
+  constexpr int kThreads = 6;
+  constexpr int kMessages = 400;
+  Counter answered;
+  auto made = open([&](Connection& connection, Frame&) {
+    connection.outbox()->send(notification("answer"));
+    answered.add();
+  });
+  std::vector<std::thread> senders;
+  for (int sender = 0; sender < kThreads; ++sender) {
+    senders.emplace_back([&, sender] {
+      for (int i = 0; i < kMessages; ++i) {
+        const std::string filling(static_cast<std::size_t>((i * 37 + sender * 11) % 3000), 'a');
+        const Value parameter(platform::Array{Value(i), Value(filling)});
+        EXPECT_TRUE(made.connection->outbox()->send(notification(std::to_string(sender), parameter)));
+      }
+    });
+  }
+  std::thread caller([&] {
+    for (int i = 0; i < kMessages; ++i) EXPECT_TRUE(made.peer.write(notification("call")));
+  });
+
+  FrameDecoder decoder;
+  std::vector<std::int64_t> next(kThreads, 0);
+  int answers = 0;
+  for (int count = 0; count < (kThreads + 1) * kMessages;) {
+    FrameDecoder::Outcome outcome = decoder.next();
+    if (std::holds_alternative<FrameDecoder::NeedMore>(outcome)) {
+      const Bytes bytes = made.peer.read(1);
+      ASSERT_FALSE(bytes.empty());
+      decoder.append(bytes);
+      std::uint8_t more[4096];
+      const ssize_t size = ::recv(made.peer.fd(), more, sizeof more, MSG_DONTWAIT);
+      if (size > 0) decoder.append({more, static_cast<std::size_t>(size)});
+      continue;
+    }
+    ASSERT_TRUE(std::holds_alternative<Frame>(outcome));
+    const Frame& frame = std::get<Frame>(outcome);
+    ++count;
+    if (frame.method == "answer") {
+      ++answers;
+      continue;
+    }
+    const auto sender = static_cast<std::size_t>(std::stoi(frame.method));
+    const platform::Array& content = *frame.params.at(0).array();
+    ASSERT_EQ(content.at(0).integerValue(), next.at(sender)++);
+  }
+  EXPECT_EQ(answers, kMessages);
+  for (auto& sender : senders) sender.join();
+  caller.join();
+  _pool->stop();
+}
+
+TEST_F(OutboxTest, CancelGivesThePeerTimeToTakeWhatWaits) {
+  auto made = open();
+  const Bytes sent = fill(*made.connection, 700U << 10U);
+  made.connection->cancel(kHangGuard);
+  onQueueOf(*made.connection, [] {});
+  EXPECT_EQ(made.delegate->invalidations(), 0);
+  EXPECT_EQ(made.peer.readToEnd(), sent);
+  EXPECT_TRUE(made.delegate->waitForInvalidation());
+}
+
+TEST_F(OutboxTest, CancelDoesNotWaitForeverForAPeerThatReadsNothing) {
+  auto made = open();
+  fill(*made.connection, 700U << 10U);
+  made.connection->cancel(20ms);
+  EXPECT_TRUE(made.delegate->waitForInvalidation());
+  EXPECT_EQ(made.connection->outbox()->pending(), 0U);
+}
+
+TEST_F(OutboxTest, LeavesNoDescriptorBehindAfterBackPressure) {
+  const std::size_t before = openDescriptors();
+  {
+    auto read = open();
+    auto unread = open();
+    const Bytes sent = fill(*read.connection, 700U << 10U);
+    fill(*unread.connection, 700U << 10U);
+    EXPECT_EQ(read.peer.read(sent.size()), sent);
+    // While nothing waits a connection is one descriptor; with the peers' ends that makes five.
+    EXPECT_TRUE(eventually([&] { return openDescriptors() == before + 5; }));
+    read.peer.close();
+    unread.peer.close();
+    ASSERT_TRUE(read.delegate->waitForInvalidation());
+    ASSERT_TRUE(unread.delegate->waitForInvalidation());
+  }
+  EXPECT_TRUE(eventually([&] { return openDescriptors() == before; }));
+}
+
+// A pipe whose reading end is passed along and whose content tells it from others.
+UniqueFd readableWith(int number) {
+  int ends[2] = {-1, -1};
+  EXPECT_EQ(::pipe(ends), 0);
+  const UniqueFd writing(ends[1]);
+  EXPECT_EQ(::write(writing.get(), &number, sizeof number), static_cast<ssize_t>(sizeof number));
+  return UniqueFd(ends[0]);
+}
+
+int contentOf(const UniqueFd& descriptor) {
+  int number = -1;
+  return descriptor && ::read(descriptor.get(), &number, sizeof number) == sizeof number ? number : -1;
+}
+
+TEST_F(OutboxTest, DescriptorsTravelWithTheirMessages) {
+  constexpr int kUploads = 100;
+  std::vector<std::pair<std::int64_t, int>> taken;  // of the receiving queue
+  auto receiver = make();
+  receiver.delegate->onFrame = [&, &connection = *receiver.connection](Frame& frame) {
+    if (frame.method != "upload") return;
+    taken.emplace_back(frame.params.at(0).integerValue(), contentOf(connection.takeDescriptor()));
+  };
+  const auto sender = Connection::create(*_pool, receiver.peer.takeSocket());
+  const auto senderDelegate = std::make_shared<RecordingDelegate>();
+  sender->resume(senderDelegate);
+  for (int i = 0; i < kUploads; ++i) {
+    EXPECT_TRUE(sender->outbox()->send(notification("event", Value(std::string(5000, 'e')))));
+    EXPECT_TRUE(sender->outbox()->sendWithDescriptor(notification("upload", Value(i)), readableWith(i)));
+    EXPECT_TRUE(sender->outbox()->send(notification("event")));
+  }
+  receiver.connection->resume(receiver.delegate);
+  ASSERT_TRUE(receiver.delegate->waitForFrames(3 * kUploads));
+  sender->cancel();
+  ASSERT_TRUE(receiver.delegate->waitForInvalidation());
+  ASSERT_EQ(taken.size(), static_cast<std::size_t>(kUploads));
+  for (int i = 0; i < kUploads; ++i) {
+    EXPECT_EQ(taken[static_cast<std::size_t>(i)], std::make_pair(std::int64_t{i}, i));
+  }
+  ASSERT_TRUE(senderDelegate->waitForInvalidation());
+  _pool->stop();
+}
+
+TEST_F(OutboxTest, ADescriptorWaitsForItsFrameToComplete) {
+  int content = -1;
+  auto made = open([&](Connection& connection, Frame&) { content = contentOf(connection.takeDescriptor()); });
+  const Bytes frame = notification("upload");
+  const UniqueFd descriptor = readableWith(42);
+  ASSERT_TRUE(made.peer.write(notification("plain")));
+  ASSERT_TRUE(made.delegate->waitForFrames(1));
+  EXPECT_EQ(content, -1);
+  ASSERT_TRUE(made.peer.writeWithDescriptors(Bytes(frame.begin(), frame.begin() + 3), {descriptor.get()}));
+  ASSERT_TRUE(made.peer.write(Bytes(frame.begin() + 3, frame.end())));
+  ASSERT_TRUE(made.delegate->waitForFrames(2));
+  EXPECT_EQ(content, 42);
+  _pool->stop();
+}
+
+TEST_F(OutboxTest, TooManyWaitingDescriptorsEndTheConnection) {
+  const std::size_t before = openDescriptors();
+  for (const bool inOneMessage : {false, true}) {
+    auto made = open();
+    const UniqueFd descriptor = readableWith(1);
+    const Bytes call = notification("takesNothing");
+    if (inOneMessage) {
+      ASSERT_TRUE(made.peer.writeWithDescriptors(call, std::vector<int>(17, descriptor.get())));
+    } else {
+      for (int i = 0; i < 16; ++i) ASSERT_TRUE(made.peer.writeWithDescriptors(call, {descriptor.get()}));
+      ASSERT_TRUE(made.delegate->waitForFrames(16));
+      EXPECT_EQ(made.delegate->invalidations(), 0);
+      ASSERT_TRUE(made.peer.writeWithDescriptors(call, {descriptor.get()}));
+    }
+    ASSERT_TRUE(made.delegate->waitForInvalidation());
+    EXPECT_TRUE(made.delegate->protocolError().has_value());
+    EXPECT_EQ(made.delegate->frameCount(), inOneMessage ? 1U : 17U);
+    EXPECT_TRUE(made.peer.atEnd());
+  }
+  EXPECT_TRUE(eventually([&] { return openDescriptors() == before; }));
+}
+
+TEST_F(OutboxTest, DescriptorsLeftOverAreClosedWithTheConnection) {
+  int ends[2] = {-1, -1};
+  ASSERT_EQ(::pipe(ends), 0);
+  const UniqueFd reading(ends[0]);
+  UniqueFd writing(ends[1]);
+  auto made = open();
+  ASSERT_TRUE(made.peer.writeWithDescriptors(notification("call"), {writing.get()}));
+  ASSERT_TRUE(made.delegate->waitForFrames(1));
+  writing.reset();
+  made.peer.close();
+  ASSERT_TRUE(made.delegate->waitForInvalidation());
+  char byte = 0;
+  EXPECT_EQ(::read(reading.get(), &byte, 1), 0);  // nobody holds the other end any more
+}
+
+}  // namespace
+}  // namespace orvanta::test

@@ -1,0 +1,272 @@
+#include "platform/UserDefaults.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <thread>
+#include <vector>
+
+#include "platform/PropertyList.h"
+#include "tests/support/LogCapture.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace platform {
+namespace {
+
+using orvanta::test::LogCapture;
+using orvanta::test::TemporaryDirectory;
+namespace fs = std::filesystem;
+
+const char* const kDomain = "com.example.test";
+
+std::string contentOf(const std::string& path) {
+  std::ifstream file(path, std::ios::binary);
+  return {std::istreambuf_iterator<char>(file), {}};
+}
+std::string plist(const std::string& entries) {
+  return "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\"><dict>" + entries + "</dict></plist>\n";
+}
+// Replaces a file as other programs do: a new inode.
+void replaceFile(const std::string& path, const std::string& content) {
+  std::ofstream(path + ".other", std::ios::binary) << content;
+  fs::rename(path + ".other", path);
+}
+
+class UserDefaultsTest : public testing::Test {
+ protected:
+  TemporaryDirectory _directory;
+  UserDefaults _defaults{_directory.path(), kDomain};
+  LogCapture _log;
+};
+
+TEST_F(UserDefaultsTest, ReadingsOfEachType) {
+  ASSERT_TRUE(_defaults.set("text", "hello"));
+  ASSERT_TRUE(_defaults.set("number", 42));
+  ASSERT_TRUE(_defaults.set("real", 0.5));
+  ASSERT_TRUE(_defaults.set("flag", true));
+  ASSERT_TRUE(_defaults.set("empty", ""));
+  UserDefaults other(_directory.path(), kDomain);
+  EXPECT_EQ(other.value("number"), Value(42));
+  EXPECT_EQ(other.text("text"), "hello");
+  EXPECT_EQ(other.text("number"), "42");
+  EXPECT_EQ(other.text("real"), "0.5");
+  EXPECT_EQ(other.text("flag"), "1");
+  EXPECT_EQ(other.text("empty"), "");
+  EXPECT_EQ(other.text("absent"), std::nullopt);
+  EXPECT_EQ(other.value("absent"), std::nullopt);
+  EXPECT_EQ(other.all().size(), 5U);
+  EXPECT_TRUE(_log.lines().empty());
+}
+
+TEST_F(UserDefaultsTest, SetSaysWhetherTheFileHadToChange) {
+  EXPECT_FALSE(*_defaults.set("key", nullptr));
+  EXPECT_FALSE(fs::exists(_defaults.path()));
+  EXPECT_TRUE(*_defaults.set("key", "a"));
+  EXPECT_FALSE(*_defaults.set("key", "a"));
+  EXPECT_TRUE(*_defaults.set("key", "b"));
+  EXPECT_TRUE(*_defaults.set("key", nullptr));
+  EXPECT_EQ(_defaults.value("key"), std::nullopt);
+  EXPECT_TRUE(_defaults.all().empty());
+}
+
+// Same size, same second, and possibly the same inode again: none of it may hide a change.
+TEST_F(UserDefaultsTest, NoticesEveryChangeByOthers) {
+  for (int i = 0; i < 200; ++i) {
+    const std::string value = std::to_string(100 + i);
+    const std::string content = plist("<key>key</key><string>" + value + "</string>");
+    if (i % 2 == 0) {
+      replaceFile(_defaults.path(), content);
+    } else {
+      std::ofstream(_defaults.path(), std::ios::binary) << content;
+    }
+    ASSERT_EQ(_defaults.text("key"), value);
+  }
+  fs::remove(_defaults.path());
+  EXPECT_EQ(_defaults.text("key"), std::nullopt);
+}
+
+TEST_F(UserDefaultsTest, WritingKeepsWhatOthersWroteMeanwhile) {
+  ASSERT_TRUE(_defaults.set("mine", 1));
+  replaceFile(_defaults.path(), plist("<key>theirs</key><string>2</string>"));
+  ASSERT_TRUE(_defaults.set("mine", 3));
+  EXPECT_EQ(_defaults.text("theirs"), "2");
+  EXPECT_EQ(_defaults.text("mine"), "3");
+}
+
+TEST_F(UserDefaultsTest, KeepsCorruptFilesAside) {
+  for (const std::string& bad : {std::string("<plist><dict><key>a</key>"), std::string(), std::string("bplist00\xff"),
+                                 std::string("<plist version=\"1.0\"><array/></plist>")}) {
+    replaceFile(_defaults.path(), bad);
+    _log.clear();
+    EXPECT_EQ(_defaults.value("a"), std::nullopt);
+    EXPECT_EQ(_defaults.value("a"), std::nullopt);
+    EXPECT_EQ(_log.count("<3>UserDefaults: " + _defaults.path() + " is no property list, kept aside as"), 1U) << bad;
+    EXPECT_EQ(contentOf(_defaults.path() + ".corrupt"), bad);
+    EXPECT_FALSE(fs::exists(_defaults.path()));
+    ASSERT_TRUE(_defaults.set("a", "new"));
+    EXPECT_EQ(_defaults.text("a"), "new");
+  }
+}
+
+TEST_F(UserDefaultsTest, NeverWritesOverWhatItCannotRead) {
+  fs::create_directory(_defaults.path());  // stands in for a file without permission, which root would be able to read
+  EXPECT_EQ(_defaults.value("key"), std::nullopt);
+  EXPECT_EQ(_defaults.value("key"), std::nullopt);
+  EXPECT_EQ(_log.count("not a regular file"), 1U);
+  const auto result = _defaults.set("key", 1);
+  ASSERT_FALSE(result);
+  EXPECT_NE(result.error().find(_defaults.path()), std::string::npos) << result.error();
+  EXPECT_TRUE(fs::is_directory(_defaults.path()));
+  EXPECT_EQ(_defaults.valueOrStore("key", [] { return Value("fresh"); }), Value("fresh"));
+  EXPECT_TRUE(_log.contains("<3>UserDefaults: the new value of key is not kept"));
+  fs::remove(_defaults.path());
+  EXPECT_TRUE(_defaults.set("key", 1));
+}
+
+TEST_F(UserDefaultsTest, AFailedWriteLeavesTheFileAsItWas) {
+  ASSERT_TRUE(_defaults.set("key", "value"));
+  const std::string before = contentOf(_defaults.path());
+  EXPECT_FALSE(_defaults.set("bad", Array{Value()})) << "a null inside has no XML form";
+  fs::create_directories(_defaults.path() + ".new/occupied");
+  EXPECT_FALSE(_defaults.set("key", "other"));
+  fs::remove_all(_defaults.path() + ".new");
+  EXPECT_EQ(contentOf(_defaults.path()), before);
+  EXPECT_EQ(_defaults.text("key"), "value");
+  UserDefaults nowhere("/proc/no/such/directory", kDomain);
+  EXPECT_FALSE(nowhere.set("key", 1));
+  EXPECT_EQ(nowhere.value("key"), std::nullopt);
+}
+
+TEST_F(UserDefaultsTest, WorksThroughASymbolicLinkAndMakesItsDirectory) {
+  const std::string real = _directory / "private/state";
+  fs::create_directories(real);
+  fs::create_symlink("private/state", _directory / "link");
+  UserDefaults linked(_directory / "link", kDomain);
+  ASSERT_TRUE(linked.set("key", "value"));
+  EXPECT_TRUE(fs::is_symlink(_directory / "link"));
+  EXPECT_EQ(UserDefaults(real, kDomain).text("key"), "value");
+  UserDefaults fresh(_directory / "not/yet/there", kDomain);
+  ASSERT_TRUE(fresh.set("key", 1));
+  EXPECT_EQ(fresh.text("key"), "1");
+}
+
+TEST_F(UserDefaultsTest, KeepsTheModeOfAFileAndMakesNewOnesPrivate) {
+  struct stat status {};
+  ASSERT_TRUE(_defaults.set("key", 1));
+  ASSERT_EQ(::stat(_defaults.path().c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 07777U, 0600U);
+  ::chmod(_defaults.path().c_str(), 0640);
+  ASSERT_TRUE(_defaults.set("key", 2));
+  ASSERT_EQ(::stat(_defaults.path().c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 07777U, 0640U);
+}
+
+// Runs `body` in `count` child processes; true when all ended with status 0.
+template <class Body>
+bool inProcesses(int count, Body body) {
+  std::vector<pid_t> children;
+  for (int i = 0; i < count; ++i) {
+    const pid_t child = ::fork();
+    if (child == 0) ::_exit(body(i) ? 0 : 1);
+    children.push_back(child);
+  }
+  bool ok = true;
+  for (const pid_t child : children) {
+    int status = 0;
+    ok = ::waitpid(child, &status, 0) == child && WIFEXITED(status) && WEXITSTATUS(status) == 0 && ok;
+  }
+  return ok;
+}
+
+TEST_F(UserDefaultsTest, WritersInSeveralProcessesLoseNothing) {
+  constexpr int kProcesses = 4;
+  constexpr int kWrites = 25;
+  ASSERT_TRUE(inProcesses(kProcesses, [&](int process) {
+    UserDefaults defaults(_directory.path(), kDomain);
+    bool ok = true;
+    for (int i = 0; i < kWrites; ++i) {
+      ok = defaults.set(std::to_string(process) + "/" + std::to_string(i), i).ok() && ok;
+    }
+    return ok;
+  }));
+  EXPECT_EQ(_defaults.all().size(), std::size_t{kProcesses * kWrites});
+}
+
+TEST_F(UserDefaultsTest, OneStoredValueWinsInAllProcessesAndThreads) {
+  for (int round = 0; round < 10; ++round) {
+    const std::string key = "identifier" + std::to_string(round);
+    ASSERT_TRUE(inProcesses(3, [&](int process) {
+      std::vector<std::thread> threads;
+      std::vector<Value> values(2);
+      UserDefaults defaults(_directory.path(), kDomain);
+      for (std::size_t i = 0; i < values.size(); ++i) {
+        threads.emplace_back([&, i] {
+          values[i] = defaults.valueOrStore(key, [&] { return Value(process * 10 + static_cast<int>(i)); });
+        });
+      }
+      for (auto& thread : threads) thread.join();
+      return values[0] == values[1] && UserDefaults(_directory.path(), kDomain).value(key) == values[0];
+    }));
+  }
+}
+
+// A writer killed at any moment leaves a whole file, and no lock or temporary file that stops the next writer.
+TEST_F(UserDefaultsTest, AKilledWriterLeavesAWholeFile) {
+  ASSERT_TRUE(_defaults.set("padding", std::string(20000, 'x')));
+  ASSERT_TRUE(_defaults.set("count", 0));
+  std::int64_t last = 0;
+  for (int round = 0; round < 40; ++round) {
+    int started[2];
+    ASSERT_EQ(::pipe2(started, O_CLOEXEC), 0);
+    const pid_t child = ::fork();
+    if (child == 0) {
+      UserDefaults defaults(_directory.path(), kDomain);
+      for (std::int64_t i = last + 1;; ++i) {
+        if (!defaults.set("count", i)) ::_exit(1);
+        const char byte = 'x';
+        if (::write(started[1], &byte, 1) != 1) ::_exit(1);
+      }
+    }
+    ::close(started[1]);
+    // A few writes, then the axe: where it falls differs from round to round.
+    char bytes[8];
+    ASSERT_GT(::read(started[0], bytes, 1 + static_cast<std::size_t>(round) % 7), 0);
+    ::kill(child, SIGKILL);
+    int status = 0;
+    ASSERT_EQ(::waitpid(child, &status, 0), child);
+    EXPECT_TRUE(WIFSIGNALED(status));
+    ::close(started[0]);
+    const auto content = readPropertyListFile(_defaults.path());
+    ASSERT_TRUE(content) << content.error();
+    const auto count = _defaults.value("count");
+    ASSERT_TRUE(count);
+    EXPECT_GT(count->integerValue(), last);
+    last = count->integerValue();
+    EXPECT_EQ(_defaults.text("padding")->size(), 20000U);
+  }
+  EXPECT_TRUE(_log.lines().empty());
+}
+
+TEST_F(UserDefaultsTest, ThreadsOfOneObject) {
+  std::vector<std::thread> threads;
+  for (int i = 0; i < 4; ++i) {
+    threads.emplace_back([&, i] {
+      for (int n = 0; n < 20; ++n) {
+        EXPECT_TRUE(_defaults.set(std::to_string(i) + "." + std::to_string(n), n));
+        EXPECT_TRUE(_defaults.value(std::to_string(i) + "." + std::to_string(n)));
+      }
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  EXPECT_EQ(_defaults.all().size(), 80U);
+}
+
+}  // namespace
+}  // namespace platform

@@ -1,0 +1,165 @@
+#include "tests/support/ChildProcess.h"
+
+#include <fcntl.h>
+#include <signal.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstring>
+#include <stdexcept>
+
+extern char** environ;
+
+namespace orvanta::test {
+
+namespace {
+
+struct Pipe {
+  platform::UniqueFd read, write;
+  Pipe() {
+    int fds[2];
+    if (::pipe2(fds, O_CLOEXEC) != 0) throw std::runtime_error("pipe failed");
+    read.reset(fds[0]);
+    write.reset(fds[1]);
+  }
+};
+
+std::vector<std::string> mergedEnvironment(const std::map<std::string, std::string>& additions) {
+  std::vector<std::string> merged;
+  for (char** entry = environ; *entry != nullptr; ++entry) {
+    const std::string text = *entry;
+    if (additions.count(text.substr(0, text.find('='))) == 0) merged.push_back(text);
+  }
+  for (const auto& [name, value] : additions) merged.push_back(name + "=" + value);
+  return merged;
+}
+
+std::vector<char*> pointersTo(std::vector<std::string>& texts) {
+  std::vector<char*> pointers;
+  for (auto& text : texts) pointers.push_back(text.data());
+  pointers.push_back(nullptr);
+  return pointers;
+}
+
+}  // namespace
+
+ChildProcess::ChildProcess(Options options) {
+  Pipe input, output, error;
+  posix_spawn_file_actions_t actions;
+  ::posix_spawn_file_actions_init(&actions);
+  ::posix_spawn_file_actions_adddup2(&actions, input.read.get(), STDIN_FILENO);
+  if (options.keepOutput) ::posix_spawn_file_actions_adddup2(&actions, output.write.get(), STDOUT_FILENO);
+  ::posix_spawn_file_actions_adddup2(&actions, error.write.get(), STDERR_FILENO);
+
+  std::vector<std::string> arguments{options.program};
+  arguments.insert(arguments.end(), options.arguments.begin(), options.arguments.end());
+  auto environment = mergedEnvironment(options.environment);
+  const int failed = ::posix_spawn(&_pid, options.program.c_str(), &actions, nullptr, pointersTo(arguments).data(),
+                                   pointersTo(environment).data());
+  ::posix_spawn_file_actions_destroy(&actions);
+  if (failed != 0) throw std::runtime_error("cannot start " + options.program + ": " + std::strerror(failed));
+
+  _error = std::move(error.read);
+  _output = std::move(output.read);
+  error.write.reset();
+  output.write.reset();
+  _errorReader = std::thread([this] { read(_error.get(), true); });
+  _outputReader = std::thread([this] { read(_output.get(), false); });
+  _inputWriter = std::thread([fd = std::move(input.write), text = std::move(options.input)] {
+    std::string_view rest = text;
+    while (!rest.empty()) {
+      const ssize_t written = ::write(fd.get(), rest.data(), rest.size());
+      if (written <= 0) return;
+      rest.remove_prefix(static_cast<std::size_t>(written));
+    }
+  });
+}
+
+ChildProcess::~ChildProcess() {
+  if (!_status) {
+    ::kill(_pid, SIGKILL);
+    wait();
+  }
+}
+
+void ChildProcess::read(int fd, bool isError) {
+  std::string partial;
+  char buffer[65536];
+  for (;;) {
+    const ssize_t length = ::read(fd, buffer, sizeof buffer);
+    if (length < 0 && errno == EINTR) continue;
+    if (length <= 0) break;
+    const std::lock_guard lock(_mutex);
+    if (!isError) {
+      _outputText.append(buffer, static_cast<std::size_t>(length));
+      continue;
+    }
+    partial.append(buffer, static_cast<std::size_t>(length));
+    for (std::size_t end; (end = partial.find('\n')) != std::string::npos; partial.erase(0, end + 1)) {
+      _lines.push_back(partial.substr(0, end));
+    }
+    _changed.notify_all();
+  }
+  const std::lock_guard lock(_mutex);
+  if (isError) {
+    if (!partial.empty()) _lines.push_back(partial);
+    _errorEnded = true;
+    _changed.notify_all();
+  }
+}
+
+bool ChildProcess::waitForLine(const std::string& text, std::size_t wanted) {
+  std::unique_lock lock(_mutex);
+  std::size_t scanned = 0, found = 0;
+  const auto enough = [&] {
+    for (; scanned < _lines.size(); ++scanned) {
+      if (_lines[scanned].find(text) != std::string::npos) ++found;
+    }
+    return found >= wanted;
+  };
+  _changed.wait_for(lock, kPatience, [&] { return enough() || _errorEnded; });
+  return enough();
+}
+
+std::vector<std::string> ChildProcess::lines() const {
+  const std::lock_guard lock(_mutex);
+  return _lines;
+}
+
+std::size_t ChildProcess::count(const std::string& text) const {
+  const std::lock_guard lock(_mutex);
+  return static_cast<std::size_t>(std::count_if(
+      _lines.begin(), _lines.end(), [&](const auto& line) { return line.find(text) != std::string::npos; }));
+}
+
+std::string ChildProcess::allLines() const {
+  std::string all;
+  for (const auto& line : lines()) all += line + "\n";
+  return all;
+}
+
+std::string ChildProcess::output() {
+  wait();
+  const std::lock_guard lock(_mutex);
+  return _outputText;
+}
+
+void ChildProcess::signal(int number) {
+  ::kill(_pid, number);
+}
+
+int ChildProcess::wait() {
+  if (_status) return *_status;
+  int status = 0;
+  while (::waitpid(_pid, &status, 0) < 0 && errno == EINTR) {
+  }
+  _status = WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
+  for (auto* thread : {&_errorReader, &_outputReader, &_inputWriter}) {
+    if (thread->joinable()) thread->join();
+  }
+  return *_status;
+}
+
+}  // namespace orvanta::test

@@ -1,0 +1,106 @@
+#include "tests/support/DaemonProcess.h"
+
+#include <unistd.h>
+
+#include <csignal>
+#include <filesystem>
+#include <fstream>
+#include <thread>
+
+#include "platform/Connect.h"
+#include "platform/PropertyList.h"
+
+namespace orvanta::test {
+
+namespace fs = std::filesystem;
+using platform::Dictionary;
+
+DaemonProcess::DaemonProcess(Options options) {
+  const auto plist = [this](const std::string& name, const Dictionary& content) {
+    _directory.write(name, *platform::writeXmlPropertyList(content));
+  };
+  for (const char* name : {"run", "state", "etc", "framework", "plugins"}) fs::create_directories(_directory / name);
+  fs::create_directories(_directory / "framework/sandbox");
+  fs::copy_file(std::string(ORVANTA_SOURCE_DIR) + "/packaging/share/orvanta/sandbox/com.kovalt.orvantad.plist",
+                _directory / "framework/sandbox/com.kovalt.orvantad.plist");
+  plist("framework/framework.plist", {{"version", options.version}});
+  if (!options.publicKey.empty()) {
+    _directory.write("framework/publicKey.der",
+                     {reinterpret_cast<const char*>(options.publicKey.data()), options.publicKey.size()});
+  }
+  if (options.entitled) {
+    plist("etc/entitlements.d/test.plist",
+          {{"user", std::to_string(::getuid())}, {"entitlements", Dictionary{{"com.kovalt.private.orvantad", true}}}});
+  }
+  plist("etc/device.plist", options.device);
+  Dictionary defaults = options.defaults;
+  if (!options.storebagURL.empty()) defaults.set("orvanta_storebag_url", options.storebagURL);
+  plist("state/com.kovalt.orvanta.plist", defaults);
+
+  _environment = {{"RUNTIME_DIRECTORY", runtimeDirectory()},
+                  {"STATE_DIRECTORY", stateDirectory()},
+                  {"CONFIGURATION_DIRECTORY", configurationDirectory()},
+                  {"ORVANTA_FRAMEWORK", _directory / "framework"},
+                  {"ORVANTA_PLUGINS", _directory / "plugins"},
+                  {"ORVANTA_LOG", "stderr"},
+                  {"ORVANTA_LOG_LEVEL", options.logLevel},
+                  {"ORVANTA_CA_FILE", options.caFile}};
+  if (!options.sandbox) _environment["ORVANTA_SANDBOX"] = "off";
+  // LeakSanitizer cannot work inside the sandbox; with it off, leaks are looked for.
+  _environment["ASAN_OPTIONS"] = options.sandbox ? "detect_leaks=0" : "detect_leaks=1";
+  for (const auto& [name, value] : options.environment) _environment[name] = value;
+}
+
+void DaemonProcess::launch() {
+  ChildProcess::Options options;
+  options.program = programPath("orvantad");
+  options.environment = _environment;
+  _process = std::make_unique<ChildProcess>(std::move(options));
+}
+
+bool DaemonProcess::start() {
+  launch();
+  return _process->waitForLine("main: Listener resumes with sandbox, start loop.");
+}
+
+bool DaemonProcess::startQuietly() {
+  launch();
+  return settles([this] { return platform::connectToService(runtimeDirectory(), "com.kovalt.orvantad") ? 0U : 1U; }, 0);
+}
+
+int DaemonProcess::terminate() {
+  _process->signal(SIGTERM);
+  return _process->wait();
+}
+
+std::size_t DaemonProcess::descriptorCount() const {
+  const auto entries = fs::directory_iterator("/proc/" + std::to_string(_process->pid()) + "/fd");
+  return static_cast<std::size_t>(std::distance(fs::begin(entries), fs::end(entries)));
+}
+
+std::size_t DaemonProcess::threadCount() const {
+  const auto entries = fs::directory_iterator("/proc/" + std::to_string(_process->pid()) + "/task");
+  return static_cast<std::size_t>(std::distance(fs::begin(entries), fs::end(entries)));
+}
+
+std::size_t DaemonProcess::residentKiB() const {
+  std::ifstream status("/proc/" + std::to_string(_process->pid()) + "/statm");
+  std::size_t total = 0, resident = 0;
+  status >> total >> resident;
+  return resident * static_cast<std::size_t>(::sysconf(_SC_PAGESIZE)) / 1024;
+}
+
+bool DaemonProcess::settles(const std::function<std::size_t()>& counter, std::size_t limit) const {
+  const auto deadline = std::chrono::steady_clock::now() + ChildProcess::kPatience;
+  while (counter() > limit) {
+    if (std::chrono::steady_clock::now() > deadline) return false;
+    std::this_thread::yield();
+  }
+  return true;
+}
+
+std::string DaemonProcess::programPath(const std::string& name) {
+  return std::string(ORVANTA_BIN_DIR) + "/" + name;
+}
+
+}  // namespace orvanta::test

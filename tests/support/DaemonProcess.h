@@ -1,0 +1,72 @@
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/Value.h"
+#include "tests/support/ChildProcess.h"
+#include "tests/support/TemporaryDirectory.h"
+
+namespace orvanta::test {
+
+// The real orvantad with directories of its own, its log in memory. The current user is entitled unless a test says
+// otherwise, the sandbox is on.
+class DaemonProcess {
+ public:
+  struct Options {
+    std::string storebagURL;              // the user default; empty: none
+    std::vector<std::uint8_t> publicKey;  // DER; empty: no key file
+    std::string caFile;                   // ORVANTA_CA_FILE
+    platform::Dictionary device;          // device.plist
+    platform::Dictionary defaults;        // further user defaults
+    bool entitled = true;
+    bool sandbox = true;
+    std::string version = "8.0.0";
+    std::string logLevel = "7";
+    std::map<std::string, std::string> environment;
+  };
+
+  explicit DaemonProcess(Options options);
+
+  // Starts the program (again) and waits until it listens; false when it ended instead.
+  bool start();
+  // The same for log levels at which it does not say that it listens: waits for its socket instead.
+  bool startQuietly();
+  // SIGTERM; the exit status.
+  int terminate();
+
+  ChildProcess& process() { return *_process; }
+  // Shorthands on the log.
+  bool logged(const std::string& text, std::size_t count = 1) { return _process->waitForLine(text, count); }
+  std::size_t count(const std::string& text) const { return _process->count(text); }
+
+  std::string runtimeDirectory() const { return _directory / "run"; }
+  std::string stateDirectory() const { return _directory / "state"; }
+  std::string configurationDirectory() const { return _directory / "etc"; }
+  std::string socketPath() const { return runtimeDirectory() + "/com.kovalt.orvantad"; }
+  std::map<std::string, std::string> environment() const { return _environment; }
+
+  // Open descriptors and threads of the daemon now, and its resident memory in KiB.
+  std::size_t descriptorCount() const;
+  std::size_t threadCount() const;
+  std::size_t residentKiB() const;
+  // Counts until `counter` gives at most `limit`; false when it never does.
+  bool settles(const std::function<std::size_t()>& counter, std::size_t limit) const;
+
+  // The build's programs.
+  static std::string programPath(const std::string& name);
+
+ private:
+  void launch();
+
+  TemporaryDirectory _directory;
+  std::map<std::string, std::string> _environment;
+  std::unique_ptr<ChildProcess> _process;
+};
+
+}  // namespace orvanta::test

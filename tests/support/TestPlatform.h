@@ -1,0 +1,112 @@
+#pragma once
+
+#include <chrono>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/Platform.h"
+#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/TestClock.h"
+
+namespace orvanta::test {
+
+// A device whose every answer a test sets. Set before threads ask.
+struct TestDevice final : platform::DeviceProperties {
+  std::optional<std::string> udid = "0123456789abcdef0123456789abcdef01234567";
+  std::optional<std::string> version = "12.5", build = "12F5", model = "Model7,1", serial = "SN0001";
+  std::optional<std::string> type = "Parva3,2", name = "Parva", release, country = "DE";
+  std::optional<bool> automatic = true;
+  bool consent = false;
+  int offset = 3600;
+
+  std::optional<std::string> uniqueDeviceID() const override { return udid; }
+  std::optional<std::string> productVersion() const override { return version; }
+  std::optional<std::string> buildVersion() const override { return build; }
+  std::optional<std::string> hardwareModel() const override { return model; }
+  std::optional<std::string> serialNumber() const override { return serial; }
+  std::optional<std::string> productType() const override { return type; }
+  std::optional<std::string> deviceName() const override { return name; }
+  std::optional<std::string> releaseType() const override { return release; }
+  std::optional<std::string> countryCode() const override { return country; }
+  std::optional<bool> automaticTimeZone() const override { return automatic; }
+  bool diagnosticsSubmissionAllowed() const override { return consent; }
+  int timeZoneOffset(double) const override { return offset; }
+};
+
+// An HTTP client without a network: gathers requests, answers each from a script or when a test says so. Completions
+// run on the calling thread. Thread-safe.
+class ScriptedHttpClient final : public platform::HttpClient {
+ public:
+  struct Taken {
+    platform::HttpRequest request;
+    platform::UniqueFunction<void(const platform::HttpResult&)> observe;
+    Completion completion;
+  };
+  // The answer to requests that nobody holds; default 200 with an empty body. May be called on several threads at once.
+  std::function<platform::HttpResult(const platform::HttpRequest&)> answer;
+  // While true, started requests wait in `held` for finishHeld().
+  bool hold = false;
+
+  std::shared_ptr<platform::HttpLane> makeLane(LaneKind kind) override;
+  void start(const std::shared_ptr<platform::HttpLane>& lane, platform::HttpRequest request,
+             platform::UniqueFunction<void(const platform::HttpResult&)> observe, Completion completion) override;
+  platform::HttpResult perform(const std::shared_ptr<platform::HttpLane>& lane, platform::HttpRequest request) override;
+  void abortBlockingRequests() override {}
+  void shutdown(std::chrono::milliseconds) override {}
+
+  // Every request so far, in order, held ones included.
+  std::vector<platform::HttpRequest> requests() const;
+  void clear();
+  // Ends the oldest held request with `result`; false when none waits.
+  bool finishHeld(platform::HttpResult result);
+
+  static platform::HttpResult status(int code, std::string body = {});
+
+ private:
+  platform::HttpResult answerFor(const platform::HttpRequest& request);
+  mutable std::mutex _mutex;
+  std::vector<platform::HttpRequest> _requests;  // guarded by _mutex
+  std::vector<Taken> _held;                      // guarded by _mutex
+};
+
+struct RecordedPowerLog final : platform::PowerLog {
+  struct Record {
+    std::int32_t event;
+    std::string sender;
+    platform::Dictionary record;
+  };
+  void registeredEvent(std::int32_t event, std::string_view sender, const platform::Dictionary& record) override {
+    const std::lock_guard lock(mutex);
+    records.push_back({event, std::string(sender), record});
+  }
+  std::mutex mutex;
+  std::vector<Record> records;  // guarded by mutex
+};
+
+// A platform over the parts above, with its files in a directory of its own. The pool is started with two threads.
+class TestPlatform {
+ public:
+  TestPlatform();
+  ~TestPlatform();
+
+  platform::Platform& get() { return *_platform; }
+  operator platform::Platform&() { return *_platform; }  // NOLINT(google-explicit-constructor): stands for the platform
+
+  TemporaryDirectory directory;
+
+ private:
+  std::unique_ptr<platform::Platform> _platform;
+
+ public:
+  // Parts of the platform.
+  TestClock& clock;
+  TestDevice& device;
+  ScriptedHttpClient& http;
+  RecordedPowerLog& powerLog;
+};
+
+}  // namespace orvanta::test

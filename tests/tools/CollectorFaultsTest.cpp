@@ -1,0 +1,169 @@
+#include <gmock/gmock.h>
+
+#include <future>
+
+#include "tests/tools/CollectorFixture.h"
+#include "tools/collector/Transport.h"
+
+namespace orvanta::collector {
+namespace {
+
+using platform::Dictionary;
+
+const std::string kPost = R"({"events":[{"n":1}]})";
+
+class CollectorFaultsTest : public CollectorFixture {
+ protected:
+  // One POST of events over a fresh connection: all bytes until the collector closes, or what kept them from coming.
+  std::string rawAnswer(const std::string& path) const {
+    const auto stream = Transport::connectLoopback(collector->httpPort());
+    stream->write("POST " + path + " HTTP/1.1\r\nConnection: close\r\nContent-Length: " + std::to_string(kPost.size()) +
+                  "\r\n\r\n" + kPost);
+    std::string answer;
+    std::array<char, 4096> piece{};
+    while (const std::size_t count = stream->read(piece.data(), piece.size())) answer.append(piece.data(), count);
+    if (errno == ECONNRESET) answer += "[reset]";
+    return answer;
+  }
+  int control(const std::string& path, const std::string& json) const { return post(path, json)->status; }
+};
+
+TEST_F(CollectorFaultsTest, AnswersAnotherStatusForSoManyTimes) {
+  collector->setStatus("/events", 503, 2);
+  EXPECT_EQ(post("/events", kPost)->status, 503);
+  EXPECT_EQ(post("/events/realtime", kPost)->status, 200);
+  EXPECT_EQ(post("/events", kPost)->status, 503);
+  EXPECT_EQ(post("/events", kPost)->status, 200);
+  EXPECT_EQ(collector->events()[0].status, 503) << "recorded all the same";
+}
+
+TEST_F(CollectorFaultsTest, TakesTheExactPathBeforeTheLongestBeginning) {
+  collector->setStatus("*", 500);
+  collector->setStatus("/events*", 501);
+  collector->setStatus("/events/re*", 502);
+  collector->setStatus("/events/realtime", 503);
+  EXPECT_EQ(post("/x", kPost)->status, 500);
+  EXPECT_EQ(post("/events", kPost)->status, 501);
+  EXPECT_EQ(post("/events/rest", kPost)->status, 502);
+  EXPECT_EQ(post("/events/realtime", kPost)->status, 503);
+  EXPECT_EQ(http().Get("/control")->status, 200) << "the collector's own pages stay usable";
+  collector->clearBehaviours();
+  EXPECT_EQ(post("/x", kPost)->status, 200);
+}
+
+TEST_F(CollectorFaultsTest, BreaksAnswersAsAsked) {
+  const std::string usual = rawAnswer("/events");
+  ASSERT_THAT(usual, testing::EndsWith("{\"accepted\":1}\n"));
+  collector->setFault("/events", ConnectionFault::reset);
+  errno = 0;
+  EXPECT_EQ(rawAnswer("/events"), "[reset]");
+  errno = 0;
+  collector->setFault("/events", ConnectionFault::truncate);
+  const std::string truncated = rawAnswer("/events");
+  EXPECT_THAT(truncated, testing::EndsWith("\r\n\r\n{\"accep"));
+  EXPECT_THAT(truncated, testing::HasSubstr("Content-Length: 15\r\n"));
+  collector->setFault("/events", ConnectionFault::corrupt);
+  const std::string corrupt = rawAnswer("/events");
+  ASSERT_EQ(corrupt.size(), usual.size());
+  std::size_t differing = 0;
+  for (std::size_t i = 0; i < usual.size(); ++i) differing += usual[i] != corrupt[i] ? 1U : 0U;
+  EXPECT_EQ(differing, 1U);
+  collector->setFault("/events", ConnectionFault::garbage);
+  EXPECT_THAT(rawAnswer("/events"), testing::Not(testing::StartsWith("HTTP")));
+  const auto requests = collector->requests();
+  ASSERT_EQ(requests.size(), 5U);
+  EXPECT_EQ(requests[1].note, "reset");
+  EXPECT_EQ(requests[1].status, 0);
+  EXPECT_EQ(requests[2].note, "truncate");
+}
+
+TEST_F(CollectorFaultsTest, BreaksAnswersOverTlsToo) {
+  for (const auto fault : {ConnectionFault::reset, ConnectionFault::truncate, ConnectionFault::garbage}) {
+    collector->setFault("/events", fault);
+    EXPECT_FALSE(https()->Post("/events", kPost, "application/json")) << connectionFaultText(fault);
+  }
+  collector->clearBehaviours();
+  EXPECT_TRUE(https()->Post("/events", kPost, "application/json"));
+}
+
+TEST_F(CollectorFaultsTest, StaysSilentUntilTheClientOrTheCollectorEnds) {
+  collector->setFault("/events", ConnectionFault::silent);
+  auto impatient = http();
+  impatient.set_read_timeout(std::chrono::milliseconds(50));
+  EXPECT_FALSE(impatient.Post("/events", kPost, "application/json"));
+
+  auto waiting = std::async(std::launch::async, [this] { return static_cast<bool>(post("/events", kPost)); });
+  ASSERT_TRUE(collector->waitForRequests(2, kPatience));
+  EXPECT_EQ(http().Get("/requests")->status, 200) << "others are served meanwhile";
+  collector->stop();
+  EXPECT_FALSE(waiting.get());
+}
+
+TEST_F(CollectorFaultsTest, DelaysAnAnswerWhileOthersGoAhead) {
+  PathBehaviour behaviour;
+  behaviour.delay = std::chrono::milliseconds(300);
+  collector->setBehaviour("/events", behaviour);
+  const auto before = std::chrono::steady_clock::now();
+  auto delayed = std::async(std::launch::async, [this] { return post("/events", kPost)->status; });
+  ASSERT_TRUE(collector->waitForRequests(1, kPatience));
+  EXPECT_EQ(post("/elsewhere", kPost)->status, 200);
+  EXPECT_EQ(delayed.get(), 200);
+  EXPECT_GE(std::chrono::steady_clock::now() - before, behaviour.delay);
+}
+
+TEST_F(CollectorFaultsTest, RedirectsWithHeadersAsAsked) {
+  ASSERT_EQ(control("/control/paths", R"({"path":"/old","status":307,"headers":{"Location":"/new"},"body":"moved"})"),
+            200);
+  const auto answer = post("/old", kPost);
+  EXPECT_EQ(answer->status, 307);
+  EXPECT_EQ(answer->get_header_value("Location"), "/new");
+  EXPECT_EQ(answer->body, "moved");
+}
+
+TEST_F(CollectorFaultsTest, RefusesSettingsThatItDoesNotKnow) {
+  const std::vector<std::pair<const char*, const char*>> table{
+      {"/control/paths", "{"},
+      {"/control/paths", "[]"},
+      {"/control/paths", R"({"status":503})"},
+      {"/control/paths", R"({"path":"events"})"},
+      {"/control/paths", R"({"path":"/events","statu":503})"},
+      {"/control/paths", R"({"path":"/events","status":"503"})"},
+      {"/control/paths", R"({"path":"/events","status":99})"},
+      {"/control/paths", R"({"path":"/events","fault":"meteor"})"},
+      {"/control/paths", R"({"path":"/events","times":0})"},
+      {"/control/paths", R"({"path":"/events","headers":{"A":"b\r\nC: d"}})"},
+      {"/control/acknowledgements", R"({"lossPercent":101})"},
+      {"/control/acknowledgements", R"({"loss":10})"},
+      {"/control/acknowledgements", R"({"acknowledge":1})"},
+      {"/control/storebag", R"({"container":"json"})"},
+      {"/control/storebag", R"({"maxAge":"60"})"},
+  };
+  for (const auto& [path, json] : table) {
+    const auto answer = post(path, json);
+    EXPECT_EQ(answer->status, 400) << path << " " << json;
+    EXPECT_THAT(answer->body, testing::HasSubstr("\"error\"")) << json;
+  }
+  EXPECT_EQ(post("/control/unknown", "{}")->status, 404);
+  EXPECT_EQ(http().Put("/control/bag", "[1]", "application/json")->status, 400);
+  EXPECT_EQ(at(list("/control"), "paths"), Dictionary{});
+  EXPECT_TRUE(collector->requests().empty()) << "settings are not recorded";
+}
+
+TEST_F(CollectorFaultsTest, ShowsAndClearsSettings) {
+  ASSERT_EQ(control("/control/paths", R"({"path":"/events","status":503,"times":3,"delayMs":5,"fault":"corrupt"})"),
+            200);
+  ASSERT_EQ(control("/control/acknowledgements", R"({"lossPercent":30,"duplicates":2})"), 200);
+  ASSERT_EQ(control("/control/storebag", R"({"container":"binary","maxAge":null})"), 200);
+  const auto state = list("/control");
+  EXPECT_EQ(at(at(state, "paths"), "/events"),
+            (Dictionary{{"status", 503}, {"times", 3}, {"delayMs", 5}, {"fault", "corrupt"}}));
+  EXPECT_EQ(at(at(state, "acknowledgements"), "lossPercent"), 30);
+  EXPECT_EQ(at(at(state, "storebag"), "container"), "binary");
+  EXPECT_TRUE(at(at(state, "storebag"), "maxAge").isNull());
+  EXPECT_EQ(http().Delete("/control/paths?path=/other")->status, 404);
+  EXPECT_EQ(http().Delete("/control/paths?path=/events")->status, 200);
+  EXPECT_EQ(at(list("/control"), "paths"), Dictionary{});
+}
+
+}  // namespace
+}  // namespace orvanta::collector

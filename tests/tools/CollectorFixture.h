@@ -1,0 +1,68 @@
+#pragma once
+
+#include <gtest/gtest.h>
+#include <httplib.h>
+
+#include <chrono>
+#include <memory>
+#include <string>
+#include <utility>
+
+#include "platform/Json.h"
+#include "tests/support/TemporaryDirectory.h"
+#include "tools/collector/Collector.h"
+
+namespace orvanta::collector {
+
+// A collector in a directory of its own, and HTTP clients for it.
+class CollectorFixture : public testing::Test {
+ protected:
+  static constexpr std::chrono::seconds kPatience{30};
+
+  void SetUp() override { start({}); }
+  void start(CollectorOptions options) {
+    collector.reset();
+    options.directory = directory.path();
+    auto started = Collector::start(std::move(options));
+    ASSERT_TRUE(started) << started.error();
+    collector = std::move(*started);
+  }
+
+  httplib::Client http() const { return patient(httplib::Client("127.0.0.1", collector->httpPort())); }
+  std::unique_ptr<httplib::SSLClient> https() const {
+    auto client = std::make_unique<httplib::SSLClient>("localhost", collector->httpsPort());
+    client->set_ca_cert_path(collector->caFile().c_str());
+    client->enable_server_certificate_verification(true);
+    client->set_read_timeout(kPatience);
+    return client;
+  }
+  httplib::Result post(const std::string& path, const std::string& body) const {
+    return http().Post(path, body, "application/json");
+  }
+  platform::Value list(const std::string& path) const {
+    const auto answer = http().Get(path);
+    EXPECT_TRUE(answer && answer->status == 200) << path << (answer ? ": " + answer->body : "");
+    auto parsed = platform::parseJson(answer ? answer->body : "null");
+    EXPECT_TRUE(parsed) << parsed.error();
+    return parsed ? std::move(parsed.value()) : platform::Value();
+  }
+  // The entry of a dictionary, which must be there.
+  static const platform::Value& at(const platform::Value& value, const std::string& key) {
+    const platform::Value* found = value.dictionary() != nullptr ? value.dictionary()->find(key) : nullptr;
+    if (found == nullptr) throw std::out_of_range("no \"" + key + "\" in " + value.description());
+    return *found;
+  }
+  static const platform::Value& at(const platform::Value& value, std::size_t index) { return value.array()->at(index); }
+
+  test::TemporaryDirectory directory;
+  std::unique_ptr<Collector> collector;
+
+ private:
+  static httplib::Client patient(httplib::Client client) {
+    client.set_read_timeout(kPatience);
+    client.set_tcp_nodelay(true);
+    return client;
+  }
+};
+
+}  // namespace orvanta::collector

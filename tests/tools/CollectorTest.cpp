@@ -1,0 +1,270 @@
+#include "tools/collector/Collector.h"
+
+#include <gmock/gmock.h>
+
+#include <filesystem>
+#include <future>
+#include <vector>
+
+#include "platform/PropertyList.h"
+#include "tests/tools/CollectorFixture.h"
+#include "tools/collector/Transport.h"
+#include "util/Compression.h"
+
+namespace orvanta::collector {
+namespace {
+
+using platform::Array;
+using platform::Dictionary;
+using testing::ElementsAre;
+using testing::Pair;
+
+class CollectorTest : public CollectorFixture {
+ protected:
+  // Sends bytes as they are and reads until the collector closes.
+  std::string converse(const std::string& bytes) const {
+    const auto stream = Transport::connectLoopback(collector->httpPort());
+    EXPECT_TRUE(stream->write(bytes));
+    std::string answer;
+    std::array<char, 4096> piece{};
+    while (const std::size_t count = stream->read(piece.data(), piece.size())) answer.append(piece.data(), count);
+    return answer;
+  }
+};
+
+TEST_F(CollectorTest, RecordsAPostWithItsHeadersInTheirOrder) {
+  const std::string answer = converse(
+      "POST /events?x=1 HTTP/1.1\r\nZebra: 1\r\nHost: here\r\nX-ORV-Sender: ZK\r\nAlpha:  two words \r\nEmpty:\r\n"
+      "X-ORV-Sender: again\r\nConnection: close\r\nContent-Length: 27\r\n\r\n{\"events\":[{\"_method\":300}]}");
+  EXPECT_THAT(answer, testing::StartsWith("HTTP/1.1 400 ")) << "27 bytes cut the JSON short";
+  const auto requests = collector->requests();
+  ASSERT_EQ(requests.size(), 1U);
+  EXPECT_THAT(requests[0].headers,
+              ElementsAre(Pair("Zebra", "1"), Pair("Host", "here"), Pair("X-ORV-Sender", "ZK"),
+                          Pair("Alpha", "two words"), Pair("Empty", ""), Pair("X-ORV-Sender", "again"),
+                          Pair("Connection", "close"), Pair("Content-Length", "27")));
+  EXPECT_EQ(requests[0].target, "/events?x=1");
+  EXPECT_EQ(requests[0].path, "/events");
+  EXPECT_EQ(requests[0].status, 400);
+  EXPECT_THAT(requests[0].note, testing::HasSubstr("no JSON"));
+  EXPECT_TRUE(collector->events().empty());
+}
+
+TEST_F(CollectorTest, StoresEventsOfPlainAndCompressedPostsInOrder) {
+  ASSERT_EQ(
+      post("/events", R"({"postTime":1.5,"clientId":"c","events":[{"_method":3,"d":0.25},{"_method":4}]})")->status,
+      200);
+  const std::string body = R"({"events":[{"_method":5,"text":"é\n"}]})";
+  const auto compressed = gzipDeflate(body);
+  ASSERT_TRUE(compressed);
+  const auto answer =
+      https()->Post("/events/realtime", {{"Content-Encoding", "gzip"}}, *compressed, "application/json");
+  ASSERT_TRUE(answer) << httplib::to_string(answer.error());
+  EXPECT_EQ(answer->body, "{\"accepted\":1}\n");
+
+  ASSERT_TRUE(collector->waitForEvents(3, kPatience));
+  const auto events = collector->events();
+  ASSERT_EQ(events.size(), 3U);
+  EXPECT_EQ(events[0].event, (Dictionary{{"_method", 3}, {"d", 0.25}}));
+  EXPECT_EQ(events[1].position, 1);
+  EXPECT_EQ(events[2].event, (Dictionary{{"_method", 5}, {"text", "é\n"}}));
+  EXPECT_EQ(events[2].path, "/events/realtime");
+  EXPECT_TRUE(events[2].secure);
+  const auto requests = collector->requests(RequestKind::events);
+  ASSERT_EQ(requests.size(), 2U);
+  EXPECT_FALSE(requests[0].secure);
+  EXPECT_EQ(requests[1].rawBody, *compressed);
+  EXPECT_EQ(requests[1].body, body);
+}
+
+TEST_F(CollectorTest, TakesChunkedAndPipelinedRequests) {
+  const std::string answer = converse(
+      "POST /events HTTP/1.1\r\nTransfer-Encoding: chunked\r\n\r\nd;ext=1\r\n{\"events\":[{}\r\n2\r\n]}\r\n0\r\nT: "
+      "1\r\n\r\n"
+      "POST /events HTTP/1.1\r\nContent-Length: 13\r\n\r\n{\"events\":[]}"
+      "POST /events HTTP/1.0\r\nContent-Length: 15\r\n\r\n{\"events\":[{}]}");
+  std::size_t answers = 0;
+  for (auto at = answer.find("HTTP/1.1 200 OK"); at != std::string::npos; at = answer.find("HTTP/1.1 200 OK", at + 1))
+    ++answers;
+  EXPECT_EQ(answers, 3U) << answer;
+  EXPECT_EQ(collector->events().size(), 2U);
+}
+
+TEST_F(CollectorTest, RefusesWhatIsNoHttpAndWhatIsTooLong) {
+  CollectorOptions options;
+  options.maximumBodyBytes = 1000;
+  start(std::move(options));
+  const std::vector<std::pair<std::string, std::string>> table{
+      {"\r\n\r\n", "HTTP/1.1 400 "},
+      {"GET /x HTTP/3\r\n\r\n", "HTTP/1.1 400 "},
+      {"GET /x HTTP/1.1\r\nno colon\r\n\r\n", "HTTP/1.1 400 "},
+      {"POST /events HTTP/1.1\r\nContent-Length: x\r\n\r\n", "HTTP/1.1 400 "},
+      {"POST /events HTTP/1.1\r\nContent-Length: 1\r\nContent-Length: 2\r\n\r\nab", "HTTP/1.1 400 "},
+      {"POST /events HTTP/1.1\r\nTransfer-Encoding: chunked\r\n\r\nzz\r\n", "HTTP/1.1 400 "},
+      {"POST /events HTTP/1.1\r\nTransfer-Encoding: chunked\r\n\r\nfffffffffffffff0\r\n", "HTTP/1.1 400 "},
+      {"GET /" + std::string(70'000, 'a'), "HTTP/1.1 431 "},
+  };
+  for (const auto& [bytes, expected] : table) {
+    const auto stream = Transport::connectLoopback(collector->httpPort());
+    ASSERT_TRUE(stream->write(bytes));
+    stream->finish();
+    std::array<char, 64> answer{};
+    const std::size_t count = stream->read(answer.data(), answer.size());
+    EXPECT_THAT(std::string(answer.data(), count), testing::StartsWith(expected)) << bytes.substr(0, 100);
+  }
+  EXPECT_EQ(post("/events", std::string(1001, ' '))->status, 413);
+}
+
+TEST_F(CollectorTest, RefusesDamagedAndBoundlessCompression) {
+  CollectorOptions options;
+  options.maximumBodyBytes = 10'000;
+  start(std::move(options));
+  const auto postCompressed = [&](const std::string& body) {
+    return http().Post("/events", {{"Content-Encoding", "gzip"}}, body, "application/json")->status;
+  };
+  const std::string good = *gzipDeflate(R"({"events":[]})");
+  EXPECT_EQ(postCompressed(good), 200);
+  EXPECT_EQ(postCompressed(good.substr(0, good.size() - 3)), 400);
+  EXPECT_EQ(postCompressed(good + "x"), 400);
+  EXPECT_EQ(postCompressed("no gzip"), 400);
+  EXPECT_EQ(postCompressed(*gzipDeflate(std::string(1'000'000, ' '))), 400);
+  EXPECT_THAT(collector->requests().back().note, testing::HasSubstr("inflates to more than"));
+}
+
+TEST_F(CollectorTest, ListsWhatItReceivedAsJson) {
+  ASSERT_TRUE(http().Post("/events", {{"B", "1"}, {"A", "2"}}, R"({"events":[{"n":1},{"n":2}]})", "application/json"));
+  ASSERT_TRUE(post("/other", "no json"));
+  const auto requests = list("/requests");
+  ASSERT_EQ(at(requests, "requests").array()->size(), 2U);
+  const auto& first = at(at(requests, "requests"), 0);
+  EXPECT_EQ(at(first, "json"), (Dictionary{{"events", Array{Dictionary{{"n", 1}}, Dictionary{{"n", 2}}}}}));
+  EXPECT_EQ(at(at(at(requests, "requests"), 1), "text"), "no json");
+  EXPECT_EQ(at(list("/requests?since=1&path=/other"), "requests").array()->size(), 1U);
+  EXPECT_EQ(at(list("/requests?kind=upload"), "requests").array()->size(), 0U);
+  EXPECT_EQ(at(at(at(list("/events?since=1"), "events"), 0), "event"), (Dictionary{{"n", 2}}));
+  EXPECT_EQ(http().Get("/requests/1/body")->body, R"({"events":[{"n":1},{"n":2}]})");
+  EXPECT_EQ(http().Get("/requests/99")->status, 404);
+  EXPECT_EQ(http().Get("/requests?sinze=1")->status, 400);
+  EXPECT_EQ(http().Get("/requests?since=-1")->status, 400);
+  EXPECT_EQ(http().Get("/nowhere")->status, 404);
+  EXPECT_EQ(http().Delete("/requests")->status, 204);
+  EXPECT_EQ(at(list("/"), "events"), 0);
+}
+
+TEST_F(CollectorTest, KeepsUploadsAndLogData) {
+  const std::string file = "line\nwith \0 zero\n";
+  const auto answer = https()->Post(
+      "/upload?uuid=D&sequence=7&description=Parlix%20AFRC%20log%20(Uploaded%20by%20HQX)&filename="
+      "a%20b.log.gz&raw=true",
+      {{"Content-Encoding", "gzip"}}, *gzipDeflate(file), "application/octet-stream");
+  ASSERT_TRUE(answer);
+  EXPECT_THAT(answer->body, testing::HasSubstr("success"));
+  const auto uploads = list("/uploads");
+  const auto& upload = at(at(uploads, "uploads"), 0);
+  EXPECT_EQ(at(upload, "filename"), "a b.log.gz");
+  EXPECT_EQ(at(upload, "description"), "Parlix AFRC log (Uploaded by HQX)");
+  EXPECT_EQ(at(upload, "sequence"), "7");
+  EXPECT_EQ(http().Get(*at(upload, "fileURL").string())->body, file);
+
+  const auto archive = platform::writeBinaryPropertyList(Dictionary{{"root", Array{"one", 2}}});
+  ASSERT_TRUE(archive);
+  const auto location =
+      http().Post("/logdata", std::string(archive->begin(), archive->end()), "application/octet-stream");
+  ASSERT_TRUE(location);
+  ASSERT_THAT(location->body, testing::StartsWith(collector->httpURL("/logdata/")));
+  EXPECT_EQ(http().Get(location->body.substr(collector->httpURL().size()))->body,
+            std::string(archive->begin(), archive->end()));
+  const auto logData = list("/logdata");
+  EXPECT_EQ(at(at(at(logData, "logdata"), 0), "archive"), (Dictionary{{"root", Array{"one", 2}}}));
+}
+
+TEST_F(CollectorTest, ServesManyConnectionsAtOnceAndManyPostsOnEach) {
+  constexpr int kClients = 40;
+  constexpr int kPosts = 25;
+  std::vector<std::future<int>> clients;
+  for (int i = 0; i < kClients; ++i) {
+    clients.push_back(std::async(std::launch::async, [this, i] {
+      auto client = http();
+      client.set_keep_alive(true);
+      int accepted = 0;
+      for (int n = 0; n < kPosts; ++n) {
+        const std::string body =
+            R"({"events":[{"client":)" + std::to_string(i) + R"(,"n":)" + std::to_string(n) + "}]}";
+        const auto answer = client.Post("/events", body, "application/json");
+        accepted += answer && answer->status == 200 ? 1 : 0;
+      }
+      return accepted;
+    }));
+  }
+  for (auto& client : clients) EXPECT_EQ(client.get(), kPosts);
+  std::vector<std::int64_t> next(kClients, 0);
+  for (const auto& event : collector->events()) {
+    auto& expected = next.at(static_cast<std::size_t>(event.event.find("client")->integerValue()));
+    EXPECT_EQ(event.event.find("n")->integerValue(), expected++);
+  }
+  EXPECT_THAT(next, testing::Each(kPosts));
+}
+
+TEST_F(CollectorTest, KeepsItsIdentityAndItsRecordsAcrossStarts) {
+  ASSERT_TRUE(post("/events", R"({"events":[{"n":1}]})"));
+  const auto key = http().Get("/publicKey.der")->body;
+  const auto authority = http().Get("/ca.pem")->body;
+  const std::int64_t exchange = collector->requests()[0].exchange;
+  start({});
+  EXPECT_EQ(http().Get("/publicKey.der")->body, key);
+  EXPECT_EQ(http().Get("/ca.pem")->body, authority);
+  ASSERT_EQ(collector->events().size(), 1U);
+  ASSERT_TRUE(post("/events", R"({"events":[{"n":2}]})"));
+  ASSERT_EQ(collector->events().size(), 2U);
+  EXPECT_GT(collector->requests()[1].exchange, exchange);
+  EXPECT_EQ(std::filesystem::status(directory / "ca-key.pem").permissions(),
+            std::filesystem::perms::owner_read | std::filesystem::perms::owner_write);
+}
+
+TEST_F(CollectorTest, ShowsEachFlawOfItsCertificateAndNoOther) {
+  // What a verifying client sees; the unflawed one is used by the tests above.
+  for (const auto flaw : {CertificateFlaw::wrongHost, CertificateFlaw::expired, CertificateFlaw::selfSigned}) {
+    CollectorOptions options;
+    options.certificateFlaw = flaw;
+    start(std::move(options));
+    const auto client = https();
+    const auto answer = client->Post("/events", R"({"events":[]})", "application/json");
+    EXPECT_FALSE(answer);
+    const long verified = client->get_openssl_verify_result();
+    switch (flaw) {
+      case CertificateFlaw::expired:
+        EXPECT_EQ(verified, X509_V_ERR_CERT_HAS_EXPIRED);
+        break;
+      case CertificateFlaw::selfSigned:
+        EXPECT_EQ(verified, X509_V_ERR_DEPTH_ZERO_SELF_SIGNED_CERT);
+        break;
+      default:
+        EXPECT_EQ(verified, X509_V_OK) << "the chain is fine, the name is not";
+    }
+    EXPECT_TRUE(collector->requests().empty());
+    client->enable_server_certificate_verification(false);
+    EXPECT_TRUE(client->Post("/events", R"({"events":[]})", "application/json"));
+    collector->clear();
+  }
+}
+
+TEST_F(CollectorTest, SaysWhyItCannotStart) {
+  CollectorOptions taken;
+  taken.directory = directory / "second";
+  taken.httpPort = collector->httpPort();
+  const auto second = Collector::start(std::move(taken));
+  ASSERT_FALSE(second);
+  EXPECT_THAT(second.error(), testing::HasSubstr("cannot use TCP port " + std::to_string(collector->httpPort())));
+  CollectorOptions broken;
+  broken.directory = directory.write("file", "") + "/below";
+  EXPECT_FALSE(Collector::start(std::move(broken)));
+  CollectorOptions damaged;
+  damaged.directory = directory / "third";
+  directory.write("third/storebag-key.pem", "no key");
+  const auto third = Collector::start(std::move(damaged));
+  ASSERT_FALSE(third);
+  EXPECT_THAT(third.error(), testing::HasSubstr("storebag-key.pem"));
+}
+
+}  // namespace
+}  // namespace orvanta::collector

@@ -1,0 +1,170 @@
+#include "tools/collector/DashboardServer.h"
+
+#include <arpa/inet.h>
+#include <gmock/gmock.h>
+#include <poll.h>
+#include <sys/socket.h>
+
+#include <string>
+
+#include "backends/DashboardDatagram.h"
+#include "tests/tools/CollectorFixture.h"
+#include "tools/collector/Sockets.h"
+
+namespace orvanta::collector {
+namespace {
+
+using platform::Dictionary;
+
+// A daemon's side: an unconnected socket, so that forged acknowledgements from elsewhere show too.
+class DashboardServerTest : public CollectorFixture {
+ protected:
+  struct Acknowledgement {
+    std::uint16_t port = 0;  // of the sender
+    std::string bytes;
+  };
+
+  void SetUp() override {
+    CollectorFixture::SetUp();
+    auto bound = bindSocket(SOCK_DGRAM, "127.0.0.1", 0);
+    ASSERT_TRUE(bound) << bound.error();
+    _socket = std::move(bound->socket);
+  }
+  static std::string datagram(std::uint16_t eventNumber, bool reliable = true) {
+    const Dictionary payload{{"a", "q"}, {"b", "x=y"}};
+    DashboardSender sender;
+    sender.versionMajor = 8;
+    sender.clientType = 5;
+    sender.sessionID = 7;
+    sender.clientVersion = 3;
+    sender.deviceID = "device";
+    sender.mode = reliable ? 1 : 0;
+    const auto bytes = encodeDashboardDatagram(sender, {&payload, {123, 4999}, 300, 2, eventNumber});
+    return {bytes.begin(), bytes.end()};
+  }
+  void send(const std::string& bytes) const {
+    sockaddr_in to{};
+    to.sin_family = AF_INET;
+    to.sin_port = htons(collector->dashboardPort());
+    to.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    ASSERT_EQ(::sendto(_socket.get(), bytes.data(), bytes.size(), 0, reinterpret_cast<sockaddr*>(&to), sizeof to),
+              static_cast<ssize_t>(bytes.size()));
+  }
+  // The next acknowledgement; one without bytes when none comes.
+  Acknowledgement receive() const {
+    pollfd waiting{_socket.get(), POLLIN, 0};
+    const auto patience = std::chrono::duration_cast<std::chrono::milliseconds>(kPatience).count();
+    if (::poll(&waiting, 1, static_cast<int>(patience)) <= 0) return {};
+    std::array<char, 2048> buffer{};
+    sockaddr_in from{};
+    socklen_t size = sizeof from;
+    const ssize_t count =
+        ::recvfrom(_socket.get(), buffer.data(), buffer.size(), 0, reinterpret_cast<sockaddr*>(&from), &size);
+    return {ntohs(from.sin_port), std::string(buffer.data(), static_cast<std::size_t>(std::max<ssize_t>(count, 0)))};
+  }
+  // Whether nothing waits to be read.
+  bool quiet() const {
+    pollfd waiting{_socket.get(), POLLIN, 0};
+    return ::poll(&waiting, 1, 0) == 0;
+  }
+
+ private:
+  platform::UniqueFd _socket;
+};
+
+TEST_F(DashboardServerTest, DecodesAndAcknowledges) {
+  const std::string sent = datagram(513);
+  send(sent);
+  const auto answer = receive();
+  EXPECT_EQ(answer.port, collector->dashboardPort());
+  EXPECT_EQ(answer.bytes, sent.substr(0, 64));
+  ASSERT_TRUE(collector->waitForDatagrams(1, kPatience));
+  const auto received = collector->datagrams()[0];
+  EXPECT_TRUE(received.wellFormed);
+  EXPECT_EQ(received.bytes, sent);
+  EXPECT_EQ(received.eventNumber, 513);
+  EXPECT_EQ(received.sessionID, 7U);
+  EXPECT_EQ(received.method, 300);
+  EXPECT_EQ(received.milliseconds, 4);
+  EXPECT_EQ(received.deviceID, "device");
+  EXPECT_EQ(received.acknowledgements, 1);
+  const auto datagrams = list("/datagrams");
+  const auto& listed = at(at(datagrams, "datagrams"), 0);
+  EXPECT_EQ(at(listed, "values"), (Dictionary{{"a", "q"}, {"b", "x=y"}}));
+  EXPECT_EQ(at(listed, "reliable"), true);
+}
+
+TEST_F(DashboardServerTest, AcknowledgesOnlyWhatAsksForIt) {
+  send(datagram(1, false));
+  send("short");
+  send(datagram(2).substr(0, 64));  // tells a longer length
+  send(datagram(3));
+  EXPECT_EQ(receive().bytes, datagram(3).substr(0, 64));
+  EXPECT_TRUE(quiet());
+  ASSERT_TRUE(collector->waitForDatagrams(4, kPatience));
+  const auto received = collector->datagrams();
+  EXPECT_TRUE(received[0].wellFormed);
+  EXPECT_FALSE(received[1].wellFormed);
+  EXPECT_EQ(received[1].bytes, "short");
+  EXPECT_FALSE(received[2].wellFormed);
+}
+
+TEST_F(DashboardServerTest, ForgesAndRepeatsAsAsked) {
+  AcknowledgementSettings settings;
+  settings.duplicates = 1;
+  settings.unknownNumbers = 1;
+  settings.tooShort = 1;
+  settings.foreign = 1;
+  collector->setAcknowledgements(settings);
+  const std::string right = datagram(9).substr(0, 64);
+  send(datagram(9));
+  std::vector<std::string> fromServer;
+  std::vector<std::string> fromElsewhere;
+  for (int i = 0; i < 5; ++i) {
+    const auto answer = receive();
+    (answer.port == collector->dashboardPort() ? fromServer : fromElsewhere).push_back(answer.bytes);
+  }
+  EXPECT_TRUE(quiet());
+  EXPECT_THAT(fromElsewhere, testing::ElementsAre(right));
+  ASSERT_EQ(fromServer.size(), 4U);
+  EXPECT_EQ(fromServer[0].size(), 64U);
+  EXPECT_NE(fromServer[0].substr(60, 2), right.substr(60, 2));
+  EXPECT_EQ(fromServer[1].size(), 61U);
+  EXPECT_EQ(fromServer[2], right);
+  EXPECT_EQ(fromServer[3], right);
+}
+
+TEST_F(DashboardServerTest, LosesAShareAndCanBeSwitchedOff) {
+  AcknowledgementSettings settings;
+  settings.lossPercent = 30;
+  collector->setAcknowledgements(settings);
+  for (std::uint16_t i = 0; i < 200; ++i) send(datagram(i));
+  ASSERT_TRUE(collector->waitForDatagrams(200, kPatience));
+  std::int64_t acknowledged = 0;
+  for (const auto& received : collector->datagrams()) acknowledged += received.acknowledgements;
+  EXPECT_GT(acknowledged, 110);
+  EXPECT_LT(acknowledged, 170);
+  for (std::int64_t i = 0; i < acknowledged; ++i) EXPECT_EQ(receive().bytes.size(), 64U);
+  EXPECT_TRUE(quiet());
+
+  settings = {};
+  settings.acknowledge = false;
+  collector->setAcknowledgements(settings);
+  send(datagram(500));
+  ASSERT_TRUE(collector->waitForDatagrams(201, kPatience));
+  EXPECT_EQ(collector->datagrams().back().acknowledgements, 0);
+}
+
+TEST_F(DashboardServerTest, DelaysAcknowledgements) {
+  AcknowledgementSettings settings;
+  settings.delay = std::chrono::milliseconds(200);
+  collector->setAcknowledgements(settings);
+  const auto before = std::chrono::steady_clock::now();
+  send(datagram(1));
+  ASSERT_TRUE(collector->waitForDatagrams(1, kPatience));
+  EXPECT_EQ(receive().bytes.size(), 64U);
+  EXPECT_GE(std::chrono::steady_clock::now() - before, settings.delay);
+}
+
+}  // namespace
+}  // namespace orvanta::collector

@@ -1,0 +1,36 @@
+#include <cstdio>
+#include <memory>
+#include <thread>
+
+// Does what the build's sanitizer is there to find: a test expects its report, so that a build in which the sanitizer
+// has gone missing is noticed.
+
+namespace {
+
+int gShared = 0;  // NOLINT(cppcoreguidelines-avoid-non-const-global-variables): written by two threads on purpose
+
+void useAfterFree() {
+  auto owner = std::make_unique<int>(1);
+  const volatile int* kept = owner.get();
+  owner.reset();
+  std::printf("%d\n", *kept);
+}
+
+void race() {
+  std::thread other([] { ++gShared; });
+  ++gShared;
+  other.join();
+  std::printf("%d\n", gShared);
+}
+
+}  // namespace
+
+int main() {
+#ifdef __SANITIZE_THREAD__
+  race();
+#else
+  useAfterFree();
+  race();
+#endif
+  return 0;
+}

@@ -1,0 +1,132 @@
+#include <gmock/gmock.h>
+
+#include <csignal>
+#include <filesystem>
+
+#include "platform/Json.h"
+#include "tests/support/ChildProcess.h"
+#include "tests/support/DaemonProcess.h"
+#include "tests/support/TemporaryDirectory.h"
+#include "tools/storebag/StorebagFile.h"
+
+// The programs orvanta-storebag and orvanta-collector, as a user starts them.
+
+namespace orvanta {
+namespace {
+
+using test::ChildProcess;
+using test::DaemonProcess;
+using test::TemporaryDirectory;
+using testing::HasSubstr;
+
+struct Outcome {
+  int status = 0;
+  std::string output;
+  std::string errors;
+};
+
+Outcome run(const std::string& program, std::vector<std::string> arguments) {
+  ChildProcess::Options options;
+  options.program = DaemonProcess::programPath(program);
+  options.arguments = std::move(arguments);
+  options.keepOutput = true;
+  ChildProcess process(std::move(options));
+  const int status = process.wait();
+  return {status, process.output(), process.allLines()};
+}
+
+TEST(StorebagProgramTest, SignsVerifiesAndShows) {
+  const TemporaryDirectory directory;
+  const std::string bag = directory.write("bag.json", R"({"version":"7","release":{"http_post":{"clients":[]}}})");
+  const std::string key = directory / "key.pem";
+  const std::string publicKey = directory / "publicKey.der";
+  const std::string document = directory / "bag.storebag";
+  ASSERT_EQ(run("orvanta-storebag", {"make-key", key, "-o", publicKey}).status, 0);
+  ASSERT_EQ(run("orvanta-storebag", {"sign", bag, "-k", key, "-o", document, "--container", "binary"}).status, 0);
+  const auto verified = run("orvanta-storebag", {"verify", document, "-k", publicKey});
+  EXPECT_EQ(verified.status, 0);
+  EXPECT_THAT(verified.output, HasSubstr("good signature, version 7"));
+  const auto shown = platform::parseJson(run("orvanta-storebag", {"show", document}).output);
+  EXPECT_EQ(shown.value(), platform::parseJson(R"({"version":"7","release":{"http_post":{"clients":[]}}})").value());
+  EXPECT_THAT(run("orvanta-storebag", {"show", document, "--xml"}).output, HasSubstr("<plist version=\"1.0\">"));
+
+  const std::string sameKey = directory / "again.der";
+  ASSERT_EQ(run("orvanta-storebag", {"make-key", key, "-o", sameKey, "--layout", "pkcs1"}).status, 0);
+  EXPECT_EQ(run("orvanta-storebag", {"verify", document, "-k", sameKey}).status, 0);
+  const std::string otherKey = directory / "other.der";
+  ASSERT_EQ(run("orvanta-storebag", {"make-key", directory / "other.pem", "-o", otherKey}).status, 0);
+  const auto refused = run("orvanta-storebag", {"verify", document, "-k", otherKey});
+  EXPECT_EQ(refused.status, 1);
+  EXPECT_THAT(refused.errors, HasSubstr("not that key's"));
+}
+
+TEST(StorebagProgramTest, SaysWhatIsWrong) {
+  const TemporaryDirectory directory;
+  const std::string key = directory / "key.pem";
+  ASSERT_EQ(run("orvanta-storebag", {"make-key", key, "-o", directory / "publicKey.der"}).status, 0);
+  const std::string broken = directory.write("broken.json", "{");
+  const std::string list = directory.write("list.plist", "<plist version=\"1.0\"><array/></plist>");
+  const std::string good = directory.write("good.json", "{}");
+  const std::string noBag = directory.write("no-bag.plist", "<plist version=\"1.0\"><dict/></plist>");
+  const std::vector<std::pair<std::vector<std::string>, std::string>> table{
+      {{"sign", directory / "none.json", "-k", key}, "none.json"},
+      {{"sign", broken, "-k", key}, "broken.json"},
+      {{"sign", list, "-k", key}, "must be a dictionary"},
+      {{"sign", good, "-k", good}, "no private key"},
+      {{"sign", good, "-k", key, "-o", directory / "no/such/place"}, "cannot write"},
+      {{"show", noBag}, "no \"signature\""},
+      {{"show", good}, "no property list"},
+      {{"verify", good, "-k", good}, "no property list"},
+  };
+  for (const auto& [arguments, expected] : table) {
+    const auto outcome = run("orvanta-storebag", arguments);
+    EXPECT_EQ(outcome.status, 1) << arguments[0];
+    EXPECT_THAT(outcome.errors, HasSubstr(expected));
+  }
+  EXPECT_NE(run("orvanta-storebag", {"sign", good, "-k", key, "--container", "json"}).status, 0);
+  EXPECT_NE(run("orvanta-storebag", {}).status, 0);
+}
+
+TEST(StorebagFileTest, RefusesDamagedDocuments) {
+  const auto open = [](const std::string& body) {
+    const std::string text = "<plist version=\"1.0\"><dict>" + body + "</dict></plist>";
+    return openStorebag({reinterpret_cast<const std::uint8_t*>(text.data()), text.size()});
+  };
+  const std::string signature = "<key>signature</key><string>AAAA</string>";
+  EXPECT_FALSE(open(signature));
+  EXPECT_FALSE(open(signature + "<key>bag</key><integer>1</integer>"));
+  EXPECT_FALSE(open(signature + "<key>bag</key><string>A</string>"));
+  EXPECT_FALSE(open(signature + "<key>bag</key><string>AAAA</string>"));
+  EXPECT_TRUE(open(signature + "<key>bag</key><string>PHBsaXN0PjxkaWN0Lz48L3BsaXN0Pg==</string>"));
+}
+
+TEST(CollectorProgramTest, TellsItsPlacesAndEndsOnSigterm) {
+  const TemporaryDirectory directory;
+  ChildProcess::Options options;
+  // Its line on standard output is read while it runs.
+  options.program = "/bin/sh";
+  options.arguments = {"-c", "exec \"$0\" --directory \"$1\" --any-ports 1>&2",
+                       DaemonProcess::programPath("orvanta-collector"), directory / "data"};
+  ChildProcess process(std::move(options));
+  ASSERT_TRUE(process.waitForLine("\"storebagURL\"")) << process.allLines();
+  const auto ready = platform::parseJson(process.lines().back());
+  ASSERT_TRUE(ready) << ready.error();
+  for (const char* key : {"caFile", "publicKeyFile", "databaseFile"}) {
+    EXPECT_TRUE(std::filesystem::is_regular_file(*ready->dictionary()->find(key)->string())) << key;
+  }
+  EXPECT_GT(ready->dictionary()->find("dashboardPort")->integerValue(), 0);
+  process.signal(SIGTERM);
+  EXPECT_EQ(process.wait(), 0) << process.allLines();
+}
+
+TEST(CollectorProgramTest, SaysWhyItCannotStart) {
+  const TemporaryDirectory directory;
+  const auto outcome = run("orvanta-collector", {"--directory", directory.write("file", "") + "/below", "--any-ports"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_THAT(outcome.errors, HasSubstr("cannot make"));
+  EXPECT_NE(run("orvanta-collector", {"--address", "nowhere", "--directory", directory.path()}).status, 0);
+  EXPECT_NE(run("orvanta-collector", {"--http-port", "70000"}).status, 0);
+}
+
+}  // namespace
+}  // namespace orvanta

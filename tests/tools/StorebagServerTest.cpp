@@ -1,0 +1,141 @@
+#include "tools/collector/StorebagServer.h"
+
+#include <gmock/gmock.h>
+
+#include <filesystem>
+#include <fstream>
+
+#include "platform/Digest.h"
+#include "platform/PropertyList.h"
+#include "tests/tools/CollectorFixture.h"
+#include "tools/collector/HttpMessage.h"
+
+namespace orvanta::collector {
+namespace {
+
+using platform::Array;
+using platform::Dictionary;
+using platform::Value;
+
+class StorebagServerTest : public CollectorFixture {
+ protected:
+  httplib::Result get(const std::string& name, httplib::Headers headers = {}) const {
+    return http().Get("/storebags/" + name + "?version=8.0", headers);
+  }
+  // The inner bag of a document, whose signature must be right by the daemon's own check under that key file.
+  static Value verified(const std::string& document, const std::string& keyFile) {
+    const auto content = openStorebag({reinterpret_cast<const std::uint8_t*>(document.data()), document.size()});
+    if (!content) {
+      ADD_FAILURE() << content.error();
+      return {};
+    }
+    const auto der = readFile(keyFile);
+    const auto key = platform::RsaPublicKey::fromDer(*der);
+    EXPECT_TRUE(key && key->verifySha1(platform::sha1(content->bag), content->signature));
+    return content->inner;
+  }
+  void setFileTime(const std::string& path, std::int64_t secondsSince1970) const {
+    const auto age = std::chrono::system_clock::now() -
+                     std::chrono::system_clock::time_point(std::chrono::seconds(secondsSince1970));
+    std::filesystem::last_write_time(path, std::filesystem::file_time_type::clock::now() - age);
+  }
+};
+
+TEST_F(StorebagServerTest, SignsTheDefaultBagWithItsPlacesFilledIn) {
+  const auto answer = get("quillon");
+  ASSERT_EQ(answer->status, 200);
+  EXPECT_EQ(answer->get_header_value("Cache-Control"), "max-age=3600");
+  const Value inner = verified(answer->body, collector->publicKeyFile());
+  for (const char* environment : {"development", "kovalt_internal", "seed", "release"}) {
+    const Value& clients = at(at(at(inner, environment), "http_post"), "clients");
+    for (std::size_t i = 0; i < clients.array()->size(); ++i) {
+      EXPECT_EQ(at(at(clients, i), "post_url"), collector->eventsURL()) << environment;
+    }
+  }
+  EXPECT_EQ(at(at(at(inner, "development"), "dashboard"), "port"), Value(int{collector->dashboardPort()}));
+  EXPECT_THAT(answer->body, testing::Not(testing::HasSubstr("${")));
+  EXPECT_EQ(verified(get("anything.else-1")->body, collector->publicKeyPkcs1File()), inner);
+}
+
+TEST_F(StorebagServerTest, ServesEveryCombinationOfForms) {
+  for (const auto container : {PropertyListForm::xml, PropertyListForm::binary}) {
+    for (const auto bag : {PropertyListForm::xml, PropertyListForm::binary}) {
+      StorebagSettings settings;
+      settings.container = container;
+      settings.bag = bag;
+      collector->setStorebagSettings(settings);
+      collector->setSection({{"http_post", Dictionary{{"clients", Array{}}}}});
+      const std::string document = get("x")->body;
+      EXPECT_EQ(document.starts_with("bplist00"), container == PropertyListForm::binary);
+      const auto content = openStorebag({reinterpret_cast<const std::uint8_t*>(document.data()), document.size()});
+      ASSERT_TRUE(content) << content.error();
+      EXPECT_EQ(std::string(content->bag.begin(), content->bag.begin() + 8) == "bplist00",
+                bag == PropertyListForm::binary);
+      EXPECT_EQ(at(verified(document, collector->publicKeyFile()), "version"), "test");
+    }
+  }
+}
+
+TEST_F(StorebagServerTest, AnswersNotModifiedByTheFilesTime) {
+  const std::string file = directory / "storebag.json";
+  setFileTime(file, 1'700'000'000);
+  const auto first = get("x");
+  EXPECT_EQ(first->get_header_value("Last-Modified"), "Tue, 14 Nov 2023 22:13:20 GMT");
+  const auto since = [&](const std::string& date) { return get("x", {{"If-Modified-Since", date}}); };
+  const auto unchanged = since("Tue, 14 Nov 2023 22:13:20 GMT");
+  EXPECT_EQ(unchanged->status, 304);
+  EXPECT_EQ(unchanged->body, "");
+  EXPECT_EQ(unchanged->get_header_value("Last-Modified"), "Tue, 14 Nov 2023 22:13:20 GMT");
+  EXPECT_EQ(unchanged->get_header_value("Cache-Control"), "max-age=3600");
+  EXPECT_EQ(since("Tue, 14 Nov 2023 22:13:19 GMT")->status, 200);
+  EXPECT_EQ(since("yesterday")->status, 200);
+  // Changed twice within the second that HTTP can tell apart.
+  setFileTime(file, 1'700'000'100);
+  const auto second = get("x")->get_header_value("Last-Modified");
+  std::filesystem::last_write_time(file, std::filesystem::last_write_time(file) + std::chrono::milliseconds(1));
+  const auto changed = since(second);
+  EXPECT_EQ(changed->status, 200);
+  EXPECT_NE(changed->get_header_value("Last-Modified"), second);
+}
+
+TEST_F(StorebagServerTest, PrefersTheBagsOwnFile) {
+  const auto plist = platform::writeXmlPropertyList(Dictionary{{"version", "plist"}});
+  directory.write("confluo.plist", *plist);
+  directory.write("brindle.json", R"({"version":"json"})");
+  EXPECT_EQ(at(verified(get("confluo")->body, collector->publicKeyFile()), "version"), "plist");
+  EXPECT_EQ(at(verified(get("brindle")->body, collector->publicKeyFile()), "version"), "json");
+  EXPECT_EQ(at(verified(get("halvora")->body, collector->publicKeyFile()), "version"), "1.0.0");
+  collector->setBag(Dictionary{{"version", "held for all"}});
+  EXPECT_EQ(at(verified(get("brindle")->body, collector->publicKeyFile()), "version"), "json");
+  EXPECT_EQ(at(verified(get("halvora")->body, collector->publicKeyFile()), "version"), "held for all");
+  ASSERT_EQ(http().Put("/control/bag?name=brindle", R"({"version":"put"})", "application/json")->status, 204);
+  EXPECT_EQ(at(verified(get("brindle")->body, collector->publicKeyFile()), "version"), "put");
+  EXPECT_EQ(http().Delete("/control/bag")->status, 204);
+  EXPECT_EQ(at(verified(get("halvora")->body, collector->publicKeyFile()), "version"), "1.0.0");
+}
+
+TEST_F(StorebagServerTest, SaysWhatIsWrongWithABag) {
+  directory.write("broken.json", "{\"version\": 1,");
+  directory.write("list.json", "[1]");
+  directory.write("nothing.json", R"({"version":null})");
+  for (const char* name : {"broken", "list", "nothing"}) {
+    const auto answer = get(name);
+    EXPECT_EQ(answer->status, 500) << name;
+    EXPECT_THAT(answer->body, testing::HasSubstr(std::string(name) + ".json")) << name;
+  }
+  for (const char* name : {"..%2Fx", ".hidden", "a%20b", "a%00b"}) EXPECT_EQ(get(name)->status, 404) << name;
+}
+
+TEST_F(StorebagServerTest, LeavesOutHeadersAsAsked) {
+  StorebagSettings settings;
+  settings.maxAge = std::nullopt;
+  settings.lastModified = false;
+  collector->setStorebagSettings(settings);
+  const auto answer = get("x");
+  EXPECT_FALSE(answer->has_header("Cache-Control"));
+  EXPECT_FALSE(answer->has_header("Last-Modified"));
+  EXPECT_EQ(get("x", {{"If-Modified-Since", httpDate(4'000'000'000)}})->status, 200);
+}
+
+}  // namespace
+}  // namespace orvanta::collector

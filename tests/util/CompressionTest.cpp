@@ -1,0 +1,128 @@
+#include "util/Compression.h"
+
+#include <gtest/gtest.h>
+#include <zlib.h>
+
+#include <random>
+#include <thread>
+#include <vector>
+
+#include "tests/support/LogCapture.h"
+
+namespace orvanta {
+namespace {
+
+constexpr int kGzip = 15 + 16;
+constexpr int kZlib = 15;
+
+// The whole stream's content; none when it is damaged, incomplete, of the other container or followed by more bytes.
+std::optional<std::string> inflated(const std::string& compressed, int windowBits, std::size_t expectedSize) {
+  z_stream stream{};
+  if (::inflateInit2(&stream, windowBits) != Z_OK) return std::nullopt;
+  std::string content(expectedSize + 1, '\0');
+  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(compressed.data()));
+  stream.avail_in = static_cast<uInt>(compressed.size());
+  stream.next_out = reinterpret_cast<Bytef*>(content.data());
+  stream.avail_out = static_cast<uInt>(content.size());
+  const bool whole = ::inflate(&stream, Z_FINISH) == Z_STREAM_END && stream.avail_in == 0;
+  content.resize(stream.total_out);
+  ::inflateEnd(&stream);
+  if (!whole) return std::nullopt;
+  return content;
+}
+
+std::string randomBytes(std::size_t count) {
+  std::mt19937 generator(count);
+  std::string bytes(count, '\0');
+  for (char& byte : bytes) byte = static_cast<char>(generator());
+  return bytes;
+}
+
+TEST(Compression, roundTripsThroughBothContainers) {
+  const std::string inputs[] = {
+      "x",
+      std::string(1, '\0'),
+      "{\"postTime\":1}",
+      std::string(1U << 20U, 'a'),
+      randomBytes(100'000),
+      randomBytes(1U << 17U),
+  };
+  for (int round = 0; round < 2; ++round) {  // the second round uses the kept streams
+    for (const std::string& input : inputs) {
+      const auto gzip = compressDataWithZlibOrGzip(true, input);
+      ASSERT_TRUE(gzip);
+      EXPECT_EQ(gzip->substr(0, 3), "\x1f\x8b\x08");
+      EXPECT_EQ(inflated(*gzip, kGzip, input.size()), input);
+      EXPECT_EQ(gzipDeflate(input), gzip);
+      const auto zlib = compressDataWithZlibOrGzip(false, input);
+      ASSERT_TRUE(zlib);
+      EXPECT_EQ(inflated(*zlib, kZlib, input.size()), input);
+      EXPECT_FALSE(inflated(*zlib, kGzip, input.size()));
+    }
+  }
+}
+
+TEST(Compression, nothingOfAnEarlierBodyShowsInALaterOne) {
+  const std::string input = "the same body, compressed on a thread that has done so before and on a fresh one";
+  ASSERT_TRUE(gzipDeflate(randomBytes(300'000)));
+  const auto onUsedStream = gzipDeflate(input);
+  std::optional<std::string> onFreshStream;
+  std::thread([&] { onFreshStream = gzipDeflate(input); }).join();
+  EXPECT_EQ(onUsedStream, onFreshStream);
+}
+
+TEST(Compression, threadsDoNotShareStreams) {
+  std::vector<std::thread> threads;
+  std::vector<int> failures(4);
+  for (std::size_t index = 0; index < failures.size(); ++index) {
+    threads.emplace_back([&failures, index] {
+      for (std::size_t round = 1; round <= 50; ++round) {
+        const std::string input = randomBytes(index * 1000 + round);
+        const auto compressed = gzipDeflate(input);
+        if (!compressed || inflated(*compressed, kGzip, input.size()) != input) ++failures[index];
+      }
+    });
+  }
+  for (std::thread& thread : threads) thread.join();
+  EXPECT_EQ(failures, std::vector<int>(4));
+}
+
+TEST(Compression, logsWhatItDid) {
+  const test::LogCapture log;
+  EXPECT_FALSE(gzipDeflate(""));
+  EXPECT_FALSE(compressDataWithZlibOrGzip(false, ""));
+  const auto compressed = gzipDeflate(std::string(1U << 20U, 'a'));
+  ASSERT_TRUE(compressed);
+  const std::vector<std::string> expected = {
+      "<3>compressDataWithZlibOrGzip: Cannot compress empty Dacto",
+      "<3>compressDataWithZlibOrGzip: Cannot compress empty Dacto",
+      "<7>compressDataWithZlibOrGzip: Compressed file from 1048576 to " + std::to_string(compressed->size()),
+  };
+  EXPECT_EQ(log.lines(), expected);
+}
+
+TEST(Compression, describesZlibsResults) {
+  const std::string mismatch = "The version of zlib.h and the version of the library linked do not match.";
+  struct Row {
+    int result;
+    std::string atInit, atDeflate;
+  };
+  const Row rows[] = {
+      {-6, mismatch, mismatch},
+      {-5, "Unknown error code.", "Ran out of output buffer for writing compressed bytes."},
+      {-4, "Insufficient memory.", "Memory could not be allocated for processing."},
+      {-3, "Unknown error code.", "The deflate data was invalid or incomplete."},
+      {-2, "Invalid parameter passed in to function.",
+       "The stream state was inconsistent (e.g., next_in or next_out was NULL)."},
+      {-1, "Unknown error code.", "Error occured while reading file."},
+      {2, "Unknown error code.", "Unknown error code."},
+      {-7, "Unknown error code.", "Unknown error code."},
+  };
+  for (const Row& row : rows) {
+    EXPECT_EQ(describeDeflateInitResult(row.result), row.atInit) << row.result;
+    EXPECT_EQ(describeDeflateResult(row.result), row.atDeflate) << row.result;
+  }
+}
+
+}  // namespace
+}  // namespace orvanta
