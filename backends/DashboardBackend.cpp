@@ -1,5 +1,6 @@
 #include "backends/DashboardBackend.h"
 
+#include <algorithm>
 #include <array>
 #include <condition_variable>
 #include <mutex>
@@ -23,8 +24,8 @@ using std::chrono::milliseconds;
 using std::chrono::steady_clock;
 
 constexpr std::size_t kReceiveBuffer = 1088;
-// A turn of reading ends after so many datagrams, so that a flood leaves other queues their turn; when not one of them
-// was awaited, the next turn comes later, and the system drops what is too much.
+// A turn of reading ends after so many datagrams, so that a flood leaves other queues their turn. After as many in a
+// row that nothing waited for, each turn waits for the pause, and the system drops what is too much meanwhile.
 constexpr int kReadsPerTurn = 256;
 constexpr milliseconds kFloodPause{2};
 
@@ -295,17 +296,17 @@ void DashboardBackend::myPeriodicTask() {
 void DashboardBackend::processSocketRead() {
   std::array<std::uint8_t, kReceiveBuffer> buffer;
   int datagrams = 0;
-  bool awaited = false;
   while (datagrams < kReadsPerTurn) {
     const std::optional<std::size_t> length = _socket.receive(buffer);
     if (!length) break;
     ++datagrams;
+    _strays = std::min(_strays + 1, kReadsPerTurn);
     if (*length < kDashboardEventNumberOffset + 2) continue;  // too short for an event number
     const std::uint8_t* const number = buffer.data() + kDashboardEventNumberOffset;
-    if (_delivery.acknowledged(static_cast<std::uint16_t>(number[0] << 8U | number[1]))) awaited = true;
+    if (_delivery.acknowledged(static_cast<std::uint16_t>(number[0] << 8U | number[1]))) _strays = 0;
   }
   updateTimer();
-  if (datagrams < kReadsPerTurn || awaited) {
+  if (_strays < kReadsPerTurn) {
     watchSocket();
     return;
   }

@@ -91,6 +91,7 @@ class DashboardBackend final : public OrvantaBackend {
   platform::UdpSocket _socket;
   std::unique_ptr<platform::DescriptorWatch> _readSource;
   std::unique_ptr<platform::Timer> _readPause;  // until a flooded socket is read on
+  int _strays = 0;                              // datagrams since the last one that was awaited, as far as it matters
   std::unique_ptr<platform::Timer> _timer;
   bool _timerArmed = false;
   std::unique_ptr<platform::Timer> _lastResort;

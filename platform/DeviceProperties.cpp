@@ -220,11 +220,14 @@ bool LinuxDeviceProperties::diagnosticsSubmissionAllowed() const {
 }
 
 // tzset() looks at /etc/localtime's inode and time, one system call, and reads it only when they have changed;
-// localtime_r() alone would keep the zone that it saw first.
+// localtime_r() alone would keep the zone that it saw first. The zone is the process's, and so is the lock: the C
+// library has one of its own, which thread checkers cannot see.
 int LinuxDeviceProperties::timeZoneOffset(double wallSeconds) const {
   if (!(std::abs(wallSeconds) < 1e15)) return 0;
   const auto seconds = static_cast<std::time_t>(std::floor(wallSeconds));
   std::tm local{};
+  static std::mutex zoneMutex;
+  const std::lock_guard lock(zoneMutex);
   ::tzset();
   return ::localtime_r(&seconds, &local) != nullptr ? static_cast<int>(local.tm_gmtoff) : 0;
 }

@@ -203,7 +203,7 @@ void FrameDecoder::consume(std::size_t bytes) {
   if (pending() > 0) return;
   _start = 0;
   if (_buffer.capacity() > kKeptCapacity) {
-    _buffer = {};
+    std::vector<std::uint8_t>().swap(_buffer);  // assigning {} would keep the room
   } else {
     _buffer.clear();
   }

@@ -4,7 +4,6 @@
 #include <utility>
 #include <variant>
 
-#include "platform/Log.h"
 #include "platform/SocketIo.h"
 
 namespace platform {

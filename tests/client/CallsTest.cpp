@@ -45,7 +45,7 @@ std::vector<WireRow> wireRows() {
        {}},
       {"fetchStatesWithUserInfo",
        [=](ClientSession& s, bool r) { s.fetchStatesWithUserInfo(user, ignored<BackendNamesReply>(r)); },
-       {*user}},
+       {Value(*user)}},
       {"fetchStatesWithUserInfo",
        [=](ClientSession& s, bool r) { s.fetchStatesWithUserInfo(nullptr, ignored<BackendNamesReply>(r)); },
        {nullptr}},
@@ -72,7 +72,7 @@ std::vector<WireRow> wireRows() {
          s.uploadFileAtPath(std::string("file:///nowhere"), std::nullopt, ignored<UploadReply>(r));
        },
        {"file:///nowhere", nullptr}},
-      {"uploadLogData", [=](ClientSession& s, bool r) { s.uploadLogData(list, ignored<LogDataReply>(r)); }, {*list}},
+      {"uploadLogData", [=](ClientSession& s, bool r) { s.uploadLogData(list, ignored<LogDataReply>(r)); }, {Value(*list)}},
       {"sendMessageWithSessionInfo",
        [=](ClientSession& s, bool r) {
          s.sendMessageWithSessionInfo(info, nullptr, 1, 0, nullptr, ignored<StringReply>(r));
@@ -177,7 +177,7 @@ TEST_F(Calls, whatTheDaemonWouldBreakOffOverIsRefusedHere) {
   EXPECT_EQ(textOf(fits.get()), "taken");
   // A small message that becomes a large one in the daemon's memory.
   Awaited<LogDataReply> tooCostly;
-  session().uploadLogData(std::make_shared<const Array>(Array(12'000'000)), tooCostly.reply());
+  session().uploadLogData(std::make_shared<const Array>(Array(7'000'000)), tooCostly.reply());
   EXPECT_FALSE(tooCostly.get().values);
   exchangeOneCall();
 }
@@ -193,7 +193,7 @@ TEST_F(Calls, thatWaitBringAnswersOrReasons) {
   EXPECT_EQ(set.params[1], Value(Dictionary{{"clientName", "n"}}));
   EXPECT_EQ(set.params[3], Value(false));
   peer->answer(set, {});
-  peer->answer(peer->expect("startConfigWithCompletionHandler"), {Array{"http_post", "dashboard"}});
+  peer->answer(peer->expect("startConfigWithCompletionHandler"), {Value(Array{"http_post", "dashboard"})});
   const auto names = within(configured);
   ASSERT_TRUE(names);
   EXPECT_EQ(*names, BackendNames({"http_post", "dashboard"}));

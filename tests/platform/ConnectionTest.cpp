@@ -73,7 +73,7 @@ TEST_P(BrokenStreamTest, EndsTheConnectionAfterTheFramesBefore) {
   EXPECT_EQ(made.delegate->methods(), (std::vector<std::string>{"a", "b"}));
   EXPECT_TRUE(made.delegate->protocolError().has_value());
   EXPECT_EQ(made.delegate->interruptions(), 0);
-  EXPECT_EQ(log.count("Connection fd "), 1U);
+  EXPECT_TRUE(log.lines().empty()) << "saying why is the delegate's part";
   // The answers to what came before are not lost.
   EXPECT_EQ(made.peer.readToEnd(), response(1, "done") + response(2, "done"));
   EXPECT_FALSE(made.connection->outbox()->send(response(3, "late")));

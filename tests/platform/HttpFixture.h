@@ -21,15 +21,15 @@ class HttpFixture : public testing::Test {
  protected:
   using Headers = std::vector<HttpHeader>;
 
-  HttpFixture() { _pool.start(); }
+  HttpFixture() {
+    _pool.start();
+    makeClient();
+  }
 
   void makeClient(HttpLimits limits = {}, std::string caFile = {}) {
     _client = makeCurlHttpClient(_pool, {std::move(caFile), limits});
   }
-  HttpClient& client() {
-    if (!_client) makeClient();
-    return *_client;
-  }
+  HttpClient& client() { return *_client; }
 
   static HttpRequest get(std::string url, Headers headers = {}) {
     return {"GET", std::move(url), std::move(headers), {}, {}, false};

@@ -1,0 +1,112 @@
+#include <fmt/core.h>
+
+#include <cstdlib>
+#include <stdexcept>
+#include <thread>
+
+#include "bench/CallDriver.h"
+#include "bench/RawPeers.h"
+#include "bench/Stages.h"
+#include "platform/FrameDecoder.h"
+#include "tests/support/DaemonProcess.h"
+#include "tools/collector/Collector.h"
+
+namespace orvanta::bench {
+
+namespace {
+
+using platform::Array;
+using platform::Dictionary;
+
+// A response with one nil: array, type, five bytes of id, nil, array of one, nil.
+constexpr std::size_t kNilAnswer = 10;
+constexpr std::uint64_t kWindow = 64;
+
+std::unique_ptr<test::DaemonProcess> startDaemon(test::DaemonProcess::Options options) {
+  options.logLevel = "4";
+  auto daemon = std::make_unique<test::DaemonProcess>(std::move(options));
+  if (!daemon->startQuietly()) throw std::runtime_error("orvantad does not start: " + daemon->process().allLines());
+  return daemon;
+}
+
+std::vector<std::uint8_t> sampleCall() {
+  return encodeCall("sendMessageWithDictionary",
+                    {Dictionary{{"category", 5}, {"type", 6}, {"payload", samplePayload(7)}}});
+}
+
+}  // namespace
+
+void benchCallPath() {
+  printHeading("Call and reply, no backend");
+  const auto daemon = startDaemon({});
+  const auto call = sampleCall();
+  constexpr std::uint64_t kCalls = 400'000;
+
+  const std::string echoPath = daemon->runtimeDirectory() + "/echo";
+  const EchoServer echo(echoPath, call.size(), kNilAnswer);
+  CallDriver echoDriver(echoPath);
+  const Stretch echoTime(echo.pid());
+  echoDriver.pipeline(call, kNilAnswer, kCalls, kWindow);
+  const double echoCpu = figureOf(echoTime, kCalls).cpuPerEvent;
+  const auto decode = measure(0.5, [&] {
+    platform::FrameDecoder decoder;
+    decoder.append(call);
+    return std::get<platform::Frame>(decoder.next()).params.size();
+  });
+
+  CallDriver driver(daemon->socketPath());
+  const Stretch time(daemon->process().pid());
+  driver.pipeline(call, kNilAnswer, kCalls, kWindow);
+  const auto figure = figureOf(time, kCalls);
+  printFigure(fmt::format("pipelined {} deep, {} bytes each, daemon's CPU", kWindow, call.size()), figure);
+  printRatio("  against echo and decode", figure.cpuPerEvent, echoCpu + decode.cpuPerEvent, 1.5);
+
+  constexpr std::uint64_t kRoundTrips = 20'000;
+  const auto echoTrips = echoDriver.roundTrips(call, kNilAnswer, kRoundTrips);
+  const auto trips = driver.roundTrips(call, kNilAnswer, kRoundTrips);
+  printRatio("one at a time, median, against echo", median(trips), median(echoTrips), 1.6);
+  printRatio("one at a time, p99, against the median", percentile(trips, 0.99), median(trips), 3.0);
+  fmt::print("  {:<58} {:>9} KiB (goal 9216 KiB)\n", "resident memory", daemon->residentKiB());
+}
+
+void benchWholePath(const RawLimits& limits) {
+  printHeading("Whole path: client, daemon, gzip JSON, post, local sink");
+  const test::TemporaryDirectory directory;
+  collector::CollectorOptions serving;
+  serving.directory = directory / "collector";
+  auto collector = collector::Collector::start(std::move(serving));
+  if (!collector) throw std::runtime_error(collector.error());
+  const PostSink sink;
+  (*collector)
+      ->setSection({{"http_post",
+                     Dictionary{{"clients", Array{Dictionary{{"post_url", sink.url()}, {"event_threshold", 49}}}}}}});
+
+  test::DaemonProcess::Options options;
+  options.storebagURL = (*collector)->storebagURL();
+  std::ifstream key((*collector)->publicKeyFile(), std::ios::binary);
+  options.publicKey = {std::istreambuf_iterator<char>(key), {}};
+  const auto daemon = startDaemon(options);
+
+  for (const bool batched : {true, false}) {
+    CallDriver driver(daemon->socketPath());
+    driver.call(encodeCall("setSessionInfo", {Dictionary{{"sessionID", 1}, {"clientType", 5}, {"batchEvent", batched}},
+                                              nullptr, nullptr, false}));
+    driver.call(encodeCall("startConfigWithCompletionHandler", {}));
+    const auto call = sampleCall();
+    const std::uint64_t events = batched ? 200'000 : 20'000;
+    const auto postsBefore = sink.posts();
+    const Stretch time(daemon->process().pid());
+    driver.pipeline(call, kNilAnswer, events, kWindow);
+    driver.call(encodeCall("flushMessagesWithCompletion", {}));
+    // Everything has been handed over; what is still to be posted counts as well.
+    const std::uint64_t expected = batched ? events / 50 : events;
+    while (sink.posts() - postsBefore < expected) std::this_thread::yield();
+    const auto figure = figureOf(time, events);
+    const double raw = batched ? limits.decode + limits.encode + limits.gzip + limits.post / 50
+                               : limits.decode + limits.encode + limits.gzipSingle + limits.post;
+    printFigure(batched ? "batched, 50 a post, daemon's CPU" : "one post each, daemon's CPU", figure);
+    printRatio("  against the sum of the raw limits", figure.cpuPerEvent, raw, batched ? 1.25 : 2.0);
+  }
+}
+
+}  // namespace orvanta::bench

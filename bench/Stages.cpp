@@ -1,0 +1,257 @@
+#include "bench/Stages.h"
+
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <fmt/core.h>
+#include <netinet/in.h>
+#include <netinet/tcp.h>
+#include <sys/socket.h>
+#include <unistd.h>
+#include <zlib.h>
+
+#include <atomic>
+#include <condition_variable>
+#include <mutex>
+#include <stdexcept>
+
+#include "backends/EventFilters.h"
+#include "backends/EventRecord.h"
+#include "backends/PostMessage.h"
+#include "backends/SessionFields.h"
+#include "bench/CallDriver.h"
+#include "bench/RawPeers.h"
+#include "platform/FrameDecoder.h"
+#include "platform/Json.h"
+#include "tests/support/TestPlatform.h"
+#include "util/Compression.h"
+#include "util/MessageLog.h"
+
+namespace orvanta::bench {
+
+namespace {
+
+using platform::Dictionary;
+using platform::SharedDictionary;
+
+constexpr double kSeconds = 1.0;
+constexpr std::size_t kBatch = 50;
+
+// Keeps a result alive for the compiler.
+void consume(std::size_t value) {
+  static std::atomic<std::size_t> sink{0};
+  sink.store(value, std::memory_order_relaxed);
+}
+
+// The fields of `record` straight into JSON: what any encoder has to do at least.
+void appendFlat(std::string& out, const Dictionary& record) {
+  out += '{';
+  for (const auto& [key, value] : record) {
+    platform::appendJsonString(out, key);
+    out += ':';
+    if (const auto* text = value.string()) {
+      platform::appendJsonString(out, *text);
+    } else if (const auto* real = std::get_if<double>(&value.storage())) {
+      platform::appendJsonNumber(out, *real);
+    } else {
+      platform::appendJsonNumber(out, value.integerValue());
+    }
+    out += ',';
+  }
+  out.back() = '}';
+}
+
+double benchDecode() {
+  const auto message = encodeCall("sendMessageWithDictionary",
+                                  {Dictionary{{"category", 5}, {"type", 6}, {"payload", samplePayload(1)}}});
+  const auto figure = measure(kSeconds, [&] {
+    platform::FrameDecoder decoder;
+    decoder.append(message);
+    consume(std::get<platform::Frame>(decoder.next()).params.size());
+    return 1;
+  });
+  printFigure(fmt::format("decode a call of {} bytes", message.size()), figure);
+  return figure.cpuPerEvent;
+}
+
+struct Encoded {
+  double raw = 0;
+  std::string body;    // of kBatch records
+  std::string single;  // of one
+};
+
+Encoded benchEncode(test::TestPlatform& device) {
+  const auto profile = std::make_shared<const Dictionary>();
+  const auto backend = std::make_shared<OrvantaBackend>(device.get(), "http_post", profile, "Parva");
+  BackendIdentity identity;
+  identity.compType = 5;
+  identity.productVersion = "12.5";
+  identity.buildVersion = "12F5";
+  identity.hardwareType = "Parva3,2";
+  identity.selfVersion = "8.0.0";
+  identity.startTimestamp = device.clock.timeOfDay();
+  backend->setIdentity(identity);
+  const auto fields = SessionFields::of(*backend, false);
+  std::vector<SharedDictionary> payloads;
+  for (std::uint32_t i = 0; i < kBatch; ++i) {
+    payloads.push_back(std::make_shared<const Dictionary>(samplePayload(i)));
+  }
+  const EventFilters filters;
+  const auto build = [&](std::size_t count) {
+    std::vector<EventRecord> records;
+    records.reserve(count);
+    std::vector<OutgoingEvent> events(count);
+    for (std::size_t i = 0; i < count; ++i) {
+      EventRecord::Numbers numbers;
+      numbers.method = 5;
+      numbers.eventID = static_cast<std::uint16_t>(i);
+      numbers.clientTS = 1'700'000'000.25;
+      records.emplace_back(fields, payloads[i], "AAAAAAAAAAAAAAAAAAAAAA==", numbers);
+      records.back().prepare(nullptr, filters);
+      events[i].record = &records[i];
+    }
+    return createMessageForPostAndLogging(1'700'000'001.5, "0B7C2F9C-0000-0000-0000-000000000000", events, false).json;
+  };
+  Encoded encoded;
+  encoded.body = build(kBatch);
+  encoded.single = build(1);
+
+  const auto parsed = platform::parseJson(encoded.body);
+  const auto& flat = *(*parsed->dictionary()->find("events")->array())[0].dictionary();
+  std::string out;
+  const auto raw = measure(kSeconds, [&] {
+    out.clear();
+    for (std::size_t i = 0; i < kBatch; ++i) appendFlat(out, flat);
+    consume(out.size());
+    return kBatch;
+  });
+  const auto figure = measure(kSeconds, [&] {
+    consume(build(kBatch).size());
+    return kBatch;
+  });
+  printFigure(fmt::format("build and encode a record of {} bytes", encoded.body.size() / kBatch), figure);
+  printRatio("  against encoding its fields alone", figure.cpuPerEvent, raw.cpuPerEvent, 2.0);
+  encoded.raw = raw.cpuPerEvent;
+  return encoded;
+}
+
+// One kept stream: nothing is set up for a body.
+double rawGzip(const std::string& body) {
+  z_stream stream{};
+  if (::deflateInit2(&stream, -1, Z_DEFLATED, 31, 8, Z_DEFAULT_STRATEGY) != Z_OK) throw std::runtime_error("zlib");
+  std::vector<Bytef> out(::deflateBound(&stream, body.size()));
+  const auto figure = measure(kSeconds, [&] {
+    ::deflateReset(&stream);
+    stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(body.data()));
+    stream.avail_in = static_cast<uInt>(body.size());
+    stream.next_out = out.data();
+    stream.avail_out = static_cast<uInt>(out.size());
+    ::deflate(&stream, Z_FINISH);
+    consume(stream.total_out);
+    return 1;
+  });
+  ::deflateEnd(&stream);
+  return figure.cpuPerEvent;
+}
+
+double benchGzip(const std::string& body, const char* name) {
+  const double raw = rawGzip(body);
+  const auto figure = measure(kSeconds, [&] {
+    consume(gzipDeflate(body)->size());
+    return 1;
+  });
+  printFigure(fmt::format("gzip {} ({} bytes)", name, body.size()), figure);
+  printRatio("  against zlib with a kept stream", figure.cpuPerEvent, raw, 1.1);
+  return raw;
+}
+
+// A post over one kept-alive connection with nothing but the socket.
+double rawPost(const PostSink& sink, const std::string& body) {
+  const int fd = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  sockaddr_in address{};
+  address.sin_family = AF_INET;
+  address.sin_port = htons(sink.port());
+  address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+  if (::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) throw std::runtime_error("connect");
+  const std::string request = fmt::format(
+      "POST /post HTTP/1.1\r\nHost: 127.0.0.1\r\nContent-Type: application/json\r\nContent-Length: {}\r\n\r\n{}",
+      body.size(), body);
+  char answer[256];
+  const auto figure = measure(kSeconds, [&] {
+    if (::write(fd, request.data(), request.size()) < 0 || ::read(fd, answer, sizeof answer) <= 0) {
+      throw std::runtime_error("the sink has gone");
+    }
+    return 1;
+  });
+  ::close(fd);
+  return figure.cpuPerEvent;
+}
+
+double benchPost(const std::string& body) {
+  const PostSink sink;
+  const double raw = rawPost(sink, body);
+  platform::WorkPool pool(1);
+  pool.start();
+  const auto client = platform::makeCurlHttpClient(pool, {});
+  const auto lane = client->makeLane();
+  std::mutex mutex;
+  std::condition_variable changed;
+  std::size_t inFlight = 0;
+  const auto figure = measure(kSeconds, [&] {
+    std::unique_lock lock(mutex);
+    changed.wait(lock, [&] { return inFlight < 16; });
+    ++inFlight;
+    lock.unlock();
+    platform::HttpRequest request;
+    request.method = "POST";
+    request.url = sink.url();
+    request.headers = {{"Content-Type", "application/json"}};
+    request.body = body;
+    request.discardResponseBody = true;
+    client->start(lane, std::move(request), {}, [&](platform::HttpResult) {
+      const std::lock_guard done(mutex);
+      --inFlight;
+      changed.notify_one();
+    });
+    return 1;
+  });
+  client->shutdown(std::chrono::milliseconds(2000));
+  pool.stop();
+  printFigure(fmt::format("post of {} bytes over one lane", body.size()), figure);
+  printRatio("  against the bare socket", figure.cpuPerEvent, raw, 3.0);
+  return raw;
+}
+
+void benchMessageLog(test::TestPlatform& device) {
+  const std::string line = "[http_post -> sendMessageWithDictionary] " + std::string(400, 'x');
+  const std::string file = device.directory / "raw.log";
+  const auto raw = measure(kSeconds, [&] {
+    const int fd = ::open(file.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
+    if (::write(fd, line.data(), line.size()) < 0) throw std::runtime_error("write");
+    ::close(fd);
+    return 1;
+  });
+  const auto figure = measure(kSeconds, [&] {
+    writeToLogFile(device.get(), line);
+    return 1;
+  });
+  printFigure("message-log line", figure);
+  printRatio("  against open, append, close", figure.cpuPerEvent, raw.cpuPerEvent, 3.0);
+}
+
+}  // namespace
+
+RawLimits benchStages() {
+  printHeading("Stages");
+  test::TestPlatform device;
+  RawLimits limits;
+  limits.decode = benchDecode();
+  const auto encoded = benchEncode(device);
+  limits.encode = encoded.raw;
+  limits.gzip = benchGzip(encoded.body, "a body of 50 records") / kBatch;
+  limits.gzipSingle = benchGzip(encoded.single, "a body of one record");
+  limits.post = benchPost(*gzipDeflate(encoded.body));
+  benchMessageLog(device);
+  return limits;
+}
+
+}  // namespace orvanta::bench

@@ -1,0 +1,22 @@
+#pragma once
+
+#include "bench/Measure.h"
+
+namespace orvanta::bench {
+
+// CPU microseconds per event of the least that each stage can do, measured in this run; the whole path is held against
+// their sum.
+struct RawLimits {
+  double decode = 0;
+  double encode = 0;
+  double gzip = 0;        // one of 50 records in a body
+  double gzipSingle = 0;  // a body of one record
+  double post = 0;        // one post
+};
+
+// Each prints its lines.
+RawLimits benchStages();
+void benchCallPath();
+void benchWholePath(const RawLimits& limits);
+
+}  // namespace orvanta::bench

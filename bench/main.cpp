@@ -1,0 +1,28 @@
+#include <fmt/core.h>
+
+#include <exception>
+#include <string_view>
+
+#include "bench/Stages.h"
+
+// Prints, for each stage of an event's way and for the whole, events per second, CPU microseconds per event and the
+// ratio to the raw limit measured in the same run. Absolute values belong to the machine; the ratios are what is to be
+// kept.
+int main(int argumentCount, char** arguments) {
+  using namespace orvanta::bench;
+  const std::string_view only = argumentCount > 1 ? arguments[1] : "";
+  if (!only.empty() && only != "calls" && only != "stages") {
+    fmt::print("usage: orvanta-bench [calls | stages]\n");
+    return 2;
+  }
+  try {
+    if (only != "stages") benchCallPath();
+    if (only == "calls") return 0;
+    const RawLimits limits = benchStages();
+    if (only.empty()) benchWholePath(limits);
+  } catch (const std::exception& error) {
+    fmt::print(stderr, "orvanta-bench: {}\n", error.what());
+    return 1;
+  }
+  return 0;
+}
