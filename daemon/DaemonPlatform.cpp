@@ -31,7 +31,8 @@ std::unique_ptr<platform::Platform> makeDaemonPlatform(platform::FileLocations f
   platform::HttpClientOptions options;
   options.caFile = files.caFile;
   parts.http = platform::makeCurlHttpClient(*parts.pool, options);
-  parts.powerLog = std::make_unique<platform::JsonLinesPowerLog>(files.stateDirectory + "/powerlog.jsonl", *parts.clock);
+  parts.powerLog =
+      std::make_unique<platform::JsonLinesPowerLog>(files.stateDirectory + "/powerlog.jsonl", *parts.clock);
   parts.files = std::move(files);
   return std::make_unique<platform::Platform>(std::move(parts));
 }

@@ -17,9 +17,15 @@ bool needsEscaping(std::string_view text) {
 }
 }  // namespace
 
-void installLogSink(LogSink* sink) { gSink.store(sink, std::memory_order_release); }
-LogSink* installedLogSink() { return gSink.load(std::memory_order_acquire); }
-void setLogLevel(LogLevel level) { gLogLevel.store(static_cast<int>(level), std::memory_order_relaxed); }
+void installLogSink(LogSink* sink) {
+  gSink.store(sink, std::memory_order_release);
+}
+LogSink* installedLogSink() {
+  return gSink.load(std::memory_order_acquire);
+}
+void setLogLevel(LogLevel level) {
+  gLogLevel.store(static_cast<int>(level), std::memory_order_relaxed);
+}
 
 void writeLogLine(LogLevel level, std::string_view text) {
   LogSink* sink = installedLogSink();

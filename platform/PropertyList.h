@@ -16,7 +16,7 @@ namespace platform {
 struct PropertyListLimits {
   std::size_t maximumDepth = 128;
   std::size_t maximumObjects = 1'000'000;  // values given out, shared ones counted each time
-  std::size_t maximumBytes = 64U << 20U;  // of the document; in the binary form also of all text and data given out
+  std::size_t maximumBytes = 64U << 20U;   // of the document; in the binary form also of all text and data given out
 };
 
 // Reads either form, chosen by the first bytes. A failure says what and where (byte offset); a repeated key is one.

@@ -31,8 +31,8 @@ class WorkPool {
   // Lets running jobs end, joins every thread. Must not be called from a job. Idempotent.
   void stop();
 
-  // Waits until no posted job, on any queue, waits or runs, jobs posted by jobs included; timers and watches do not count.
-  // False when that takes longer than `patience`. Must not be called from a job.
+  // Waits until no posted job, on any queue, waits or runs, jobs posted by jobs included; timers and watches do not
+  // count. False when that takes longer than `patience`. Must not be called from a job.
   bool drain(std::chrono::milliseconds patience);
 
   std::shared_ptr<WorkQueue> makeQueue();
@@ -82,8 +82,8 @@ class DescriptorWatch {
   virtual ~DescriptorWatch() = default;
   virtual void whenReadable(Job handler) = 0;
   virtual void whenWritable(Job handler) = 0;
-  // The other end was closed, or the connection reset; unlike whenReadable() it does not fire for an end of file that a peer
-  // made by shutting down only its sending side.
+  // The other end was closed, or the connection reset; unlike whenReadable() it does not fire for an end of file that a
+  // peer made by shutting down only its sending side.
   virtual void whenHungUp(Job handler) = 0;
   virtual void cancel() = 0;
 };

@@ -29,8 +29,8 @@ class FlushRequest : public std::enable_shared_from_this<FlushRequest> {
 
   platform::Platform& _platform;
   const std::shared_ptr<std::mutex> _lock;  // one for all flushes of the platform
-  std::int32_t _pending;   // guarded by _lock
-  FlushReply _completion;  // guarded by _lock; empty once called
+  std::int32_t _pending;                    // guarded by _lock
+  FlushReply _completion;                   // guarded by _lock; empty once called
 };
 
 }  // namespace orvanta

@@ -72,7 +72,9 @@ std::vector<WireRow> wireRows() {
          s.uploadFileAtPath(std::string("file:///nowhere"), std::nullopt, ignored<UploadReply>(r));
        },
        {"file:///nowhere", nullptr}},
-      {"uploadLogData", [=](ClientSession& s, bool r) { s.uploadLogData(list, ignored<LogDataReply>(r)); }, {Value(*list)}},
+      {"uploadLogData",
+       [=](ClientSession& s, bool r) { s.uploadLogData(list, ignored<LogDataReply>(r)); },
+       {Value(*list)}},
       {"sendMessageWithSessionInfo",
        [=](ClientSession& s, bool r) {
          s.sendMessageWithSessionInfo(info, nullptr, 1, 0, nullptr, ignored<StringReply>(r));
