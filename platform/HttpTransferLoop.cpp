@@ -48,7 +48,10 @@ void HttpTransferLoop::run() {
     expire();
     startReady();
     int running = 0;
-    if (const CURLMcode code = curl_multi_perform(_multi, &running); code != CURLM_OK) recoverFrom(code);
+    if (const CURLMcode code = curl_multi_perform(_multi, &running); code != CURLM_OK) {
+      recoverFrom(code);
+      continue;  // the lanes that this freed start their next
+    }
     if (!harvest()) sleep();
   }
 }

@@ -152,10 +152,14 @@ TEST(XmlPropertyList, ExpandsNoEntities) {
 
 TEST(XmlPropertyList, KeepsToTheLimits) {
   const auto nested = [](std::size_t depth) {
-    std::string text = "<true/>";
-    for (std::size_t i = 0; i < depth; ++i)
-      text = i % 2 == 0 ? "<array>" + text + "</array>" : "<dict><key/>" + text + "</dict>";
-    return plist(text);
+    std::string opening, closing;
+    for (std::size_t i = 0; i < depth; ++i) {
+      const bool isArray = (depth - i) % 2 == 1;
+      opening += isArray ? "<array>" : "<dict><key/>";
+    }
+    // The innermost is an array and closes first.
+    for (std::size_t i = 0; i < depth; ++i) closing += i % 2 == 0 ? "</array>" : "</dict>";
+    return plist(opening + "<true/>" + closing);
   };
   const PropertyListLimits limits{6, 20, 400};
   EXPECT_TRUE(parse(nested(6), limits).ok());
