@@ -97,8 +97,10 @@ std::size_t OrvantadAgent::sessionCount() const {
 }
 
 platform::SharedDictionary OrvantadAgent::storebagForSession(OrvantadSession& session) {
+  ORVANTA_LOG(debug, "storebagForSession: Retrieving storebag for session {} with client type {}", session.sessionID(),
+              session.clientType());
   const std::lock_guard lock(_lock);
-  return _storebags.storebag(session.sessionID(), session.clientType());
+  return _storebags.storebag(session.clientType());
 }
 
 std::optional<std::string> OrvantadAgent::storebagVersionForSession(OrvantadSession& session) {

@@ -1,5 +1,7 @@
 #include "daemon/SessionConnection.h"
 
+#include <chrono>
+
 #include "daemon/OrvantadAgent.h"
 #include "interface/OrvantaLogging.h"
 #include "interface/RemoteCalls.h"
@@ -12,7 +14,7 @@ void SessionConnection::received(platform::Frame&& frame) {
     ORVANTA_LOG(warning, "listener: Closing connection to {}: it answered a call that was never made",
                 _session->description());
     _finished = true;
-    _connection->cancel();
+    _connection->cancel(std::chrono::milliseconds(1000));  // answers to earlier calls still go out
     return;
   }
   // A call that is refused leaves the descriptor that came with it untaken, and later calls would get the wrong one.

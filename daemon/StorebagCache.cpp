@@ -16,9 +16,7 @@ StorebagFreshness freshnessOf(const StorebagCacheEntry& entry, double now) {
   return age < StorebagCache::kSecondsBetweenFailedAttempts ? StorebagFreshness::waiting : StorebagFreshness::expired;
 }
 
-platform::SharedDictionary StorebagCache::storebag(std::uint32_t sessionID, std::int32_t clientType) {
-  ORVANTA_LOG(debug, "storebagForSession: Retrieving storebag for session {} with client type {}", sessionID,
-              clientType);
+platform::SharedDictionary StorebagCache::storebag(std::int32_t clientType) {
   const auto name = storebagNameForClientType(clientType);
   if (!name) {
     // No entry is made for it; the fetch refuses it with the line that says so.

@@ -37,8 +37,8 @@ class StorebagCache {
   using Fetch = std::function<platform::SharedDictionary(std::int32_t clientType, StorebagFetch& fetch)>;
   StorebagCache(platform::Clock& clock, Fetch fetch) : _clock(clock), _fetch(std::move(fetch)) {}
 
-  // Null when there is none, or the client type has no storebag. `sessionID` is for the log.
-  platform::SharedDictionary storebag(std::uint32_t sessionID, std::int32_t clientType);
+  // Null when there is none, or the client type has no storebag.
+  platform::SharedDictionary storebag(std::int32_t clientType);
   // Never fetches.
   std::optional<std::string> version(std::int32_t clientType) const;
 

@@ -28,6 +28,50 @@ TEST_F(HTTPSPostBatchTest, ThresholdFlushesTheWholeBatch) {
   EXPECT_EQ(postedEvents(requests()[1]).size(), 50U);
 }
 
+TEST_F(HTTPSPostBatchTest, AFlushThatSendsBeginsEveryCountAnew) {
+  const auto backend = makeBackend(batching());
+  for (int i = 0; i < 50; ++i) {
+    send(*backend, 3);
+    send(*backend, 4);
+  }
+  flush(*backend);
+  ASSERT_EQ(requests().size(), 1U);
+  for (int i = 0; i < 50; ++i) {
+    send(*backend, 3);
+    send(*backend, 4);
+  }
+  EXPECT_EQ(requests().size(), 1U);
+}
+
+// A relabelling between the moment when an event reads its identifier and the moment when it is batched.
+TEST_F(HTTPSPostBatchTest, ARelabellingReachesTheEventThatIsBeingMade) {
+  OrvantaBackend backend(platform, "http_post", shared({}), "Parva");
+  backend.setIdentity(defaultIdentity());
+  const auto fields = SessionFields::of(backend, false);
+  const auto event = [&] { return EventRecord(fields, nullptr, "own", {}); };
+  EventBatch batch;
+  batch.append(event(), 1, 0, batch.labels());
+  const std::uint64_t seen = batch.labels();
+  batch.relabel("new");
+  batch.append(event(), 1, 0, seen);
+  batch.append(event(), 1, 0, batch.labels());
+  EventBatch::Events events = batch.take();
+  ASSERT_EQ(events.records.size(), 3U);
+  EXPECT_EQ(events.relabelledCount, 2U);
+  EXPECT_EQ(events.sessionID, "new");
+
+  // With the earlier events taken out meanwhile, and no identifier any more.
+  batch.append(event(), 1, 0, batch.labels());
+  const std::uint64_t before = batch.labels();
+  batch.relabel(std::nullopt);
+  batch.take();
+  batch.append(event(), 1, 0, before);
+  events = batch.take();
+  EXPECT_EQ(events.relabelledCount, 1U);
+  EXPECT_EQ(events.sessionID, std::nullopt);
+  EXPECT_TRUE(events.overlayFor(0).relabelled);
+}
+
 TEST_F(HTTPSPostBatchTest, ThresholdsFromTheStorebag) {
   const std::pair<Value, std::size_t> rows[] = {{0, 2}, {-1, 2}, {-5, 2}, {1, 3}, {nullptr, 2}};
   for (const auto& [threshold, firstPostAt] : rows) {

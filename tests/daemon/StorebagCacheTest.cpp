@@ -16,7 +16,7 @@ class StorebagCacheTest : public ::testing::Test {
     return std::make_shared<const Dictionary>(Dictionary{{name, Dictionary{}}});
   }
   std::string ask(std::int32_t clientType = 5) {
-    const auto found = cache.storebag(1, clientType);
+    const auto found = cache.storebag(clientType);
     return found ? found->begin()->first : "none";
   }
 
