@@ -16,7 +16,6 @@ namespace {
 using platform::Dictionary;
 using platform::Failure;
 using platform::Result;
-using platform::Value;
 
 // Shorter than any pair that can stand in a text, " =x", but for the one key that may be empty.
 constexpr std::size_t kMaximumPairs = kDashboardMaximumText / 3 + 1;

@@ -53,8 +53,8 @@ HTTPSPostBackend::HTTPSPostBackend(platform::Platform& platform, std::string nam
     : OrvantaBackend(platform, std::move(name), std::move(profile), std::move(productFamily)),
       _dnuEnabled(platform.device().diagnosticsSubmissionAllowed()),
       _forceEventLogging(forcesEventLogging(platform)),
-      _clientIdentity(Orvanta::of(platform).getPersistentIdentifierForDNU(true),
-                      Orvanta::of(platform).getPersistentIdentifierForDNU(false)),
+      _clientIdentity{Orvanta::of(platform).getPersistentIdentifierForDNU(true),
+                      Orvanta::of(platform).getPersistentIdentifierForDNU(false)},
       _realtimePostURL(userDefaultStringForKey(platform, "httpsRealtimePostURL")),
       _postURL(userDefaultStringForKey(platform, "httpsPostURL")) {
   if (_postURL) {

@@ -15,27 +15,28 @@ bool isServerError(int status) {
   return status >= 500 && status <= 599;
 }
 
-// Counts a post from the hand-in until it is with the HTTP client, also when the pool drops the job.
+// Counts a post from the hand-in until it is with the HTTP client, also when the pool drops the job. Owns its share of
+// the count, since a pool that is destroyed drops its jobs after the platform's own values have gone.
 class PendingPost {
  public:
-  explicit PendingPost(PendingPosts& posts) : _posts(&posts) { posts.begin(); }
-  PendingPost(PendingPost&& other) noexcept : _posts(std::exchange(other._posts, nullptr)) {}
+  explicit PendingPost(std::shared_ptr<PendingPosts> posts) : _posts(std::move(posts)) { _posts->begin(); }
+  PendingPost(PendingPost&& other) noexcept = default;
   PendingPost& operator=(PendingPost&&) = delete;
   ~PendingPost() {
     if (_posts != nullptr) _posts->end();
   }
 
  private:
-  PendingPosts* _posts;
+  std::shared_ptr<PendingPosts> _posts;  // null once moved from
 };
 
 }  // namespace
 
-PendingPosts& PendingPosts::of(platform::Platform& platform) {
+std::shared_ptr<PendingPosts> PendingPosts::of(platform::Platform& platform) {
   struct Holder {
     std::shared_ptr<PendingPosts> posts;
   };
-  return *platform.once<Holder>([] { return Holder{std::make_shared<PendingPosts>()}; }).posts;
+  return platform.once<Holder>([] { return Holder{std::make_shared<PendingPosts>()}; }).posts;
 }
 
 void PendingPosts::begin() {
@@ -146,7 +147,7 @@ void PostQueue::compressAndStart(Job& job) {
   _http.start(
       _lane, std::move(request),
       [outcome = job.outcome](const platform::HttpResult& result) { outcome->observe(result); },
-      [outcome = job.outcome](platform::HttpResult result) { outcome->finish(result); });
+      [outcome = job.outcome](const platform::HttpResult& result) { outcome->finish(result); });
 }
 
 }  // namespace orvanta

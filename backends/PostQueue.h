@@ -20,7 +20,7 @@ namespace orvanta {
 // How many posts of all backends have not reached the HTTP client yet. One per platform. Thread-safe.
 class PendingPosts {
  public:
-  static PendingPosts& of(platform::Platform& platform);
+  static std::shared_ptr<PendingPosts> of(platform::Platform& platform);
 
   void begin();
   void end();
@@ -67,7 +67,7 @@ class PostQueue : public std::enable_shared_from_this<PostQueue> {
 
   // Constant after construction.
   platform::HttpClient& _http;
-  PendingPosts& _pendingPosts;
+  const std::shared_ptr<PendingPosts> _pendingPosts;
   const std::weak_ptr<OrvantaBackend> _backend;
   const std::string _backendName;
   const std::shared_ptr<platform::WorkQueue> _queue;

@@ -22,7 +22,7 @@ void takeExpedite(ReportingDecision& decision, const platform::Array& sections, 
   for (const Value& element : sections) {
     const Dictionary* section = element.dictionary();
     if (section == nullptr || !isForClient(*section, facts)) continue;
-    if (const auto expedite = intUnder(*section, "expedite")) decision.settings.batchEvents = *expedite == 0;
+    if (const auto expedite = realUnder(*section, "expedite")) decision.settings.batchEvents = *expedite == 0;
     return;
   }
 }
@@ -85,7 +85,8 @@ bool passesTests(ReportingDecision& decision, const Dictionary& section, const R
   // Consent is overridden by a number alone: a value that makes no sense overrides nothing.
   const Value* override = section.find("override_dnu");
   if (override != nullptr && override->isNumber()) reason.overrideDNU = *intUnder(section, "override_dnu");
-  if (reason.overrideDNU == 1) {
+  // Compared unrounded: 1.5 is not the 1 that overrides.
+  if (reason.overrideDNU == 1 && realUnder(section, "override_dnu") == 1.0) {
     decision.settings.dnuType =
         facts.consent ? ClientIdentity::kConsentOverriddenGiven : ClientIdentity::kConsentOverriddenNotGiven;
   } else {

@@ -54,7 +54,7 @@ void CallChannel::submit(std::uint32_t messageID, const CallMessage& message, Pe
     }
   }
   if (error) {
-    failLater(std::move(reply), std::move(*error));
+    failLater(std::move(reply), std::move(*error));  // NOLINT(bugprone-use-after-move): add() takes it only on success
     return;
   }
   // Refused by the outbox means that the connection is about to end, which fails all that wait.

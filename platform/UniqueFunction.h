@@ -24,6 +24,7 @@ class UniqueFunction<R(Args...)> {
   template <class F, class D = std::decay_t<F>,
             class = std::enable_if_t<!std::is_same_v<D, UniqueFunction> && std::is_invocable_r_v<R, D&, Args...>>>
   UniqueFunction(F&& f) {  // NOLINT(google-explicit-constructor): a lambda converts, as with std::function
+    // NOLINTNEXTLINE(misc-redundant-expression): redundant for some D only
     if constexpr (sizeof(D) <= kInlineSize && alignof(D) <= alignof(std::max_align_t) &&
                   std::is_nothrow_move_constructible_v<D>) {
       ::new (static_cast<void*>(&_storage)) D(std::forward<F>(f));

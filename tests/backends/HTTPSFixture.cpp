@@ -101,7 +101,7 @@ FlushAnswer HTTPSFixture::flush(HTTPSPostBackend& backend) {
 }
 
 void HTTPSFixture::settle() {
-  ASSERT_TRUE(PendingPosts::of(platform).waitUntilHandedIn(kHangGuard));
+  ASSERT_TRUE(PendingPosts::of(platform)->waitUntilHandedIn(kHangGuard));
 }
 
 HTTPSFixture::Posts HTTPSFixture::categories() {

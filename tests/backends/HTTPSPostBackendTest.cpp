@@ -282,7 +282,7 @@ TEST_F(HTTPSPostBackendTest, WhoIsShownWhatWasSent) {
     backend->updateState();
     ASSERT_EQ(backend->state(), kBackendEnabled) << row.what;
     EXPECT_EQ(send(*backend, 1).has_value(), row.shown) << row.what;
-    EXPECT_TRUE(PendingPosts::of(own).waitUntilHandedIn(kHangGuard));
+    EXPECT_TRUE(PendingPosts::of(own)->waitUntilHandedIn(kHangGuard));
   }
 }
 

@@ -225,7 +225,7 @@ TEST_F(HTTPSPostRequestTest, ADroppedPostIsReported) {
       ++answer->calls;
       answer->error = std::move(error);
     });
-    ASSERT_TRUE(PendingPosts::of(own).waitUntilHandedIn(kHangGuard));
+    ASSERT_TRUE(PendingPosts::of(own)->waitUntilHandedIn(kHangGuard));
     EXPECT_EQ(answer->calls, 0);
   }
   EXPECT_EQ(answer->calls, 1);
@@ -254,7 +254,7 @@ TEST_F(HTTPSPostRequestTest, WaitingBytesAreBounded) {
     EXPECT_NE(pending[i].answer->error->description.find("bytes wait to be posted"), std::string::npos);
   }
   EXPECT_EQ(log.count("<3>HTTPSPostBackend(postJsonMessage): post error: "), 2U);
-  EXPECT_FALSE(PendingPosts::of(platform).waitUntilHandedIn(std::chrono::milliseconds(0)));
+  EXPECT_FALSE(PendingPosts::of(platform)->waitUntilHandedIn(std::chrono::milliseconds(0)));
   release.set_value();
   ASSERT_TRUE(pending[0].wait());
   settle();

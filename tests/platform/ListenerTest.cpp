@@ -299,6 +299,9 @@ class DescriptorsExhausted {
 };
 
 TEST_F(ListenerTest, PausesWhenDescriptorsRunOutAndGoesOn) {
+#if defined(__SANITIZE_ADDRESS__)
+  GTEST_SKIP() << "the sanitizer looks at objects through a pipe, for which this test leaves no descriptor";
+#endif
   LogCapture log;
   auto listener = Listener::create(*_pool, _directory.path(), kService, admitting());
   ASSERT_TRUE(listener.ok());
@@ -317,6 +320,9 @@ TEST_F(ListenerTest, PausesWhenDescriptorsRunOutAndGoesOn) {
 
 // Back-pressure wants a descriptor of its own; without one it must still get on.
 TEST_F(ListenerTest, RepliesStillGoOutWhenDescriptorsRunOut) {
+#if defined(__SANITIZE_ADDRESS__)
+  GTEST_SKIP() << "the sanitizer looks at objects through a pipe, for which this test leaves no descriptor";
+#endif
   auto made = open();
   const Bytes reply = response(1, platform::Value(std::string(2U << 20U, 'r')));
   {
