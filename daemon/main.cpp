@@ -20,9 +20,10 @@ int main() {
   platform::blockTerminationSignals();
   const auto device = makeDaemonPlatform(files);
   OrvantadAgent agent(*device);
-  auto listener = platform::Listener::create(
-      device->pool(), files.runtimeDirectory, std::string(kOrvantaServiceName),
-      [&agent](auto&& offered) { return agent.listenerShouldAcceptNewConnection(std::move(offered)); });
+  auto listener = platform::Listener::create(device->pool(), files.runtimeDirectory, std::string(kOrvantaServiceName),
+                                             [&agent](platform::OfferedConnection&& offered) {
+                                               return agent.listenerShouldAcceptNewConnection(std::move(offered));
+                                             });
   if (!listener) {
     ORVANTA_LOG(error, "main: {}", listener.error());
     return 1;
