@@ -132,7 +132,7 @@ bool MessagePackReader::map(const MessagePackHead& head, Value& out) {
   if (auto dictionary = Dictionary::fromUniqueEntries(std::move(entries))) {
     out.storage() = std::move(*dictionary);
   } else if (!_refusal) {
-    refuseDuplicate(start, entries);
+    refuseDuplicate(start, entries);  // NOLINT(bugprone-use-after-move): on failure nothing was taken
   }
   return true;
 }

@@ -132,7 +132,7 @@ class RsaTest : public testing::Test {
   }
   static Bytes keyWithExponentOne() {
     Bytes der = pair().pkcs1();  // 30 81 LENGTH ... and at the end INTEGER 65537: 02 03 01 00 01
-    der.resize(der.size() - 5);
+    der.erase(der.end() - 5, der.end());
     der.insert(der.end(), {0x02, 0x01, 0x01});
     der[2] = static_cast<std::uint8_t>(der[2] - 2);
     return der;
