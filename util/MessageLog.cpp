@@ -46,6 +46,7 @@ std::vector<Entry> listOrCreate(MessageLogDirectory& directory) {
 std::optional<Entry> chooseFile(const MessageLogDirectory& directory, std::vector<Entry> entries, double now) {
   std::optional<Entry> chosen;
   for (Entry& entry : entries) {
+    // NOLINTNEXTLINE(bugprone-branch-clone): expired by age, and expired by a newer one, in the order of the rules
     if (entry.created && now - *entry.created > kMaximumAgeSeconds) {
       expireLogFile(directory, entry);
     } else if (!chosen || !chosen->created) {

@@ -1,3 +1,5 @@
+#include <fmt/format.h>
+
 #include <charconv>
 #include <fstream>
 #include <iterator>
@@ -43,7 +45,7 @@ std::optional<InboxQuery> readQuery(const Request& request, Response& response) 
     } else if (name == "kind" && requestKindFromText(text)) {
       query.kind = requestKindFromText(text);
     } else {
-      answerError(response, 400, "no such parameter or value: " + name + "=" + text);
+      answerError(response, 400, fmt::format("no such parameter or value: {}={}", name, text));
       return std::nullopt;
     }
   }

@@ -13,7 +13,6 @@ namespace orvanta::collector {
 
 using platform::Array;
 using platform::Dictionary;
-using platform::Value;
 
 namespace {
 

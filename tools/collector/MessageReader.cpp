@@ -81,7 +81,7 @@ Result<std::string> MessageReader::readLine() {
 Result<std::string> MessageReader::readChunkedBody(std::size_t maximumBytes) {
   std::string body;
   while (true) {
-    const auto line = readLine();
+    auto line = readLine();
     if (!line) return line;
     const auto size = parseChunkSize(line.value());
     if (!size) return Failure{"no chunk size: " + line.value()};
@@ -90,14 +90,14 @@ Result<std::string> MessageReader::readChunkedBody(std::size_t maximumBytes) {
     auto piece = readBody(*size);
     if (!piece) return piece;
     body += *piece;
-    const auto end = readLine();
+    auto end = readLine();
     if (!end) return end;
     if (!end->empty()) return Failure{"a chunk does not end where it says"};
   }
   // Trailers are read and dropped.
   std::size_t trailerBytes = 0;
   while (true) {
-    const auto line = readLine();
+    auto line = readLine();
     if (!line) return line;
     if (line->empty()) return body;
     trailerBytes += line->size();

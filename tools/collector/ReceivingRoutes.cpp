@@ -19,7 +19,7 @@ void answerStorebag(const Request& request, Response& response, const ApiContext
   HttpAnswer answer = context.storebags.answer(request.matches[1], received->header("If-Modified-Since"));
   response.status = answer.status;
   for (const auto& [name, value] : answer.headers) response.set_header(name, value);
-  if (!answer.body.empty()) response.set_content(std::move(answer.body), answer.contentType);
+  if (!answer.body.empty()) response.set_content(answer.body, answer.contentType);
 }
 
 void answerEvents(const Request& request, Response& response, const ApiContext& context) {

@@ -189,7 +189,7 @@ bool RelayConnection::send(const ReceivedRequest& request, const BackendAnswer& 
       _stream.waitForPeerToClose(std::nullopt);
       return false;
     case ConnectionFault::garbage:
-      _stream.write(std::string("\x16\x03garbage\r\n\0\xff\r\n\r\n", 18));
+      _stream.write(std::string("\x16\x03garbage\r\n\0\xff\r\n\r\n", 17));
       _stream.finish();
       return false;
     case ConnectionFault::none:

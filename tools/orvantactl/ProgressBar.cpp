@@ -16,7 +16,7 @@ constexpr double kRefreshSeconds = 0.1;
 
 std::string renderProgress(const Progress& progress) {
   const auto rate = progress.seconds > 0 ? static_cast<double>(progress.events) / progress.seconds : 0;
-  const auto count = fmt::format("{} events  {:.0f}/s", progress.events, rate);
+  auto count = fmt::format("{} events  {:.0f}/s", progress.events, rate);
   if (!progress.totalBytes || *progress.totalBytes == 0) return count;
   const double share = std::min(1.0, static_cast<double>(progress.bytes) / static_cast<double>(*progress.totalBytes));
   const auto filled = static_cast<std::size_t>(share * kWidth);

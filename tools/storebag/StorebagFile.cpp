@@ -52,9 +52,9 @@ Result<std::vector<std::uint8_t>> writePropertyList(const Value& value, Property
 Result<std::vector<std::uint8_t>> makeStorebag(const Value& inner, const SigningKey& key, PropertyListForm container,
                                                PropertyListForm bag) {
   if (inner.dictionary() == nullptr) return Failure{"a bag must be a dictionary"};
-  const auto bagBytes = writePropertyList(inner, bag);
+  auto bagBytes = writePropertyList(inner, bag);
   if (!bagBytes) return bagBytes;
-  const auto signature = key.sign(bagBytes.value());
+  auto signature = key.sign(bagBytes.value());
   if (!signature) return signature;
   return writePropertyList(platform::Dictionary{{"signature", platform::encodeBase64(signature.value())},
                                                 {"bag", platform::encodeBase64(bagBytes.value())}},
