@@ -39,12 +39,19 @@ HttpIntake::Entry HttpIntake::handIn(std::unique_ptr<PendingHttpRequest>& reques
   _charged += charge;
   ++_unfinished;
   _handedIn.push_back(std::move(request));
-  return {std::nullopt, _handedIn.size() == 1};
+  return {std::nullopt, std::exchange(_asleep, false)};
 }
 
 HttpIntake::Orders HttpIntake::take() {
   const std::lock_guard guard(_mutex);
+  _asleep = false;
   return {std::exchange(_handedIn, {}), _abortBlocking, _stop};
+}
+
+bool HttpIntake::mayFallAsleep() {
+  const std::lock_guard guard(_mutex);
+  _asleep = _handedIn.empty();
+  return _asleep;
 }
 
 void HttpIntake::release(const PendingHttpRequest& request) {

@@ -22,7 +22,7 @@ class HttpIntake {
 
   struct Entry {
     std::optional<std::string> refusal;  // why the request was not taken; it then stays with the caller
-    bool wake = false;                   // the HTTP thread may be asleep
+    bool wake = false;                   // the HTTP thread sleeps and was not woken yet
   };
   Entry handIn(std::unique_ptr<PendingHttpRequest>& request);
 
@@ -33,6 +33,9 @@ class HttpIntake {
   };
   // For the HTTP thread: what came in since the last call.
   Orders take();
+  // For the HTTP thread before it sleeps: false when there is something to take. While it works it is not woken, since
+  // it comes back here on its own.
+  bool mayFallAsleep();
   // A request's bytes no longer wait. Before its completion runs, so that this may hand in the next.
   void release(const PendingHttpRequest& request);
   // A request has ended, its completion is on its way.
@@ -56,6 +59,7 @@ class HttpIntake {
   std::size_t _unfinished = 0;  // taken in and not ended
   bool _abortBlocking = false;
   bool _closed = false;
+  bool _asleep = false;
   bool _stop = false;
 };
 

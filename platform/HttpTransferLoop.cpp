@@ -52,7 +52,7 @@ void HttpTransferLoop::run() {
       recoverFrom(code);
       continue;  // the lanes that this freed start their next
     }
-    if (!harvest()) sleep();
+    if (!harvest() && _intake.mayFallAsleep()) sleep();
   }
 }
 

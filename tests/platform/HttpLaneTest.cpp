@@ -1,4 +1,8 @@
 #include <atomic>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <map>
 #include <mutex>
 #include <thread>
 
@@ -228,6 +232,41 @@ TEST_F(HttpLaneTest, BlockedCallersLeaveThePoolAlive) {
     ASSERT_EQ(result.wait_for(std::chrono::seconds(30)), std::future_status::ready);
     EXPECT_EQ(result.get(), 200);
   }
+}
+
+// How often each thread called "http" has been given up or taken off a processor.
+std::map<std::string, std::string> httpThreadSwitches() {
+  std::map<std::string, std::string> switches;
+  for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
+    std::ifstream status(task.path() / "status");
+    std::string line;
+    std::getline(status, line);
+    if (line != "Name:\thttp") continue;
+    std::string& counts = switches[task.path().filename()];
+    while (std::getline(status, line)) {
+      if (line.find("ctxt_switches") != std::string::npos) counts += line;
+    }
+  }
+  return switches;
+}
+
+// Another client's time-out measures a while, in which the thread of an idle one must not run at all. It may still be
+// on its way to sleep in the first of them.
+TEST_F(HttpLaneTest, AnIdleClientHasNoWakeUps) {
+  RawServer server(RawServer::answering(RawServer::response("200 OK")));
+  RawServer silent([](RawConnection& connection) { connection.waitForClose(); });
+  ASSERT_EQ(statusOf(perform(get(server.url()))), 200);
+  ASSERT_EQ(httpThreadSwitches().size(), 1U);
+  const std::string idle = httpThreadSwitches().begin()->first;
+  const auto other = makeCurlHttpClient(_pool, {});
+  bool slept = false;
+  for (int i = 0; i < 5 && !slept; ++i) {
+    const std::string before = httpThreadSwitches()[idle];
+    EXPECT_FALSE(
+        other->perform(other->makeLane(), within(std::chrono::milliseconds(1500), get(silent.url()))).response);
+    slept = httpThreadSwitches()[idle] == before;
+  }
+  EXPECT_TRUE(slept);
 }
 
 TEST_F(HttpLaneTest, CompletionsMayHandInTheNext) {
