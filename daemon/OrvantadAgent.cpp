@@ -6,8 +6,13 @@
 #include "daemon/SessionConnection.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
+#include "platform/MemoryUse.h"
 
 namespace orvanta {
+
+namespace {
+constexpr std::chrono::seconds kBetweenReleases{10};
+}
 
 OrvantadAgent::OrvantadAgent(platform::Platform& platform)
     : OrvantadAgent(platform, [&platform](std::int32_t clientType, StorebagFetch& fetch) {
@@ -69,7 +74,17 @@ void OrvantadAgent::invalidated(const std::shared_ptr<OrvantadSession>& session)
 
 void OrvantadAgent::sessionEnded() {
   const std::lock_guard lock(_sessionListLock);
-  if (--_unended == 0) _allEnded.notify_all();
+  if (--_unended > 0) return;
+  _allEnded.notify_all();
+  if (!_ending) releaseMemoryWhenIdle();
+}
+
+// Nobody is here: what the sessions used may go. Not at each of many short visits.
+void OrvantadAgent::releaseMemoryWhenIdle() {
+  const auto now = std::chrono::steady_clock::now();
+  if (now - _memoryReleased < kBetweenReleases) return;
+  _memoryReleased = now;
+  _platform.pool().post([] { platform::releaseUnusedMemory(); });
 }
 
 void OrvantadAgent::endAllSessions() {

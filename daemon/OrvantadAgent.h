@@ -57,6 +57,8 @@ class OrvantadAgent final : public OrvantadSessionDelegate {
     std::shared_ptr<SessionConnection> connection;
   };
 
+  void releaseMemoryWhenIdle();  // with _sessionListLock held
+
   platform::Platform& _platform;
   const platform::Entitlements _entitlements;
 
@@ -64,6 +66,7 @@ class OrvantadAgent final : public OrvantadSessionDelegate {
   std::vector<Entry> _sessionList;  // guarded by _sessionListLock; in order of admission
   bool _ending = false;             // guarded by _sessionListLock
   std::size_t _unended = 0;         // guarded by _sessionListLock: admitted, and end() has not run to its end
+  std::chrono::steady_clock::time_point _memoryReleased;  // guarded by _sessionListLock
   std::condition_variable _allEnded;
 
   AgentLock _lock;

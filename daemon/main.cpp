@@ -6,6 +6,7 @@
 #include "interface/OrvantaLogging.h"
 #include "platform/KeepAlive.h"
 #include "platform/Listener.h"
+#include "platform/MemoryUse.h"
 #include "platform/Process.h"
 
 int main() {
@@ -13,6 +14,7 @@ int main() {
   using std::chrono::milliseconds;
 
   platform::enterUtilitySchedulingClass();
+  platform::tuneAllocator();
   OrvantaLogging::startLogging("orvantad", "Daemon");
   const auto files = platform::FileLocations::fromEnvironment();
   if (!enterDaemonSandbox(files)) return -1;
@@ -32,6 +34,7 @@ int main() {
   (*listener)->resume();
   platform::KeepAlive::ready();
   ORVANTA_LOG(info, "main: Listener resumes with sandbox, start loop.");
+  platform::releaseUnusedMemory();  // what only the start needed
 
   const int signal = platform::waitForTermination();
 

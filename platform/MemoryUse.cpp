@@ -1,0 +1,45 @@
+#include "platform/MemoryUse.h"
+
+#include <link.h>
+#include <malloc.h>
+#include <sys/mman.h>
+#include <unistd.h>
+
+#include <cstdint>
+
+namespace platform {
+
+namespace {
+
+constexpr int kKeptFreeBytes = 1 << 20;
+constexpr int kMappedFromBytes = 1 << 20;
+constexpr int kArenas = 2;
+
+// A segment that is never written holds nothing that its file does not.
+int dropReadOnlySegments(dl_phdr_info* object, std::size_t, void*) {
+  const auto page = static_cast<std::uintptr_t>(::sysconf(_SC_PAGESIZE));
+  for (int i = 0; i < object->dlpi_phnum; ++i) {
+    const auto& segment = object->dlpi_phdr[i];
+    if (segment.p_type != PT_LOAD || (segment.p_flags & PF_W) != 0) continue;
+    const std::uintptr_t begin = (object->dlpi_addr + segment.p_vaddr + page - 1) / page * page;
+    const std::uintptr_t end = (object->dlpi_addr + segment.p_vaddr + segment.p_memsz) / page * page;
+    // A shared last page may belong to the next segment, which is written.
+    if (begin < end) ::madvise(reinterpret_cast<void*>(begin), end - begin, MADV_DONTNEED);
+  }
+  return 0;
+}
+
+}  // namespace
+
+void tuneAllocator() {
+  ::mallopt(M_TRIM_THRESHOLD, kKeptFreeBytes);
+  ::mallopt(M_MMAP_THRESHOLD, kMappedFromBytes);
+  ::mallopt(M_ARENA_MAX, kArenas);
+}
+
+void releaseUnusedMemory() {
+  ::malloc_trim(0);
+  ::dl_iterate_phdr(dropReadOnlySegments, nullptr);
+}
+
+}  // namespace platform
