@@ -221,15 +221,23 @@ bool LinuxDeviceProperties::diagnosticsSubmissionAllowed() const {
 
 // tzset() looks at /etc/localtime's inode and time, one system call, and reads it only when they have changed;
 // localtime_r() alone would keep the zone that it saw first. The zone is the process's, and so is the lock: the C
-// library has one of its own, which thread checkers cannot see.
+// library has one of its own, which thread checkers cannot see. Every event asks, so that a thread remembers the answer
+// for as long as the clock shows the same second.
 int LinuxDeviceProperties::timeZoneOffset(double wallSeconds) const {
   if (!(std::abs(wallSeconds) < 1e15)) return 0;
   const auto seconds = static_cast<std::time_t>(std::floor(wallSeconds));
+  struct Answer {
+    std::time_t seconds = 0;
+    std::optional<int> offset;
+  };
+  thread_local Answer last;
+  if (last.offset && last.seconds == seconds) return *last.offset;
   std::tm local{};
   static std::mutex zoneMutex;
   const std::lock_guard lock(zoneMutex);
   ::tzset();
-  return ::localtime_r(&seconds, &local) != nullptr ? static_cast<int>(local.tm_gmtoff) : 0;
+  last = {seconds, ::localtime_r(&seconds, &local) != nullptr ? static_cast<int>(local.tm_gmtoff) : 0};
+  return *last.offset;
 }
 
 }  // namespace platform

@@ -25,7 +25,8 @@ class DeviceProperties {
   virtual std::optional<bool> automaticTimeZone() const = 0;
   // The user's consent to diagnostics submission: false unless granted.
   virtual bool diagnosticsSubmissionAllowed() const = 0;
-  // Seconds east of GMT of the local time zone now; follows changes of the system's zone.
+  // Seconds east of GMT of the local time zone at that moment; follows a change of the system's zone when asked about
+  // another second.
   virtual int timeZoneOffset(double wallSeconds) const = 0;
 };
 
