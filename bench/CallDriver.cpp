@@ -1,10 +1,12 @@
 #include "bench/CallDriver.h"
 
+#include <fmt/format.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 
 #include <chrono>
 #include <cstring>
+#include <random>
 #include <stdexcept>
 
 #include "platform/Connection.h"
@@ -62,10 +64,8 @@ void CallDriver::call(const std::vector<std::uint8_t>& message) {
   }
 }
 
-void CallDriver::pipeline(const std::vector<std::uint8_t>& request, std::size_t answerSize, std::uint64_t count,
+void CallDriver::pipeline(const std::vector<std::uint8_t>& burst, std::size_t answerSize, std::uint64_t count,
                           std::uint64_t window) {
-  std::vector<std::uint8_t> burst;
-  for (std::uint64_t i = 0; i < window; ++i) burst.insert(burst.end(), request.begin(), request.end());
   for (std::uint64_t sent = 0; sent < count; sent += window) {
     write(burst.data(), burst.size());
     read(answerSize * window);
@@ -93,22 +93,34 @@ std::vector<std::uint8_t> encodeCall(const char* method, const platform::Array& 
   return message;
 }
 
+std::vector<std::uint8_t> encodeEvents(std::uint32_t count) {
+  std::vector<std::uint8_t> burst;
+  for (std::uint32_t i = 0; i < count; ++i) {
+    const auto call = encodeCall("sendMessageWithDictionary",
+                                 {Dictionary{{"category", 5}, {"type", 6}, {"payload", samplePayload(i)}}});
+    burst.insert(burst.end(), call.begin(), call.end());
+  }
+  return burst;
+}
+
 Dictionary samplePayload(std::uint32_t number) {
-  return {{"bitrate", 2'400'000 + number % 1000},
-          {"bufferLevel", 12.5 + number % 7},
+  std::mt19937 random(number);  // the same in every run
+  const auto below = [&random](std::uint32_t limit) { return random() % limit; };
+  return {{"bitrate", 400'000 + below(7'000'000)},
+          {"bufferLevel", below(30'000) / 1000.0},
           {"codec", "avc1.640028"},
-          {"contentId", "a81f3c52-77b0-4f0e-9c1d-" + std::to_string(100'000 + number)},
-          {"droppedFrames", number % 13},
-          {"fullscreen", number % 2 == 0},
+          {"contentId", fmt::format("{:08x}-{:04x}-4f0e-9c1d-{:08x}", random(), below(0xffff), random())},
+          {"droppedFrames", below(130)},
+          {"fullscreen", below(2) == 0},
           {"networkType", "wifi"},
-          {"position", 18.25 * (number % 100)},
+          {"position", below(7'200'000) / 1000.0},
           {"quality", "1080p"},
-          {"rebufferCount", number % 3},
+          {"rebufferCount", below(4)},
           {"resolution", "1920x1080"},
-          {"server", "edge-14.fra"},
-          {"startupTime", 0.843},
-          {"title", "Episode " + std::to_string(number % 40)},
-          {"volume", 0.5}};
+          {"server", fmt::format("edge-{}.fra", below(64))},
+          {"startupTime", below(3000) / 1000.0},
+          {"title", fmt::format("Episode {}", below(40))},
+          {"volume", below(100) / 100.0}};
 }
 
 }  // namespace orvanta::bench

@@ -1,6 +1,7 @@
 #include "bench/Stages.h"
 
 #include <arpa/inet.h>
+#include <curl/curl.h>
 #include <fcntl.h>
 #include <fmt/core.h>
 #include <netinet/in.h>
@@ -164,6 +165,22 @@ double benchGzip(const std::string& body, const char* name) {
   return raw;
 }
 
+// The same over one kept-alive connection with nothing but the transport's library, one after the other.
+double libraryPost(const PostSink& sink, const std::string& body) {
+  CURL* const easy = curl_easy_init();
+  const std::string url = sink.url();
+  curl_easy_setopt(easy, CURLOPT_URL, url.c_str());
+  curl_easy_setopt(easy, CURLOPT_NOSIGNAL, 1L);
+  curl_easy_setopt(easy, CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(body.size()));
+  curl_easy_setopt(easy, CURLOPT_POSTFIELDS, body.data());
+  const auto figure = measure(kSeconds, [&] {
+    if (curl_easy_perform(easy) != CURLE_OK) throw std::runtime_error("the sink has gone");
+    return 1;
+  });
+  curl_easy_cleanup(easy);
+  return figure.cpuPerEvent;
+}
+
 // A post over one kept-alive connection with nothing but the socket.
 double rawPost(const PostSink& sink, const std::string& body) {
   const int fd = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
@@ -188,7 +205,8 @@ double rawPost(const PostSink& sink, const std::string& body) {
 
 double benchPost(const std::string& body) {
   const PostSink sink;
-  const double raw = rawPost(sink, body);
+  const double bare = rawPost(sink, body);
+  const double raw = libraryPost(sink, body);
   platform::WorkPool pool(1);
   pool.start();
   const auto client = platform::makeCurlHttpClient(pool, {});
@@ -217,7 +235,8 @@ double benchPost(const std::string& body) {
   client->shutdown(std::chrono::milliseconds(2000));
   pool.stop();
   printFigure(fmt::format("post of {} bytes over one lane", body.size()), figure);
-  printRatio("  against the bare socket", figure.cpuPerEvent, raw, 3.0);
+  printRatio("  against the library alone", figure.cpuPerEvent, raw, 2.0);
+  fmt::print("    (the bare socket takes {:.3f} us)\n", bare);
   return raw;
 }
 

@@ -1,5 +1,6 @@
 #include <fmt/core.h>
 
+#include <cstdio>
 #include <exception>
 #include <string_view>
 
@@ -11,15 +12,16 @@
 int main(int argumentCount, char** arguments) {
   using namespace orvanta::bench;
   const std::string_view only = argumentCount > 1 ? arguments[1] : "";
-  if (!only.empty() && only != "calls" && only != "stages") {
-    fmt::print("usage: orvanta-bench [calls | stages]\n");
+  if (!only.empty() && only != "calls" && only != "stages" && only != "whole") {
+    fmt::print("usage: orvanta-bench [calls | stages | whole]\n");
     return 2;
   }
+  std::setvbuf(stdout, nullptr, _IOLBF, 0);
   try {
-    if (only != "stages") benchCallPath();
+    if (only != "stages" && only != "whole") benchCallPath();
     if (only == "calls") return 0;
     const RawLimits limits = benchStages();
-    if (only.empty()) benchWholePath(limits);
+    if (only != "stages") benchWholePath(limits);
   } catch (const std::exception& error) {
     fmt::print(stderr, "orvanta-bench: {}\n", error.what());
     return 1;
