@@ -66,11 +66,14 @@ class PostQueue::Outcome {
     if (_completion) complete(makeOrvantaError("the post was dropped", kLocalFailure));
   }
 
-  // On the HTTP client's thread. The backend, if this was its last reference, is let go of in finish().
-  void observe(const platform::HttpResult& result) {
-    if (!result.response || !isServerError(result.response->status)) return;
+  // On the HTTP client's thread. Whether finish() has anything to do: most posts are taken, and nobody waits for them.
+  // The backend, if this was its last reference, is let go of there.
+  bool observe(const platform::HttpResult& result) {
+    if (!result.response) return true;
+    if (!isServerError(result.response->status)) return static_cast<bool>(_completion);
     _kept = _backend.lock();
     if (_kept) _kept->setState(kBackendDisabled);
+    return true;
   }
 
   void finish(const platform::HttpResult& result) {
@@ -146,7 +149,7 @@ void PostQueue::compressAndStart(Job& job) {
   _waitingBytes -= charge;
   _http.start(
       _lane, std::move(request),
-      [outcome = job.outcome](const platform::HttpResult& result) { outcome->observe(result); },
+      [outcome = job.outcome](const platform::HttpResult& result) { return outcome->observe(result); },
       [outcome = job.outcome](const platform::HttpResult& result) { outcome->finish(result); });
 }
 

@@ -81,7 +81,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
   virtual const std::string& description() const = 0;
   virtual void setDescription(std::string text) = 0;
 
-  static constexpr int kFramesPerTurn = 64;
+  static constexpr int kFramesPerTurn = 256;
 };
 
 // Encoders of whole messages, appended to `out`.

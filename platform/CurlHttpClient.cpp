@@ -50,9 +50,7 @@ std::optional<std::string> whyUnsendable(const HttpRequest& request) {
 }  // namespace
 
 CurlHttpClient::CurlHttpClient(WorkPool& pool, HttpClientOptions options)
-    : _pool(pool), _options(std::move(options)), _intake(_options.limits) {
-  curl_global_init(CURL_GLOBAL_DEFAULT);  // counted, and safe from several threads
-}
+    : _pool(pool), _options(std::move(options)), _intake(_options.limits) {}
 
 CurlHttpClient::~CurlHttpClient() {
   CurlHttpClient::shutdown(std::chrono::milliseconds(0));
@@ -62,8 +60,8 @@ std::shared_ptr<HttpLane> CurlHttpClient::makeLane(LaneKind kind) {
   return std::make_shared<HttpLaneQueue>(kind, _pool.makeQueue());
 }
 
-void CurlHttpClient::start(const std::shared_ptr<HttpLane>& lane, HttpRequest request,
-                           UniqueFunction<void(const HttpResult&)> observe, Completion completion) {
+void CurlHttpClient::start(const std::shared_ptr<HttpLane>& lane, HttpRequest request, Observer observe,
+                           Completion completion) {
   auto pending = std::make_unique<PendingHttpRequest>();
   pending->request = std::move(request);
   pending->lane = std::static_pointer_cast<HttpLaneQueue>(lane);
@@ -114,6 +112,8 @@ std::optional<std::string> CurlHttpClient::ensureRunning() {
   if (_running.load(std::memory_order_acquire) != nullptr) return std::nullopt;
   const std::lock_guard guard(_threadMutex);
   if (_loop || _shutDown) return std::nullopt;  // after the shutdown the intake has the word
+  // Takes milliseconds and megabytes, which a daemon without traffic does not need. Safe from several threads.
+  if (curl_global_init(CURL_GLOBAL_DEFAULT) != CURLE_OK) return "The HTTP client cannot start";
   auto loop = HttpTransferLoop::create(_intake, _options);
   if (!loop) return "The HTTP client cannot start";
   try {

@@ -21,8 +21,8 @@ class CurlHttpClient final : public HttpClient {
   ~CurlHttpClient() override;
 
   std::shared_ptr<HttpLane> makeLane(LaneKind kind) override;
-  void start(const std::shared_ptr<HttpLane>& lane, HttpRequest request,
-             UniqueFunction<void(const HttpResult&)> observe, Completion completion) override;
+  void start(const std::shared_ptr<HttpLane>& lane, HttpRequest request, Observer observe,
+             Completion completion) override;
   HttpResult perform(const std::shared_ptr<HttpLane>& lane, HttpRequest request) override;
   void abortBlockingRequests() override;
   void shutdown(std::chrono::milliseconds patience) override;

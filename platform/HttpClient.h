@@ -68,7 +68,7 @@ struct HttpLimits {
 // Answers above 16 MiB fail. A request that does not fit a lane's or the client's limit fails at once with a transport
 // error that says so.
 //
-// Every call may come from any thread. Each completion runs exactly once.
+// Every call may come from any thread. Each completion runs exactly once, unless its observer makes it needless.
 class HttpClient {
  public:
   // Unrefused: requests of the lane are exempt from the limits on waiting bytes.
@@ -79,11 +79,13 @@ class HttpClient {
   virtual ~HttpClient() = default;
   virtual std::shared_ptr<HttpLane> makeLane(LaneKind kind = LaneKind::limited) = 0;
 
-  // Hands the request in and returns. `observe`, when given, runs first, on the client's own thread (or the caller's
-  // when the request is refused at once): it must not block, lock for long or call the client. `completion` runs on the
-  // pool afterwards.
-  virtual void start(const std::shared_ptr<HttpLane>& lane, HttpRequest request,
-                     UniqueFunction<void(const HttpResult&)> observe, Completion completion) = 0;
+  // Sees the result first, on the client's own thread (or the caller's when the request is refused at once): it must
+  // not block, lock for long or call the client. Whether the completion is still wanted; if not, it is dropped.
+  using Observer = UniqueFunction<bool(const HttpResult&)>;
+
+  // Hands the request in and returns. `observe` may be empty. `completion` runs on the pool afterwards.
+  virtual void start(const std::shared_ptr<HttpLane>& lane, HttpRequest request, Observer observe,
+                     Completion completion) = 0;
 
   // Hands the request in and waits, in a BlockingScope, for its end.
   virtual HttpResult perform(const std::shared_ptr<HttpLane>& lane, HttpRequest request) = 0;

@@ -38,8 +38,10 @@ HttpIntake::Entry HttpIntake::handIn(std::unique_ptr<PendingHttpRequest>& reques
   lane.charged += charge;
   _charged += charge;
   ++_unfinished;
+  // Behind another request of its lane it cannot start before that has ended, and then the thread is awake.
+  const bool mustBeSeen = lane.unfinished++ == 0 || request->deadline.has_value();
   _handedIn.push_back(std::move(request));
-  return {std::nullopt, std::exchange(_asleep, false)};
+  return {std::nullopt, mustBeSeen && std::exchange(_asleep, false)};
 }
 
 HttpIntake::Orders HttpIntake::take() {
@@ -57,6 +59,7 @@ bool HttpIntake::mayFallAsleep() {
 void HttpIntake::release(const PendingHttpRequest& request) {
   const std::lock_guard guard(_mutex);
   request.lane->charged -= request.charge;
+  --request.lane->unfinished;
   _charged -= request.charge;
 }
 

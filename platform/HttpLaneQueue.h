@@ -23,7 +23,8 @@ class HttpLaneQueue final : public HttpLane {
   const HttpClient::LaneKind kind;
   const std::shared_ptr<WorkQueue> completions;
 
-  // Guarded by the intake's mutex: what the lane's requests are charged, from the hand-in to the end.
+  // Guarded by the intake's mutex: the lane's requests from the hand-in to the end, and what they are charged.
+  std::size_t unfinished = 0;
   std::size_t charged = 0;
 
   // The HTTP thread's.

@@ -216,7 +216,7 @@ void HttpTransferLoop::end(std::unique_ptr<PendingHttpRequest> request, HttpResu
 }
 
 void HttpTransferLoop::deliver(std::unique_ptr<PendingHttpRequest> request, HttpResult result) {
-  if (request->observe) request->observe(result);
+  if (request->observe && !request->observe(result)) return;
   if (!request->completion) return;
   if (request->blocking) return request->completion(std::move(result));
   request->lane->completions->post([completion = std::move(request->completion), result = std::move(result)]() mutable {

@@ -24,10 +24,10 @@ struct PendingHttpRequest {
   HttpHeaderList headers;  // of `request`, until it is in flight
   std::shared_ptr<HttpLaneQueue> lane;
   std::optional<std::chrono::steady_clock::time_point> deadline;
-  UniqueFunction<void(const HttpResult&)> observe;  // on the HTTP thread
-  HttpClient::Completion completion;                // on the lane's queue, or on the HTTP thread for a blocking request
-  bool blocking = false;                            // somebody sits in perform()
-  std::size_t charge = 0;                           // bytes that count towards the limits
+  HttpClient::Observer observe;       // on the HTTP thread
+  HttpClient::Completion completion;  // on the lane's queue, or on the HTTP thread for a blocking request
+  bool blocking = false;              // somebody sits in perform()
+  std::size_t charge = 0;             // bytes that count towards the limits
 
   // The HTTP thread's own.
   std::unique_ptr<CurlTransfer> transfer;  // while in flight

@@ -63,8 +63,12 @@ void PoolThreads::launch(bool extra) {
 }
 
 void PoolThreads::serveAsExtra() {
+  auto look = std::chrono::steady_clock::now() + kLinger;
   for (;;) {
-    if (!_loop.runOne(kLinger) && retireIfSuperfluous()) return;
+    // Also while there is work: more threads than processors only stand in each other's way.
+    if (_loop.runOne(kLinger) && std::chrono::steady_clock::now() < look) continue;
+    if (retireIfSuperfluous()) return;
+    look = std::chrono::steady_clock::now() + kLinger;
   }
 }
 

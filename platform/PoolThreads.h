@@ -10,8 +10,8 @@ namespace platform {
 
 // The threads of a WorkPool: a fixed number, and extra ones that stand in for threads that block.
 //
-// Owned by its pool. An extra thread starts when fewer than the fixed number would be left to run jobs, and ends once
-// it has been superfluous and without work for kLinger. All operations may be called from any thread.
+// Owned by its pool. An extra thread starts when fewer than the fixed number would be left to run jobs, and ends when
+// it is superfluous after kLinger. All operations may be called from any thread.
 class PoolThreads {
  public:
   static constexpr std::chrono::milliseconds kLinger{1000};

@@ -125,6 +125,7 @@ TEST_F(HttpLaneTest, TheObserverComesFirstOnAThreadOfTheClient) {
           EXPECT_EQ(result.response.has_value(), result.error.empty());
           observer = std::this_thread::get_id();
           observed = true;
+          return true;
         },
         [&](HttpResult) {
           EXPECT_TRUE(observed);
@@ -147,7 +148,11 @@ TEST_F(HttpLaneTest, ARefusalIsObservedAtOnceAndCompletesOnThePool) {
   std::thread::id observer;
   std::promise<std::string> error;
   client().start(
-      client().makeLane(), post("ftp://127.0.0.1/"), [&](const HttpResult&) { observer = std::this_thread::get_id(); },
+      client().makeLane(), post("ftp://127.0.0.1/"),
+      [&](const HttpResult&) {
+        observer = std::this_thread::get_id();
+        return true;
+      },
       [&](HttpResult result) { error.set_value(result.error); });
   EXPECT_EQ(observer, std::this_thread::get_id());
   EXPECT_TRUE(has(error.get_future().get(), "neither http nor https"));

@@ -100,8 +100,7 @@ class TellingHttpClient final : public HttpClient {
   explicit TellingHttpClient(Ends& ends) : _ends(ends) {}
   ~TellingHttpClient() override { _ends.order.emplace_back("client destroyed"); }
   std::shared_ptr<HttpLane> makeLane(LaneKind) override { return std::make_shared<HttpLane>(); }
-  void start(const std::shared_ptr<HttpLane>&, HttpRequest, UniqueFunction<void(const HttpResult&)>,
-             Completion) override {}
+  void start(const std::shared_ptr<HttpLane>&, HttpRequest, Observer, Completion) override {}
   HttpResult perform(const std::shared_ptr<HttpLane>&, HttpRequest) override { return {}; }
   void abortBlockingRequests() override {}
   void shutdown(std::chrono::milliseconds) override { _ends.order.emplace_back("client shut down"); }

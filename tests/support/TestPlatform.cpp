@@ -14,8 +14,8 @@ std::shared_ptr<HttpLane> ScriptedHttpClient::makeLane(LaneKind) {
   return std::make_shared<HttpLane>();
 }
 
-void ScriptedHttpClient::start(const std::shared_ptr<HttpLane>&, HttpRequest request,
-                               platform::UniqueFunction<void(const HttpResult&)> observe, Completion completion) {
+void ScriptedHttpClient::start(const std::shared_ptr<HttpLane>&, HttpRequest request, Observer observe,
+                               Completion completion) {
   {
     const std::lock_guard lock(_mutex);
     _requests.push_back(request);
@@ -25,7 +25,7 @@ void ScriptedHttpClient::start(const std::shared_ptr<HttpLane>&, HttpRequest req
     }
   }
   HttpResult result = answerFor(request);
-  if (observe) observe(result);
+  if (observe && !observe(result)) return;
   if (completion) completion(std::move(result));
 }
 
@@ -55,7 +55,7 @@ bool ScriptedHttpClient::finishHeld(HttpResult result) {
     taken = std::move(_held.front());
     _held.erase(_held.begin());
   }
-  if (taken.observe) taken.observe(result);
+  if (taken.observe && !taken.observe(result)) return true;
   if (taken.completion) taken.completion(std::move(result));
   return true;
 }

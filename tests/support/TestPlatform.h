@@ -43,7 +43,7 @@ class ScriptedHttpClient final : public platform::HttpClient {
  public:
   struct Taken {
     platform::HttpRequest request;
-    platform::UniqueFunction<void(const platform::HttpResult&)> observe;
+    Observer observe;
     Completion completion;
   };
   // The answer to requests that nobody holds; default 200 with an empty body. May be called on several threads at once.
@@ -52,8 +52,8 @@ class ScriptedHttpClient final : public platform::HttpClient {
   bool hold = false;
 
   std::shared_ptr<platform::HttpLane> makeLane(LaneKind kind) override;
-  void start(const std::shared_ptr<platform::HttpLane>& lane, platform::HttpRequest request,
-             platform::UniqueFunction<void(const platform::HttpResult&)> observe, Completion completion) override;
+  void start(const std::shared_ptr<platform::HttpLane>& lane, platform::HttpRequest request, Observer observe,
+             Completion completion) override;
   platform::HttpResult perform(const std::shared_ptr<platform::HttpLane>& lane, platform::HttpRequest request) override;
   void abortBlockingRequests() override {}
   void shutdown(std::chrono::milliseconds) override {}
