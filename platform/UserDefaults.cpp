@@ -186,8 +186,10 @@ Result<bool> UserDefaults::replaceFile(const DirectoryLock& lock, const Dictiona
   if (!fd) return Failure{fmt::format("cannot make {}.new: {}", _path, reason(errno))};
   struct stat before {};
   const bool replaces = ::fstatat(directory, _fileName.c_str(), &before, 0) == 0;
-  // A file that another account may read stays readable for it when an administrator's program writes.
-  if (replaces && before.st_uid != ::geteuid() && ::fchown(fd.get(), before.st_uid, before.st_gid) != 0) {
+  // A file that another account may read stays readable for it when an administrator's program writes; a first file
+  // of root's belongs to the account that the directory belongs to.
+  const bool takesOwner = replaces || (::geteuid() == 0 && ::fstat(directory, &before) == 0);
+  if (takesOwner && before.st_uid != ::geteuid() && ::fchown(fd.get(), before.st_uid, before.st_gid) != 0) {
     PLATFORM_LOG(warning, "UserDefaults: {} changes its owner: {}", _path, reason(errno));
   }
   if ((replaces && ::fchmod(fd.get(), before.st_mode & 07777U) != 0) || !writeAll(fd.get(), *text) ||
