@@ -7,7 +7,7 @@ namespace orvanta {
 
 namespace {
 
-constexpr std::uint32_t kEnvironmentTypeCount = 5;
+constexpr std::int64_t kEnvironmentTypeCount = 5;
 
 struct Environment {
   EnvironmentType type;
@@ -16,10 +16,13 @@ struct Environment {
 EnvironmentType userDefaultsEnvironment(platform::Platform& platform) {
   EnvironmentType type = EnvironmentType::none;
   if (const auto setting = platform.defaults().value("environmentType")) {
-    const auto number = static_cast<std::uint32_t>(setting->integerValue());
-    type = static_cast<EnvironmentType>(number);
-    if (number >= kEnvironmentTypeCount) {
-      ORVANTA_LOG(error, "userDefaultsEnvironment: Invalid environment type {}", number);
+    const std::int64_t number = setting->integerValue();
+    if (number >= 0 && number < kEnvironmentTypeCount) {
+      type = static_cast<EnvironmentType>(number);
+    } else {
+      // A negative number is shown as the unsigned one of 32 bits that it stands for.
+      ORVANTA_LOG(error, "userDefaultsEnvironment: Invalid environment type {}",
+                  number < 0 ? static_cast<std::uint32_t>(number) : static_cast<std::uint64_t>(number));
       type = EnvironmentType::internal;
     }
   } else {

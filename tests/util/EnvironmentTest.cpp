@@ -30,6 +30,7 @@ TEST(Environment, isTheSettingOrFollowsTheBuild) {
       {Value("release"), false, 0, ""},
       {Value(5), false, 2, "5"},
       {Value(7), false, 2, "7"},
+      {Value(std::int64_t{0x1'0000'0001}), false, 2, "4294967297"},  // not 1 with its upper half cut off
       {Value(-1), false, 2, "4294967295"},
       {Value("-3"), false, 2, "4294967293"},
   };
