@@ -1,4 +1,5 @@
 #include <cstdlib>
+#include <filesystem>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -34,16 +35,14 @@ struct DefaultsOptions {
   std::string text;
   std::string type = "string";
 
-  platform::UserDefaults open() const {
-    std::string directory = stateDirectory;
-    if (directory.empty()) {
-      const char* set = std::getenv("STATE_DIRECTORY");
-      const std::string_view value = set == nullptr ? "" : set;
-      directory = value.substr(0, value.find(':'));
-    }
-    if (directory.empty()) directory = "/var/lib/orvanta";
-    return {directory, std::string(kOrvantaUserDefaultsDomain)};
+  std::string directory() const {
+    if (!stateDirectory.empty()) return stateDirectory;
+    const char* set = std::getenv("STATE_DIRECTORY");
+    const std::string_view value = set == nullptr ? "" : set;
+    std::string first(value.substr(0, value.find(':')));
+    return first.empty() ? "/var/lib/orvanta" : first;
   }
+  platform::UserDefaults open() const { return {directory(), std::string(kOrvantaUserDefaultsDomain)}; }
 };
 
 int read(const DefaultsOptions& options) {
@@ -62,6 +61,11 @@ int read(const DefaultsOptions& options) {
 }
 
 int store(const DefaultsOptions& options, platform::Value value) {
+  // A store makes its directory; here a missing one is a typing error, or the daemon has never run.
+  if (!std::filesystem::is_directory(options.directory())) {
+    complain("There is no directory " + options.directory());
+    return kSomethingNotTaken;
+  }
   auto defaults = options.open();
   const auto stored = defaults.set(options.key, std::move(value));
   if (stored) return kAllTaken;
