@@ -39,6 +39,8 @@ class Outbox {
   virtual bool sendWithDescriptor(std::span<const std::uint8_t> message, UniqueFd descriptor) = 0;
   // Bytes not yet taken by the socket.
   virtual std::size_t pending() const = 0;
+  // Whether the peer has gone, so that every message is dropped from now on.
+  virtual bool isClosed() const = 0;
 };
 
 // What a connection's owner gets to hear. Every call comes on the connection's queue, one at a time, and none after

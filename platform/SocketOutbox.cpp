@@ -97,6 +97,11 @@ void SocketOutbox::writeGathered() {
   if (tell) tell->outboxEased();
 }
 
+bool SocketOutbox::isClosed() const {
+  const std::lock_guard lock(_mutex);
+  return _state != State::open;
+}
+
 bool SocketOutbox::broken() const {
   const std::lock_guard lock(_mutex);
   return _state == State::broken;

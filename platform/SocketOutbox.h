@@ -41,6 +41,7 @@ class SocketOutbox final : public Outbox, public std::enable_shared_from_this<So
   bool send(std::span<const std::uint8_t> message, Urgency urgency) override;
   bool sendWithDescriptor(std::span<const std::uint8_t> message, UniqueFd descriptor) override;
   std::size_t pending() const override { return _pending.load(std::memory_order_relaxed); }
+  bool isClosed() const override;
 
   // Between the two, what the calling thread sends is gathered.
   void beginGathering();

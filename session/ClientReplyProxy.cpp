@@ -18,7 +18,7 @@ void ClientReplyProxy::sendMessageToClient(const platform::SharedDictionary& ses
     }
     return;
   }
-  if (_outbox->pending() == 0) {
+  if (_outbox->isClosed()) {
     ORVANTA_LOG(error, "sendMessageWithDictionary: Failed to get remote object proxy: {}", "the connection is closed");
     return;
   }

@@ -21,6 +21,7 @@ class NotedSession final : public ClientSessionInterface {
   std::string called;
   StringReply keptReply;
   bool dropReplies = false;
+  bool keepReplies = false;
 
   void setSessionInfo(SharedDictionary info, SharedDictionary user, SharedArray frameworks, bool aggregates,
                       DoneReply done) override {
@@ -70,6 +71,10 @@ class NotedSession final : public ClientSessionInterface {
   void answer(std::string text, StringReply reply) {
     called = text;
     if (dropReplies) return;
+    if (keepReplies) {
+      keptReply = std::move(reply);
+      return;
+    }
     reply(std::move(text));
   }
 };
@@ -142,40 +147,22 @@ TEST_F(RemoteCallsTest, WhatDoesNotFitIsAnsweredAndNotCarriedOut) {
       {"", {}, "unknown method ''"},
       {"setSessionInfo", {info, nullptr, nullptr}, "setSessionInfo takes 4 arguments, 3 were given"},
       {"setSessionInfo", {info, nullptr, nullptr, false, 1}, "setSessionInfo takes 4 arguments, 5 were given"},
-      {"setSessionInfo", {nullptr, nullptr, nullptr, false}, "setSessionInfo: argument 'sessionInfo' must be a map"},
-      {"setSessionInfo", {info, 5, nullptr, false}, "setSessionInfo: argument 'userInfo' must be a map or nil"},
-      {"setSessionInfo",
-       {info, nullptr, "x", false},
-       "setSessionInfo: argument 'frameworksToCheck' must be an array or nil"},
-      {"setSessionInfo",
-       {info, nullptr, nullptr, 1},
-       "setSessionInfo: argument 'hasAggregationBlock' must be a boolean"},
-      {"setSessionInfo",
-       {info, nullptr, nullptr, nullptr},
-       "setSessionInfo: argument 'hasAggregationBlock' must be a boolean"},
-      {"sendMessageWithCategory",
-       {65536, 0, nullptr},
-       "sendMessageWithCategory: argument 'category' must be an integer from 0 to 65535"},
-      {"sendMessageWithCategory",
-       {0, -1, nullptr},
-       "sendMessageWithCategory: argument 'type' must be an integer from 0 to 65535"},
-      {"sendMessageWithCategory",
-       {0, 1.0, nullptr},
-       "sendMessageWithCategory: argument 'type' must be an integer from 0 to 65535"},
-      {"sendMessageWithCategory",
-       {0, 18446744073709551615ULL, nullptr},
-       "sendMessageWithCategory: argument 'type' must be an integer from 0 to 65535"},
-      {"sendMessageWithCategory",
-       {true, 0, nullptr},
-       "sendMessageWithCategory: argument 'category' must be an integer from 0 to 65535"},
-      {"sendMessageWithCategory", {0, 0, Array{}}, "sendMessageWithCategory: argument 'payload' must be a map or nil"},
-      {"sendMessageWithDictionary", {nullptr}, "sendMessageWithDictionary: argument 'messageParameters' must be a map"},
-      {"uploadFileAtPath", {nullptr, nullptr}, "uploadFileAtPath: argument 'fileURL' must be a string"},
-      {"uploadFileAtPath", {"file:///a", 3}, "uploadFileAtPath: argument 'extensionToken' must be a string or nil"},
-      {"uploadLogData", {nullptr}, "uploadLogData: argument 'logData' must be an array"},
-      {"sendMessageWithSessionInfo",
-       {nullptr, nullptr, 0, 0, nullptr},
-       "sendMessageWithSessionInfo: argument 'sessionInfo' must be a map"},
+      {"setSessionInfo", {nullptr, nullptr, nullptr, false}, "'sessionInfo' must be a map"},
+      {"setSessionInfo", {info, 5, nullptr, false}, "'userInfo' must be a map or nil"},
+      {"setSessionInfo", {info, nullptr, "x", false}, "'frameworksToCheck' must be an array or nil"},
+      {"setSessionInfo", {info, nullptr, nullptr, 1}, "'hasAggregationBlock' must be a boolean"},
+      {"setSessionInfo", {info, nullptr, nullptr, nullptr}, "'hasAggregationBlock' must be a boolean"},
+      {"sendMessageWithCategory", {65536, 0, nullptr}, "'category' must be an integer from 0 to 65535"},
+      {"sendMessageWithCategory", {0, -1, nullptr}, "'type' must be an integer from 0 to 65535"},
+      {"sendMessageWithCategory", {0, 1.0, nullptr}, "'type' must be an integer from 0 to 65535"},
+      {"sendMessageWithCategory", {0, 18446744073709551615ULL, nullptr}, "'type' must be an integer from 0 to 65535"},
+      {"sendMessageWithCategory", {true, 0, nullptr}, "'category' must be an integer from 0 to 65535"},
+      {"sendMessageWithCategory", {0, 0, Array{}}, "'payload' must be a map or nil"},
+      {"sendMessageWithDictionary", {nullptr}, "'messageParameters' must be a map"},
+      {"uploadFileAtPath", {nullptr, nullptr}, "'fileURL' must be a string"},
+      {"uploadFileAtPath", {"file:///a", 3}, "'extensionToken' must be a string or nil"},
+      {"uploadLogData", {nullptr}, "'logData' must be an array"},
+      {"sendMessageWithSessionInfo", {nullptr, nullptr, 0, 0, nullptr}, "'sessionInfo' must be a map"},
   };
   for (const auto& row : rows) {
     outbox->frames.clear();
@@ -185,7 +172,8 @@ TEST_F(RemoteCallsTest, WhatDoesNotFitIsAnsweredAndNotCarriedOut) {
     const auto response = answer();
     ASSERT_TRUE(response) << row.error;
     ASSERT_NE(response->error.string(), nullptr);
-    EXPECT_EQ(*response->error.string(), row.error);
+    const std::string expected = row.error[0] == '\'' ? std::string(row.method) + ": argument " + row.error : row.error;
+    EXPECT_EQ(*response->error.string(), expected);
   }
 }
 
@@ -206,35 +194,15 @@ TEST_F(RemoteCallsTest, ADroppedReplyReachesTheCallerAsAnError) {
 }
 
 TEST_F(RemoteCallsTest, RepliesOutliveTheirConnection) {
-  struct Keeper final : platform::Outbox {
-    bool send(std::span<const std::uint8_t>, Urgency) override { return false; }
-    bool sendWithDescriptor(std::span<const std::uint8_t>, platform::UniqueFd) override { return false; }
-    std::size_t pending() const override { return 0; }
-  };
-  class Keeping final : public ClientSessionInterface {
-   public:
-    StringReply kept;
-    void setSessionInfo(SharedDictionary, SharedDictionary, SharedArray, bool, DoneReply) override {}
-    void startConfigWithCompletionHandler(BackendNamesReply) override {}
-    void fetchStatesWithUserInfo(SharedDictionary, BackendNamesReply) override {}
-    void fetchDisplayURL(StringReply reply) override { kept = std::move(reply); }
-    void sendMessageWithCategory(std::uint16_t, std::uint16_t, SharedDictionary, StringReply) override {}
-    void sendMessageWithDictionary(SharedDictionary, StringReply) override {}
-    void flushMessagesWithCompletion(FlushReply) override {}
-    void finishSessionWithReply(StringReply) override {}
-    void uploadFileAtPath(std::string, std::optional<std::string>, UploadReply) override {}
-    void uploadLogData(SharedArray, LogDataReply) override {}
-    void sendMessageWithSessionInfo(SharedDictionary, SharedDictionary, std::uint16_t, std::uint16_t, SharedDictionary,
-                                    StringReply) override {}
-  } keeping;
   std::weak_ptr<platform::Outbox> gone;
   {
-    auto outbox = std::make_shared<Keeper>();
-    gone = outbox;
-    dispatchCall(frame("fetchDisplayURL", {}), keeping, outbox);
+    const auto shortLived = std::make_shared<RecordingConnection::Received>();
+    gone = shortLived;
+    session.keepReplies = true;
+    dispatchCall(frame("fetchDisplayURL", {}), session, shortLived);
   }
   EXPECT_TRUE(gone.expired()) << "a reply keeps its connection's outbox alive";
-  keeping.kept("late");
+  session.keptReply("late");
 }
 
 TEST_F(RemoteCallsTest, ResponsesReadBackAsTheValuesThatWereGiven) {

@@ -71,7 +71,8 @@ void RecordingDelegate::invalidated(const std::optional<std::string>& protocolEr
 template <class Condition>
 bool RecordingDelegate::waitFor(Condition condition) {
   std::unique_lock lock(_mutex);
-  return _changed.wait_for(lock, kHangGuard, condition);
+  if (!_changed.wait_for(lock, kHangGuard, condition)) hung("a call of the delegate");
+  return true;
 }
 
 bool RecordingDelegate::waitForFrames(std::size_t count) {
@@ -195,6 +196,9 @@ ConnectionFixture::Made ConnectionFixture::make(platform::ConnectionLimits limit
   made.connection = platform::Connection::create(*_pool, platform::UniqueFd(fds[0]), limits);
   made.delegate = std::make_shared<RecordingDelegate>();
   made.peer = Peer(platform::UniqueFd(fds[1]));
+  made.stop = std::shared_ptr<void>(nullptr, [this](void*) {
+    if (_pool) _pool->stop();
+  });
   return made;
 }
 

@@ -95,6 +95,8 @@ class ConnectionFixture : public ::testing::Test {
     std::shared_ptr<platform::Connection> connection;
     std::shared_ptr<RecordingDelegate> delegate;
     Peer peer;
+    // Declared behind what its handlers use, it stops the pool before that goes, however the test ends.
+    std::shared_ptr<void> stop;
   };
   void startPool(std::size_t threads);  // in place of the one before
   // Not resumed.

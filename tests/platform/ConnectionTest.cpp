@@ -210,7 +210,6 @@ TEST_F(ConnectionTest, GathersTheAnswersOfATurnUntilItBlocks) {
   EXPECT_EQ(made.peer.read(expected.size()), expected);
   EXPECT_TRUE(gathered);
   EXPECT_TRUE(written);
-  _pool->stop();
 }
 
 TEST_F(ConnectionTest, ABusyConnectionLetsOthersHaveTheirTurn) {

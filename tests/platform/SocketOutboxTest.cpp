@@ -56,7 +56,6 @@ TEST_F(OutboxTest, StopsReadingWhileThePeerReadsNoReplies) {
   EXPECT_LE(mostPending, limit) << "a call was carried out while too many replies waited";
   ASSERT_TRUE(made.peer.write(request(1, "afterwards")));
   EXPECT_EQ(made.peer.read(reply.size()), reply);
-  _pool->stop();
 }
 
 TEST_F(OutboxTest, APeerThatNeverReadsMayStillClose) {
@@ -83,7 +82,6 @@ TEST_F(OutboxTest, WritesWhileItsConnectionIsBusy) {
   EXPECT_EQ(made.peer.read(sent.size()), sent);
   EXPECT_TRUE(eventually([&] { return made.connection->outbox()->pending() == 0; }));
   release.add();
-  _pool->stop();
 }
 
 TEST_F(OutboxTest, DropsOnlyDroppableMessagesWhole) {
@@ -98,12 +96,16 @@ TEST_F(OutboxTest, DropsOnlyDroppableMessagesWhole) {
   EXPECT_GT(outbox.pending(), limit - 2 * event.size());
   EXPECT_TRUE(outbox.send(event));  // a reply is never dropped
   EXPECT_FALSE(outbox.send(event, Outbox::Urgency::droppable));
+  EXPECT_FALSE(outbox.isClosed());
   EXPECT_TRUE(outbox.send(notice));
   expected = std::move(expected) + event + notice;
   EXPECT_EQ(made.peer.read(expected.size()), expected);
   EXPECT_TRUE(outbox.send(event, Outbox::Urgency::droppable));
   EXPECT_EQ(made.peer.read(event.size()), event);
   EXPECT_FALSE(made.peer.hasBytes());
+  made.peer.close();
+  ASSERT_TRUE(made.delegate->waitForInvalidation());
+  EXPECT_TRUE(outbox.isClosed());
 }
 
 TEST_F(OutboxTest, MessagesOfManyThreadsStayWholeAndInOrder) {
@@ -156,7 +158,6 @@ TEST_F(OutboxTest, MessagesOfManyThreadsStayWholeAndInOrder) {
   EXPECT_EQ(answers, kMessages);
   for (auto& sender : senders) sender.join();
   caller.join();
-  _pool->stop();
 }
 
 TEST_F(OutboxTest, CancelGivesThePeerTimeToTakeWhatWaits) {
@@ -180,19 +181,17 @@ TEST_F(OutboxTest, CancelDoesNotWaitForeverForAPeerThatReadsNothing) {
 
 TEST_F(OutboxTest, LeavesNoDescriptorBehindAfterBackPressure) {
   const std::size_t before = openDescriptors();
-  {
-    auto read = open();
-    auto unread = open();
-    const Bytes sent = fill(*read.connection, 700U << 10U);
-    fill(*unread.connection, 700U << 10U);
-    EXPECT_EQ(read.peer.read(sent.size()), sent);
-    // While nothing waits a connection is one descriptor; with the peers' ends that makes five.
-    EXPECT_TRUE(eventually([&] { return openDescriptors() == before + 5; }));
-    read.peer.close();
-    unread.peer.close();
-    ASSERT_TRUE(read.delegate->waitForInvalidation());
-    ASSERT_TRUE(unread.delegate->waitForInvalidation());
-  }
+  auto read = open();
+  auto unread = open();
+  const Bytes sent = fill(*read.connection, 700U << 10U);
+  fill(*unread.connection, 700U << 10U);
+  EXPECT_EQ(read.peer.read(sent.size()), sent);
+  // While nothing waits a connection is one descriptor; with the peers' ends that makes five.
+  EXPECT_TRUE(eventually([&] { return openDescriptors() == before + 5; }));
+  read.peer.close();
+  unread.peer.close();
+  ASSERT_TRUE(read.delegate->waitForInvalidation());
+  ASSERT_TRUE(unread.delegate->waitForInvalidation());
   EXPECT_TRUE(eventually([&] { return openDescriptors() == before; }));
 }
 
@@ -235,7 +234,6 @@ TEST_F(OutboxTest, DescriptorsTravelWithTheirMessages) {
     EXPECT_EQ(taken[static_cast<std::size_t>(i)], std::make_pair(std::int64_t{i}, i));
   }
   ASSERT_TRUE(senderDelegate->waitForInvalidation());
-  _pool->stop();
 }
 
 TEST_F(OutboxTest, ADescriptorWaitsForItsFrameToComplete) {
@@ -250,7 +248,6 @@ TEST_F(OutboxTest, ADescriptorWaitsForItsFrameToComplete) {
   ASSERT_TRUE(made.peer.write(Bytes(frame.begin() + 3, frame.end())));
   ASSERT_TRUE(made.delegate->waitForFrames(2));
   EXPECT_EQ(content, 42);
-  _pool->stop();
 }
 
 TEST_F(OutboxTest, TooManyWaitingDescriptorsEndTheConnection) {

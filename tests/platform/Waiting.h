@@ -2,6 +2,8 @@
 
 #include <chrono>
 #include <condition_variable>
+#include <cstdio>
+#include <cstdlib>
 #include <mutex>
 #include <thread>
 
@@ -10,12 +12,18 @@ namespace orvanta::test {
 // How long something may take before the test counts as hung; nothing should come near it.
 inline constexpr std::chrono::seconds kHangGuard{30};
 
-// Whether `condition`, asked again and again, comes true.
+// Ends the process: a test that went on, or left, would take its locals from under the threads that hang.
+[[noreturn]] inline void hung(const char* what) {
+  std::fprintf(stderr, "%s has not come within %lld s\n", what, static_cast<long long>(kHangGuard.count()));
+  std::abort();
+}
+
+// True once `condition`, asked again and again, has come true.
 template <class Condition>
 bool eventually(Condition condition) {
   const auto end = std::chrono::steady_clock::now() + kHangGuard;
   while (!condition()) {
-    if (std::chrono::steady_clock::now() > end) return false;
+    if (std::chrono::steady_clock::now() > end) hung("a condition");
     std::this_thread::yield();
   }
   return true;
@@ -35,7 +43,8 @@ class Counter {
   }
   bool waitFor(int value) {
     std::unique_lock lock(_mutex);
-    return _changed.wait_for(lock, kHangGuard, [&] { return _value >= value; });
+    if (!_changed.wait_for(lock, kHangGuard, [&] { return _value >= value; })) hung("a count");
+    return true;
   }
 
  private:

@@ -55,10 +55,10 @@ TEST(WorkQueueTest, RunsJobsOneAtATimeAndInEachPostersOrder) {
 }
 
 TEST(WorkQueueTest, DifferentQueuesRunAtOnce) {
-  WorkPool pool(2);
-  pool.start();
   Counter inside;
   std::atomic<int> met = 0;
+  WorkPool pool(2);
+  pool.start();
   for (int i = 0; i < 2; ++i) {
     pool.makeQueue()->post([&] {  // the queue lives on in its job
       inside.add();
@@ -94,8 +94,8 @@ TEST(WorkQueueTest, IsCurrentOnlyInItsOwnJobs) {
 }
 
 TEST(WorkPoolTest, HasNoThreadAndRunsNothingBeforeStart) {
-  WorkPool pool(2);
   Counter ran;
+  WorkPool pool(2);
   pool.post([&] { ran.add(); });
   pool.makeQueue()->post([&] { ran.add(); });
   EXPECT_EQ(pool.threadCount(), 0U);
@@ -106,10 +106,10 @@ TEST(WorkPoolTest, HasNoThreadAndRunsNothingBeforeStart) {
 }
 
 TEST(WorkPoolTest, StopLetsTheRunningJobEnd) {
-  WorkPool pool(2);
-  pool.start();
   Counter begun;
   std::atomic<bool> ended = false;
+  WorkPool pool(2);
+  pool.start();
   pool.post([&] {
     begun.add();
     std::this_thread::yield();
@@ -152,11 +152,11 @@ TEST(WorkPoolTest, DestroysUncalledWhatNeverRan) {
 }
 
 TEST(BlockingScopeTest, TenBlockedJobsOnTwoThreadsLeaveRoomForAnother) {
-  WorkPool pool(2);
-  pool.start();
   Counter blocked;
   Counter release;
   Counter ended;
+  WorkPool pool(2);
+  pool.start();
   for (int i = 0; i < 10; ++i) {
     pool.post([&] {
       {
@@ -181,11 +181,11 @@ TEST(BlockingScopeTest, TenBlockedJobsOnTwoThreadsLeaveRoomForAnother) {
 }
 
 TEST(BlockingScopeTest, ExtraThreadsAreCapped) {
-  WorkPool pool(1, 2);
-  pool.start();
   Counter blocked;
   Counter release;
   Counter ended;
+  WorkPool pool(1, 2);
+  pool.start();
   for (int i = 0; i < 6; ++i) {
     pool.post([&] {
       {
@@ -204,10 +204,10 @@ TEST(BlockingScopeTest, ExtraThreadsAreCapped) {
 }
 
 TEST(BlockingScopeTest, ShortScopesDoNotPileUpThreads) {
-  WorkPool pool(2);
-  pool.start();
   Counter ended;
   std::atomic<std::size_t> most = 0;
+  WorkPool pool(2);
+  pool.start();
   for (int i = 0; i < 2000; ++i) {
     pool.post([&] {
       {

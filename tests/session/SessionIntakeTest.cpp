@@ -99,6 +99,14 @@ TEST_F(SessionIntakeTest, AnAggregatingClientThatDoesNotReadLosesEventsAndNothin
   EXPECT_TRUE(connections.back()->aggregated().back().isEndNotice()) << "notices are never dropped";
 }
 
+TEST_F(SessionIntakeTest, AnAggregatingClientThatHasGoneIsNotTakenForASlowOne) {
+  const auto session = started();
+  connections.back()->received->closed = true;
+  send(*session, {{"category", 3}, {"type", 4}});
+  EXPECT_EQ(log.count("<3>sendMessageWithDictionary: Failed to get remote object proxy: the connection is closed"), 1U);
+  EXPECT_EQ(log.count("Dropping aggregated events"), 0U);
+}
+
 TEST_F(SessionIntakeTest, TheLastHTTPSTextOrElseNothingBecomesTheReply) {
   device.device.consent = true;
   const Dictionary clients{{"clients", Array{Dictionary{{"post_url", "http://127.0.0.1/x"}}}}};

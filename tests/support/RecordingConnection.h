@@ -11,12 +11,12 @@
 namespace orvanta::test {
 
 // A connection whose client keeps everything that the daemon sends, decoded. Thread-safe.
-class RecordingConnection final : public platform::Connection {
+class RecordingConnection : public platform::Connection {
  public:
   struct Received final : platform::Outbox {
     bool send(std::span<const std::uint8_t> message, Urgency urgency) override {
       const std::lock_guard lock(mutex);
-      if (full && urgency == Urgency::droppable) return false;
+      if (closed || (full && urgency == Urgency::droppable)) return false;
       decoder.append(message);
       auto outcome = decoder.next();
       if (auto* frame = std::get_if<platform::Frame>(&outcome)) frames.push_back(std::move(*frame));
@@ -25,12 +25,17 @@ class RecordingConnection final : public platform::Connection {
     bool sendWithDescriptor(std::span<const std::uint8_t> message, platform::UniqueFd) override {
       return send(message, Urgency::reply);
     }
-    std::size_t pending() const override { return full ? 1 : 0; }
+    std::size_t pending() const override { return 0; }
+    bool isClosed() const override {
+      const std::lock_guard lock(mutex);
+      return closed;
+    }
 
     mutable std::mutex mutex;
     platform::FrameDecoder decoder;       // guarded by mutex
     std::vector<platform::Frame> frames;  // guarded by mutex
     bool full = false;                    // guarded by mutex: the client does not read
+    bool closed = false;                  // guarded by mutex: the client has gone
   };
 
   explicit RecordingConnection(platform::WorkPool& pool) : _queue(pool.makeQueue()) {}
