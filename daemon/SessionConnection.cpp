@@ -1,6 +1,8 @@
 #include "daemon/SessionConnection.h"
 
 #include <chrono>
+#include <cstdint>
+#include <vector>
 
 #include "daemon/OrvantadAgent.h"
 #include "interface/OrvantaLogging.h"
@@ -9,6 +11,12 @@
 namespace orvanta {
 
 void SessionConnection::received(platform::Frame&& frame) {
+  if (_ended && frame.kind == platform::Frame::Kind::request) {
+    // Read before the daemon ended the session, and too late for it: the caller is told rather than left waiting.
+    std::vector<std::uint8_t> answer;
+    platform::appendErrorResponse(answer, frame.messageID, frame.method + ": the daemon is ending");
+    _connection->outbox()->send(answer);
+  }
   if (_finished) return;
   if (frame.kind == platform::Frame::Kind::response) {
     ORVANTA_LOG(warning, "listener: Closing connection to {}: it answered a call that was never made",

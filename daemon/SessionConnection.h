@@ -24,7 +24,7 @@ class SessionConnection final : public platform::ConnectionDelegate {
   void interrupted() override;
   void invalidated(const std::optional<std::string>& protocolError) override;
 
-  // Takes the session out of the agent's lists and ends it. Once; later calls and frames do nothing.
+  // Takes the session out of the agent's lists and ends it. Once; requests that still come are answered with an error.
   void endSession();
   const std::shared_ptr<platform::Connection>& connection() const { return _connection; }
 

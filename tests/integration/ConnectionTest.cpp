@@ -191,6 +191,32 @@ TEST_F(ConnectionTest, AfterAHalfCloseAnswersStillComeAndTheSessionStays) {
   EXPECT_EQ(daemon->count("was invalidated"), 0U);
 }
 
+TEST_F(ConnectionTest, SIGTERMLeavesNoRequestThatWasReadWithoutAnAnswer) {
+  constexpr std::uint32_t kCalls = 200;  // more than a connection carries out in one turn
+  server->setFault("/storebags/*", collector::ConnectionFault::silent);
+  auto client = rawClient();
+  Bytes calls =
+      request(0, "setSessionInfo", {Dictionary{{"sessionID", 1}, {"clientType", 5}}, nullptr, nullptr, false});
+  const auto add = [&calls](const Bytes& call) { calls.insert(calls.end(), call.begin(), call.end()); };
+  add(request(1, "startConfigWithCompletionHandler"));
+  for (std::uint32_t id = 2; id < kCalls; ++id) add(request(id, "fetchDisplayURL"));
+  ASSERT_TRUE(client.write(calls));
+  ASSERT_TRUE(daemon->logged("fetchAndCacheStorebag: Fetching storebag"));
+  EXPECT_EQ(daemon->terminate(), 0);
+  std::uint32_t refused = 0;
+  for (std::uint32_t id = 0; id < kCalls; ++id) {
+    const auto answer = client.answer();
+    ASSERT_TRUE(answer) << id;
+    EXPECT_EQ(answer->messageID, id);
+    if (const std::string* error = answer->error.string()) {
+      EXPECT_EQ(*error, "fetchDisplayURL: the daemon is ending");
+      ++refused;
+    }
+  }
+  EXPECT_GT(refused, 0U);
+  EXPECT_FALSE(client.answer());
+}
+
 TEST_F(ConnectionTest, AClientThatNeverReadsStopsBeingReadAndHarmsNobody) {
   auto bystander = openSession({.sessionID = 1, .batchEvent = true});
   const auto residentBefore = daemon->residentKiB();

@@ -1,5 +1,6 @@
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <csignal>
 #include <filesystem>
 
@@ -44,6 +45,8 @@ TEST_F(LifecycleTest, SessionsSendTheirStartFinishAndEnd) {
 }
 
 TEST_F(LifecycleTest, SIGTERMEndsSessionsWhileTheirClientsAreConnected) {
+  setSection({{"http_post", httpPost(clientSection())},
+              {"dashboard", Dictionary{{"ip", "127.0.0.1"}, {"port", static_cast<int>(server->dashboardPort())}}}});
   startDaemon();
   std::vector<std::unique_ptr<OrvantaConnection>> sessions;
   for (std::uint32_t i = 0; i < 5; ++i) sessions.push_back(openSession({.sessionID = i, .batchEvent = true}));
@@ -54,6 +57,10 @@ TEST_F(LifecycleTest, SIGTERMEndsSessionsWhileTheirClientsAreConnected) {
   EXPECT_EQ(daemon->terminate(), 0) << daemon->process().allLines();
   EXPECT_EQ(records(1), 5U);
   EXPECT_EQ(clientEvents().size(), 1U) << "what was batched went out with the last flush";
+  ASSERT_TRUE(server->waitForDatagrams(11, kPatience));  // five starts, five ends, one event
+  const auto datagrams = server->datagrams();
+  EXPECT_EQ(std::count_if(datagrams.begin(), datagrams.end(), [](auto& d) { return d.method == 0 && d.respCode == 1; }),
+            5);
 }
 
 TEST_F(LifecycleTest, SIGTERMWhileAStorebagIsFetchedEndsTheFetch) {
@@ -65,6 +72,7 @@ TEST_F(LifecycleTest, SIGTERMWhileAStorebagIsFetchedEndsTheFetch) {
   connection->session().startConfigWithCompletionHandler({});
   ASSERT_TRUE(daemon->logged("fetchAndCacheStorebag: Fetching storebag"));
   EXPECT_EQ(daemon->terminate(), 0);
+  EXPECT_EQ(daemon->count("sendSynchronousRequest error Aborted: the process is ending"), 1U) << "not after 15 s";
 }
 
 TEST_F(LifecycleTest, AfterSIGKILLAStaleSocketIsReplacedAndTheDefaultsAreWhole) {
@@ -116,6 +124,22 @@ TEST_F(LifecycleTest, AUserDefaultsFileThatDoesNotParseIsKeptAside) {
   connection->session().blocking().configure({.sessionID = 1, .clientType = 7});
   EXPECT_TRUE(std::filesystem::exists(daemon->stateDirectory() + "/com.kovalt.orvanta.plist.corrupt"));
   EXPECT_TRUE(daemon->logged("com.kovalt.orvanta.plist"));
+}
+
+TEST_F(LifecycleTest, OrvantactlWritesDefaultsOnlyToADirectoryThatIsThere) {
+  daemon = std::make_unique<DaemonProcess>(options);
+  const auto write = [](const std::string& directory) {
+    ChildProcess::Options ctl;
+    ctl.program = DaemonProcess::programPath("orvantactl");
+    ctl.arguments = {"defaults", "--state-dir", directory, "write", "environmentType", "4", "--type", "int"};
+    return ChildProcess(std::move(ctl)).wait();
+  };
+  EXPECT_EQ(write(daemon->stateDirectory()), 0);
+  EXPECT_EQ(write(daemon->stateDirectory() + "/mistyped"), 1);
+  EXPECT_FALSE(std::filesystem::exists(daemon->stateDirectory() + "/mistyped"));
+  ASSERT_TRUE(daemon->start());
+  openSession({.sessionID = 1});
+  EXPECT_TRUE(daemon->logged("<6>userDefaultsEnvironment: Environment type 4"));
 }
 
 TEST_F(LifecycleTest, ClosedSessionsLeaveNothingBehind) {
