@@ -6,6 +6,21 @@
 
 namespace orvanta {
 
+namespace {
+
+// Of identifiers given from the parent upwards; none of none.
+std::optional<std::string> joinedRootFirst(const std::vector<std::shared_ptr<OrvantadSession>>& ancestors) {
+  if (ancestors.empty()) return std::nullopt;
+  std::string joined;
+  for (auto ancestor = ancestors.rbegin(); ancestor != ancestors.rend(); ++ancestor) {
+    if (!joined.empty()) joined += '.';
+    joined += (*ancestor)->sessionIDString();
+  }
+  return joined;
+}
+
+}  // namespace
+
 std::shared_ptr<OrvantadSession> SessionRegistry::getFirstSessionWithHierarchy(std::int64_t level, const Group& group) {
   const auto found = group.levels.find(level);
   if (found == group.levels.end() || found->second.empty()) return nullptr;
@@ -86,19 +101,20 @@ std::optional<std::string> SessionRegistry::parentSessionIDStringForSession(cons
                 session.sessionID(), token);
     return std::nullopt;
   }
-  std::optional<std::string> result;
+  // Joined at the end: a chain of a thousand levels would be copied a thousand times on the way.
+  std::vector<std::shared_ptr<OrvantadSession>> ancestors;
   for (std::int64_t level = static_cast<std::int64_t>(session.hierarchyLevel()) - 1; level >= 0; --level) {
-    const auto ancestor = getFirstSessionWithHierarchy(level, *group);
+    auto ancestor = getFirstSessionWithHierarchy(level, *group);
     if (!ancestor) {
       ORVANTA_LOG(info,
                   "parentSessionIDStringForSession: Found a gap in hierarchy (one of parents missing): incomplete "
                   "parentSessionID is '{}'",
-                  result.value_or(""));
+                  joinedRootFirst(ancestors).value_or(""));
       break;
     }
-    result = result ? ancestor->sessionIDString() + "." + *result : ancestor->sessionIDString();
+    ancestors.push_back(std::move(ancestor));
   }
-  return result;
+  return joinedRootFirst(ancestors);
 }
 
 std::shared_ptr<OrvantadSession> SessionRegistry::getAncestorWithAggregatorForSession(

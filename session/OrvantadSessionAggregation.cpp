@@ -9,8 +9,10 @@ namespace orvanta {
 using platform::Dictionary;
 
 void OrvantadSession::aggregateMessage(double timestamp, const Message& message) {
-  const bool mayHaveAncestors = _hierarchy.token && _hierarchy.level >= 1;
-  if (mayHaveAncestors) {
+  if (!_userInfo) {
+    // Nobody needs the lock to learn that such a session has no ancestor; the line is due all the same.
+    ORVANTA_LOG(info, "getAncestorWithAggregatorForSession: No user info found for session {}", _sessionID);
+  } else if (_hierarchy.token && _hierarchy.level >= 1) {
     // Held to the end of the hand-over, so that the hierarchy cannot change under it.
     const std::lock_guard lock(_delegate.lock());
     if (const auto ancestor = _delegate.getAncestorWithAggregatorForSession(*this)) {
@@ -18,9 +20,6 @@ void OrvantadSession::aggregateMessage(double timestamp, const Message& message)
                                  mergedPayload(message.payload));
       return;
     }
-  } else if (!_userInfo) {
-    // Nobody needs the lock to learn that a session without a token has no ancestor; the line is due all the same.
-    ORVANTA_LOG(info, "getAncestorWithAggregatorForSession: No user info found for session {}", _sessionID);
   }
   if (!hasAggregator()) return;
   sendToAggregator(_sessionInfo, timestamp, message.category, message.type, mergedPayload(message.payload));
