@@ -73,7 +73,7 @@ HttpResult ScriptedHttpClient::answerFor(const HttpRequest& request) {
 
 namespace {
 
-std::unique_ptr<platform::Platform> makePlatform(const std::string& directory) {
+std::unique_ptr<platform::Platform> makePlatform(const std::string& directory, std::size_t threads) {
   platform::Platform::Parts parts;
   parts.files.runtimeDirectory = directory + "/run";
   parts.files.stateDirectory = directory + "/state";
@@ -88,7 +88,7 @@ std::unique_ptr<platform::Platform> makePlatform(const std::string& directory) {
   parts.clock = std::make_unique<TestClock>();
   parts.device = std::make_unique<TestDevice>();
   parts.defaults = std::make_unique<platform::UserDefaults>(parts.files.stateDirectory, "com.kovalt.orvanta");
-  parts.pool = std::make_unique<platform::WorkPool>(2);
+  parts.pool = std::make_unique<platform::WorkPool>(threads);
   parts.pool->start();
   parts.http = std::make_unique<ScriptedHttpClient>();
   parts.powerLog = std::make_unique<RecordedPowerLog>();
@@ -97,8 +97,8 @@ std::unique_ptr<platform::Platform> makePlatform(const std::string& directory) {
 
 }  // namespace
 
-TestPlatform::TestPlatform()
-    : _platform(makePlatform(directory.path())),
+TestPlatform::TestPlatform(std::size_t threads)
+    : _platform(makePlatform(directory.path(), threads)),
       clock(static_cast<TestClock&>(_platform->clock())),
       device(static_cast<TestDevice&>(_platform->device())),
       http(static_cast<ScriptedHttpClient&>(_platform->http())),

@@ -87,10 +87,10 @@ struct RecordedPowerLog final : platform::PowerLog {
   std::vector<Record> records;  // guarded by mutex
 };
 
-// A platform over the parts above, with its files in a directory of its own. The pool is started with two threads.
+// A platform over the parts above, with its files in a directory of its own. The pool is started.
 class TestPlatform {
  public:
-  TestPlatform();
+  explicit TestPlatform(std::size_t threads = 2);
   ~TestPlatform();
 
   platform::Platform& get() { return *_platform; }
