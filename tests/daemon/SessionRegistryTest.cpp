@@ -1,6 +1,11 @@
 #include "daemon/SessionRegistry.h"
 
+#include <fmt/format.h>
 #include <gtest/gtest.h>
+
+#include <atomic>
+#include <future>
+#include <thread>
 
 #include "tests/support/SessionFixture.h"
 
@@ -232,6 +237,42 @@ TEST_F(HierarchyTest, EventsReachOneAggregatorAndTheDeeperOnesAreToldThatTheyEnd
   ASSERT_EQ(rootClient->aggregated().size(), total + 1) << "one end notice";
   send(*leaf, {{"category", 5}, {"type", 8}});
   EXPECT_EQ(rootClient->aggregated().size(), total + 1);
+}
+
+TEST_F(HierarchyTest, WhoeverHasNobodyAboveNeverWaitsForAnothersStorebag) {
+  maxAge = 0;
+  const auto root = join(1, "t", 0, user(), true);
+  const auto rootClient = connections.back();
+  const auto anonymous = join(2, "t", 1, nullptr);
+  const auto standalone = makeSession();
+  configure(*standalone, 3);
+  for (const auto& session : {root, anonymous, standalone}) start(*session);
+  const auto fetching = makeSession();
+  configure(*fetching, 4);
+  std::promise<void> begun, release;
+  std::atomic<bool> overdue{false};
+  whileFetching = [&] {
+    begun.set_value();
+    overdue = release.get_future().wait_for(std::chrono::seconds(30)) != std::future_status::ready;
+  };
+  std::thread fetcher([&] { start(*fetching); });
+  begun.get_future().wait();
+  log.clear();
+  for (int i = 0; i < 10; ++i) {
+    for (const auto& session : {root, anonymous, standalone}) send(*session, {{"category", 5}, {"type", i}});
+  }
+  // Coming and going wait for nobody either.
+  const auto visitor = makeSession();
+  configure(*visitor, 5);
+  leave(visitor);
+  EXPECT_FALSE(overdue);
+  release.set_value();
+  fetcher.join();
+  for (const int id : {2, 3}) {
+    EXPECT_EQ(log.count(fmt::format("<6>getAncestorWithAggregatorForSession: No user info found for session {}", id)),
+              10U);
+  }
+  EXPECT_EQ(rootClient->aggregated().back().type, 9);
 }
 
 TEST_F(HierarchyTest, AThousandSessionsOfOneGroupJoinAndLeave) {

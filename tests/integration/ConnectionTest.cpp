@@ -6,6 +6,7 @@
 #include <future>
 #include <thread>
 
+#include "interface/RemoteCalls.h"
 #include "platform/Connect.h"
 #include "platform/Connection.h"
 #include "platform/MessagePack.h"
@@ -237,6 +238,40 @@ TEST_F(ConnectionTest, AClientThatNeverReadsStopsBeingReadAndHarmsNobody) {
   stopped = true;
   EXPECT_EQ(daemon->terminate(), 0);
   writer.join();
+}
+
+TEST_F(ConnectionTest, AnAggregatorThatDoesNotReadDelaysNobodyAndHearsOfItsEnd) {
+  auto aggregator = rawClient();
+  ASSERT_TRUE(aggregator.write(request(
+      1, "setSessionInfo",
+      {Dictionary{{"sessionID", 1}, {"clientType", 5}, {"hierarchyToken", Dictionary{{"tokenID", "t"}, {"level", 0}}}},
+       nullptr, nullptr, true})));
+  ASSERT_TRUE(aggregator.answer());
+  SessionInfo info{.sessionID = 2, .batchEvent = true};
+  info.hierarchyToken = HierarchyToken{"t", 1};
+  auto sender = openSession(info, UserInfo{"client", "service", {}});
+  // More than its socket and the daemon hold for it.
+  const std::string large(20'000, 'x');
+  for (std::uint16_t i = 0; i < 400; ++i) send(*sender, event(1, i, {{"text", large}}));
+  EXPECT_TRUE(daemon->logged("<4>sendMessageToClient: Dropping aggregated events: ", 1));
+  EXPECT_EQ(daemon->count("Dropping aggregated events"), 1U);
+
+  // Once it reads, it hears the oldest in order, whatever came in between is lost, and in the end that it has ended.
+  const auto next = [&aggregator] {
+    auto frame = aggregator.answer();
+    return frame ? decodeSendMessageToClient(*frame) : std::nullopt;
+  };
+  for (std::uint16_t i = 0; i < 200; ++i) {
+    auto received = next();
+    while (received && received->category == 0) received = next();
+    ASSERT_TRUE(received && received->type == i) << i;
+  }
+  daemon->process().signal(SIGTERM);
+  std::optional<AggregatedEvent> last;
+  while (auto frame = aggregator.answer()) last = decodeSendMessageToClient(*frame);
+  ASSERT_TRUE(last);
+  EXPECT_TRUE(last->isEndNotice());
+  EXPECT_EQ(daemon->process().wait(), 0);
 }
 
 TEST_F(ConnectionTest, AKilledClientsSessionEnds) {

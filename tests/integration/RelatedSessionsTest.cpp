@@ -1,52 +1,40 @@
 #include <gtest/gtest.h>
 
-#include <condition_variable>
-#include <mutex>
+#include <vector>
 
 #include "tests/integration/IntegrationFixture.h"
 
 namespace orvanta::test {
 namespace {
 
-// Programs of one hierarchy, each with a connection of its own.
 class RelatedSessionsTest : public IntegrationFixture {
  protected:
-  struct Program {
-    std::unique_ptr<OrvantaConnection> connection;
-    std::mutex mutex;
-    std::condition_variable changed;
-    std::vector<AggregatedEvent> events;  // guarded by mutex
-    int endings = 0;                      // guarded by mutex
-
-    bool waitFor(const std::function<bool()>& condition) {
-      std::unique_lock lock(mutex);
-      return changed.wait_for(lock, kPatience, condition);
-    }
-  };
-
-  std::unique_ptr<Program> join(std::uint32_t id, const std::string& token, std::uint32_t level, bool aggregates) {
-    auto program = std::make_unique<Program>();
-    program->connection = connect();
-    auto& session = program->connection->session();
-    if (aggregates) {
-      auto* p = program.get();
-      session.setAggregationHandler(
-          [p](const AggregatedEvent& event) {
-            const std::lock_guard lock(p->mutex);
-            p->events.push_back(event);
-            p->changed.notify_all();
-          },
-          [p] {
-            const std::lock_guard lock(p->mutex);
-            ++p->endings;
-            p->changed.notify_all();
-          });
-    }
+  // A session in this process; its user info holds who it is.
+  std::unique_ptr<OrvantaConnection> join(std::uint32_t id, const std::string& token, std::uint32_t level) {
     SessionInfo info{.sessionID = id, .clientType = 5, .requireUserInfo = true};
     info.hierarchyToken = HierarchyToken{token, level};
-    UserInfo user{"client", "service", {{"who", std::int64_t(id)}}};
-    EXPECT_TRUE(session.blocking().configure(info, user));
+    return openSession(info, UserInfo{"client", "service", {{"who", std::int64_t(id)}}});
+  }
+  // The same in a process of its own (see MemberProgram.cpp), which tells what happens to it.
+  std::unique_ptr<ChildProcess> launch(std::uint32_t id, const std::string& token, std::uint32_t level,
+                                       bool aggregates) {
+    ChildProcess::Options member;
+    member.program = DaemonProcess::programPath("member_program");
+    member.arguments = {std::to_string(id), token, std::to_string(level), aggregates ? "aggregates" : "sends"};
+    member.environment = daemon->environment();
+    member.holdInput = true;
+    auto program = std::make_unique<ChildProcess>(std::move(member));
+    EXPECT_TRUE(program->waitForLine("joined")) << program->allLines();
     return program;
+  }
+  static void tell(ChildProcess& program, int number) {
+    program.write(std::to_string(number) + "\n");
+    EXPECT_TRUE(program.waitForLine("sent " + std::to_string(number))) << program.allLines();
+  }
+  static std::vector<std::string> receivedBy(const ChildProcess& program) {
+    auto lines = program.lines();
+    std::erase_if(lines, [](const std::string& line) { return line.find("received 20/") != 0; });
+    return lines;
   }
   std::string postedSessionID(std::int64_t marker) {
     for (const auto& received : clientEvents()) {
@@ -59,65 +47,62 @@ class RelatedSessionsTest : public IntegrationFixture {
 
 TEST_F(RelatedSessionsTest, FiveProgramsFollowTheirHierarchy) {
   startDaemon();
-  auto root = join(1, "call", 0, true);
-  auto left = join(2, "call", 1, false);
-  auto right = join(3, "call", 1, false);
-  auto stranger = join(9, "other", 1, false);
-  auto leaf = join(4, "call", 2, true);
-  // The root's aggregation takes precedence: the leaf's own ends at its first evaluation.
-  ASSERT_TRUE(leaf->waitFor([&] { return leaf->endings == 1; }));
+  const auto root = launch(1, "call", 0, true);
+  const auto left = launch(2, "call", 1, false);
+  const auto right = launch(3, "call", 1, false);
+  const auto stranger = launch(9, "other", 1, false);
+  const auto leaf = launch(4, "call", 2, true);
+  EXPECT_TRUE(leaf->waitForLine("end")) << "the root's aggregation takes precedence";
 
-  std::int64_t marker = 100;
-  for (auto* program : {root.get(), left.get(), right.get(), stranger.get(), leaf.get()}) {
-    send(*program->connection, event(20, 1, {{"marker", marker++}}));
-  }
+  int marker = 100;
+  for (auto* program : {root.get(), left.get(), right.get(), stranger.get(), leaf.get()}) tell(*program, marker++);
   ASSERT_TRUE(waitForClientEvents(5));
-  const auto dots = [](const std::string& text) { return std::count(text.begin(), text.end(), '.'); };
-  const std::string rootID = postedSessionID(100);
-  EXPECT_EQ(dots(rootID), 0);
-  EXPECT_EQ(postedSessionID(101).find(rootID + "."), 0U);
-  EXPECT_EQ(postedSessionID(102).find(rootID + "."), 0U);
-  EXPECT_EQ(dots(postedSessionID(103)), 0) << "its parent is missing";
-  EXPECT_EQ(postedSessionID(104).find(postedSessionID(101) + "."), 0U) << "the first of level 1 is the parent";
+  const std::string rootID = postedSessionID(100), leftID = postedSessionID(101), rightID = postedSessionID(102);
+  constexpr std::size_t kOwn = 24;  // of each session's own identifier
+  ASSERT_EQ(rootID.size(), kOwn);
+  EXPECT_EQ(leftID.substr(0, kOwn + 1), rootID + ".");
+  EXPECT_EQ(rightID.substr(0, kOwn + 1), rootID + ".");
+  EXPECT_EQ(rightID.size(), 2 * kOwn + 1);
+  EXPECT_NE(leftID, rightID);
+  EXPECT_EQ(postedSessionID(103).size(), kOwn) << "its parent is missing";
+  EXPECT_EQ(postedSessionID(104).substr(0, 2 * kOwn + 2), leftID + ".") << "the first of level 1 is the parent";
+  EXPECT_EQ(postedSessionID(104).size(), 3 * kOwn + 2);
 
-  ASSERT_TRUE(root->waitFor([&] {
-    std::size_t own = 0;
-    for (const auto& received : root->events) own += received.category == 20 ? 1 : 0;
-    return own >= 4;
-  }));
-  std::vector<std::int64_t> markers;
-  {
-    const std::lock_guard lock(root->mutex);
-    for (const auto& received : root->events) {
-      if (received.category != 20) continue;
-      markers.push_back(received.payload->find("marker")->integerValue());
-      EXPECT_EQ(received.payload->find("who")->integerValue(), received.sessionInfo->find("sessionID")->integerValue());
-    }
-  }
-  EXPECT_EQ(markers, (std::vector<std::int64_t>{100, 101, 102, 104}));
+  // What the root hears comes in the order in which it was sent: with the last event all have come.
+  ASSERT_TRUE(root->waitForLine("received 20/4 marker 104 who 4 from 4")) << root->allLines();
+  EXPECT_EQ(receivedBy(*root), (std::vector<std::string>{
+                                   "received 20/1 marker 100 who 1 from 1", "received 20/2 marker 101 who 2 from 2",
+                                   "received 20/3 marker 102 who 3 from 3", "received 20/4 marker 104 who 4 from 4"}));
+  EXPECT_EQ(root->count("end"), 0U);
 
-  const auto leafEvents = leaf->events.size();
-  send(*leaf->connection, event(20, 2));
-  EXPECT_EQ(leaf->events.size(), leafEvents);
+  // A program that leaves says so to the root: its last event is the session's own.
+  right->closeInput();
+  EXPECT_EQ(right->wait(), 0) << right->allLines();
+  EXPECT_TRUE(root->waitForLine("received 0/1 marker none who 3 from 3")) << root->allLines();
+
   EXPECT_EQ(daemon->terminate(), 0);
-  EXPECT_TRUE(root->waitFor([&] { return root->endings == 1; })) << "the root is told before its connection goes";
-  EXPECT_EQ(leaf->endings, 1);
+  EXPECT_TRUE(root->waitForLine("end")) << "the root is told before its connection goes";
+  for (const auto* program : {&root, &left, &stranger, &leaf}) (*program)->wait();
+  EXPECT_EQ(root->count("end"), 1U);
+  EXPECT_EQ(leaf->count("end"), 1U);
+  EXPECT_EQ(leaf->count("received"), 0U) << leaf->allLines();
+  EXPECT_EQ(stranger->count("received"), 0U);
 }
 
 TEST_F(RelatedSessionsTest, AParentThatLeavesAndReturnsIsFollowedAgain) {
   startDaemon();
-  auto root = join(1, "t", 0, false);
-  auto child = join(2, "t", 1, false);
+  auto root = join(1, "t", 0);
+  auto child = join(2, "t", 1);
   root.reset();
   ASSERT_TRUE(daemon->logged("dealloc: OrvantadSession dealloc: 1"));
-  ASSERT_TRUE(child->connection->session().blocking().fetchStates(UserInfo{"client", "else", {}}.dictionary()));
+  ASSERT_TRUE(child->session().blocking().fetchStates(UserInfo{"client", "else", {}}.dictionary()));
   EXPECT_TRUE(daemon->logged(
       "<6>syncReportingStates: child session 2 (backend http_post) with hierarchy 1 is missing its parent"));
-  root = join(3, "t", 0, false);
+  root = join(3, "t", 0);
   EXPECT_TRUE(daemon->logged(
       "<7>updateDownstreamSessions: Updating combined session ID and syncing reporting states for session 2"));
-  send(*child->connection, event(20, 1, {{"marker", 1}}));
-  send(*root->connection, event(20, 1, {{"marker", 2}}));
+  send(*child, event(20, 1, {{"marker", 1}}));
+  send(*root, event(20, 1, {{"marker", 2}}));
   ASSERT_TRUE(waitForClientEvents(2));
   EXPECT_EQ(postedSessionID(1).find(postedSessionID(2) + "."), 0U);
 }
@@ -131,8 +116,8 @@ TEST_F(RelatedSessionsTest, WatchPrintsTheEventsOfItsHierarchyAsJSONLines) {
   watching.keepOutput = true;
   ChildProcess watcher(std::move(watching));
   ASSERT_TRUE(daemon->logged("updateCorrelatedSessions: Adding session"));
-  auto child = join(2, "call", 1, false);
-  send(*child->connection, event(20, 7, {{"marker", 1}}));
+  auto child = join(2, "call", 1);
+  send(*child, event(20, 7, {{"marker", 1}}));
   child.reset();
   ASSERT_TRUE(daemon->logged("dealloc: OrvantadSession dealloc: 2"));
   EXPECT_EQ(daemon->terminate(), 0);

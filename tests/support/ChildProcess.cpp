@@ -67,6 +67,10 @@ ChildProcess::ChildProcess(Options options) {
   output.write.reset();
   _errorReader = std::thread([this] { read(_error.get(), true); });
   _outputReader = std::thread([this] { read(_output.get(), false); });
+  if (options.holdInput) {
+    _input = std::move(input.write);
+    return;
+  }
   _inputWriter = std::thread([fd = std::move(input.write), text = std::move(options.input)] {
     std::string_view rest = text;
     while (!rest.empty()) {
@@ -146,12 +150,19 @@ std::string ChildProcess::output() {
   return _outputText;
 }
 
+void ChildProcess::write(const std::string& input) {
+  if (::write(_input.get(), input.data(), input.size()) != static_cast<ssize_t>(input.size())) {
+    throw std::runtime_error("the program takes no input");
+  }
+}
+
 void ChildProcess::signal(int number) {
   ::kill(_pid, number);
 }
 
 int ChildProcess::wait() {
   if (_status) return *_status;
+  closeInput();
   int status = 0;
   while (::waitpid(_pid, &status, 0) < 0 && errno == EINTR) {
   }

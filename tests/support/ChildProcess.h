@@ -24,6 +24,7 @@ class ChildProcess {
     std::vector<std::string> arguments;
     std::map<std::string, std::string> environment;  // on top of the test's own
     std::string input;                               // on standard input, then end of file
+    bool holdInput = false;                          // no end of file before closeInput()
     bool keepOutput = false;
   };
   // What waiting may take before the test counts as hung; nothing should come near it.
@@ -42,6 +43,9 @@ class ChildProcess {
   std::size_t count(const std::string& text) const;
   std::string allLines() const;
   std::string output();  // after the program has ended
+  // With holdInput, while the program runs.
+  void write(const std::string& input);
+  void closeInput() { _input.reset(); }
   void signal(int number);
   // The exit status, or minus the signal that ended it. Waits.
   int wait();
@@ -52,7 +56,7 @@ class ChildProcess {
 
   pid_t _pid = -1;
   std::optional<int> _status;
-  platform::UniqueFd _error, _output;
+  platform::UniqueFd _error, _output, _input;
   std::thread _errorReader, _outputReader, _inputWriter;
   mutable std::mutex _mutex;
   std::condition_variable _changed;

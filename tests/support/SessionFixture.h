@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -86,8 +87,10 @@ class SessionFixture : public ::testing::Test {
   SharedDictionary storebag;  // what the server gives; null: nothing
   std::int32_t maxAge = 3600;
   int fetches = 0;
+  std::function<void()> whileFetching;  // with the agent's lock held; may be empty
   OrvantadAgent agent{device, [this](std::int32_t, StorebagFetch& fetch) {
                         ++fetches;
+                        if (whileFetching) whileFetching();
                         fetch.maxAge = maxAge;
                         fetch.version = "1.0";
                         return storebag;
