@@ -45,7 +45,7 @@ std::uint16_t portOf(const Value& value) {
   return static_cast<std::uint16_t>(value.integerValue());
 }
 
-// The array in an archive of our own: the log-data server's contract, see docs/protocol.md.
+// The array in an archive of our own: the log-data server's contract, see docs/dashboard.md.
 platform::Result<std::vector<std::uint8_t>> archive(const SharedArray& logData) {
   if (!logData) return platform::Failure{"there is no array"};
   Dictionary content{{"archiver", "OrvantaArchiver"}, {"version", 1}};

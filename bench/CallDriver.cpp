@@ -48,20 +48,28 @@ void CallDriver::read(std::size_t length) {
   }
 }
 
-void CallDriver::call(const std::vector<std::uint8_t>& message) {
+std::size_t CallDriver::call(const std::vector<std::uint8_t>& message) {
   write(message.data(), message.size());
+  std::size_t size = 0;
   platform::FrameDecoder decoder;
   for (;;) {
     auto outcome = decoder.next();
     if (const auto* frame = std::get_if<platform::Frame>(&outcome)) {
       if (frame->kind != platform::Frame::Kind::response) continue;
       if (!frame->error.isNull()) throw std::runtime_error("call refused: " + frame->error.description());
-      return;
+      return size;
     }
     const ssize_t got = ::read(_socket.get(), _buffer.data(), _buffer.size());
     if (got <= 0) throw std::runtime_error("the daemon has gone");
+    size += static_cast<std::size_t>(got);
     decoder.append({_buffer.data(), static_cast<std::size_t>(got)});
   }
+}
+
+void CallDriver::configure(bool batchEvents) {
+  call(encodeCall("setSessionInfo", {Dictionary{{"sessionID", 1}, {"clientType", 5}, {"batchEvent", batchEvents}},
+                                     nullptr, nullptr, false}));
+  call(encodeCall("startConfigWithCompletionHandler", {}));
 }
 
 void CallDriver::pipeline(const std::vector<std::uint8_t>& burst, std::size_t answerSize, std::uint64_t count,
@@ -93,6 +101,12 @@ std::vector<std::uint8_t> encodeCall(const char* method, const platform::Array& 
   return message;
 }
 
+std::vector<std::uint8_t> repeated(const std::vector<std::uint8_t>& call, std::uint64_t count) {
+  std::vector<std::uint8_t> burst;
+  for (std::uint64_t i = 0; i < count; ++i) burst.insert(burst.end(), call.begin(), call.end());
+  return burst;
+}
+
 std::vector<std::uint8_t> encodeEvents(std::uint32_t count) {
   std::vector<std::uint8_t> burst;
   for (std::uint32_t i = 0; i < count; ++i) {
@@ -121,6 +135,11 @@ Dictionary samplePayload(std::uint32_t number) {
           {"startupTime", below(3000) / 1000.0},
           {"title", fmt::format("Episode {}", below(40))},
           {"volume", below(100) / 100.0}};
+}
+
+std::vector<std::uint8_t> sampleCall() {
+  return encodeCall("sendMessageWithDictionary",
+                    {Dictionary{{"category", 5}, {"type", 6}, {"payload", samplePayload(7)}}});
 }
 
 }  // namespace orvanta::bench

@@ -16,8 +16,10 @@ class CallDriver {
   // Connects; throws when nobody listens.
   explicit CallDriver(const std::string& socketPath);
 
-  // Writes `message` and reads one whole frame back. For set-up calls.
-  void call(const std::vector<std::uint8_t>& message);
+  // Writes `message` and reads what comes until its answer is whole; how many bytes that was. For set-up calls.
+  std::size_t call(const std::vector<std::uint8_t>& message);
+  // Makes the connection a session of client type 5.
+  void configure(bool batchEvents);
   // Sends `burst`, which holds `window` requests, until `count` are sent, each answered by `answerSize` bytes.
   void pipeline(const std::vector<std::uint8_t>& burst, std::size_t answerSize, std::uint64_t count,
                 std::uint64_t window);
@@ -34,9 +36,15 @@ class CallDriver {
 
 // A whole request frame. The id takes five bytes, so that answers to a given call always have the same size.
 std::vector<std::uint8_t> encodeCall(const char* method, const platform::Array& params);
+// The size of a response with one nil: array, type, five bytes of id, nil, array of one, nil.
+inline constexpr std::size_t kNilAnswer = 10;
 // `count` calls that hand in an event each, no two alike.
 std::vector<std::uint8_t> encodeEvents(std::uint32_t count);
+// `count` times the same call.
+std::vector<std::uint8_t> repeated(const std::vector<std::uint8_t>& call, std::uint64_t count);
 // An event of the kind that clients send: a payload of 15 keys, as varied as those of a player's session.
 platform::Dictionary samplePayload(std::uint32_t number);
+// A call that sends one.
+std::vector<std::uint8_t> sampleCall();
 
 }  // namespace orvanta::bench

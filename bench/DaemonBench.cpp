@@ -1,16 +1,14 @@
 #include <fmt/core.h>
 
 #include <chrono>
-#include <cstdlib>
 #include <stdexcept>
 #include <thread>
 
+#include "bench/BenchDaemon.h"
 #include "bench/CallDriver.h"
 #include "bench/RawPeers.h"
 #include "bench/Stages.h"
 #include "platform/FrameDecoder.h"
-#include "tests/support/DaemonProcess.h"
-#include "tools/collector/Collector.h"
 
 namespace orvanta::bench {
 
@@ -19,21 +17,7 @@ namespace {
 using platform::Array;
 using platform::Dictionary;
 
-// A response with one nil: array, type, five bytes of id, nil, array of one, nil.
-constexpr std::size_t kNilAnswer = 10;
 constexpr std::uint64_t kWindow = 64;
-
-std::unique_ptr<test::DaemonProcess> startDaemon(test::DaemonProcess::Options options) {
-  options.logLevel = "4";
-  auto daemon = std::make_unique<test::DaemonProcess>(std::move(options));
-  if (!daemon->startQuietly()) throw std::runtime_error("orvantad does not start: " + daemon->process().allLines());
-  return daemon;
-}
-
-std::vector<std::uint8_t> sampleCall() {
-  return encodeCall("sendMessageWithDictionary",
-                    {Dictionary{{"category", 5}, {"type", 6}, {"payload", samplePayload(7)}}});
-}
 
 constexpr std::uint64_t kChunk = 320;
 constexpr std::uint64_t kInFlight = 3200;
@@ -52,15 +36,14 @@ void awaitPosts(const PostSink& sink, std::uint64_t wanted) {
 
 void benchCallPath() {
   printHeading("Call and reply, no backend");
-  const auto daemon = startDaemon({});
+  const BenchDaemon daemon;
   const auto call = sampleCall();
   constexpr std::uint64_t kCalls = 400'000;
 
-  const std::string echoPath = daemon->runtimeDirectory() + "/echo";
+  const std::string echoPath = daemon.process().runtimeDirectory() + "/echo";
   const EchoServer echo(echoPath, call.size(), kNilAnswer);
   CallDriver echoDriver(echoPath);
-  std::vector<std::uint8_t> burst;
-  for (std::uint64_t i = 0; i < kWindow; ++i) burst.insert(burst.end(), call.begin(), call.end());
+  const auto burst = repeated(call, kWindow);
   const Stretch echoTime(echo.pid());
   echoDriver.pipeline(burst, kNilAnswer, kCalls, kWindow);
   const double echoCpu = figureOf(echoTime, kCalls).cpuPerEvent;
@@ -70,8 +53,8 @@ void benchCallPath() {
     return std::get<platform::Frame>(decoder.next()).params.size();
   });
 
-  CallDriver driver(daemon->socketPath());
-  const Stretch time(daemon->process().pid());
+  CallDriver driver(daemon.process().socketPath());
+  const Stretch time(daemon.process().process().pid());
   driver.pipeline(burst, kNilAnswer, kCalls, kWindow);
   const auto figure = figureOf(time, kCalls);
   printFigure(fmt::format("pipelined {} deep, {} bytes each, daemon's CPU", kWindow, call.size()), figure);
@@ -82,47 +65,28 @@ void benchCallPath() {
   const auto trips = driver.roundTrips(call, kNilAnswer, kRoundTrips);
   printRatio("one at a time, median, against echo", median(trips), median(echoTrips), 1.6);
   printRatio("one at a time, p99, against the median", percentile(trips, 0.99), median(trips), 3.0);
-  fmt::print("  {:<58} {:>9} KiB (goal 9216 KiB)\n", "resident memory", daemon->residentKiB());
+  fmt::print("  {:<58} {:>9} KiB (goal 9216 KiB)\n", "resident memory", daemon.process().residentKiB());
 }
 
 void benchWholePath(const RawLimits& limits) {
   printHeading("Whole path: client, daemon, gzip JSON, post, local sink");
-  const test::TemporaryDirectory directory;
-  collector::CollectorOptions serving;
-  serving.directory = directory / "collector";
-  auto collector = collector::Collector::start(std::move(serving));
-  if (!collector) throw std::runtime_error(collector.error());
   const PostSink sink;
-  (*collector)
-      ->setSection({{"http_post", Dictionary{{"clients", Array{Dictionary{{"post_url", sink.url()},
-                                                                          {"locale_whitelist", Array{"DE"}},
-                                                                          {"filters", Array{}},
-                                                                          {"sampling_threshold", 1.0},
-                                                                          {"override_dnu", 1},
-                                                                          {"event_threshold", 49}}}}}}});
-
-  test::DaemonProcess::Options options;
-  options.storebagURL = (*collector)->storebagURL();
-  std::ifstream key((*collector)->publicKeyFile(), std::ios::binary);
-  options.publicKey = {std::istreambuf_iterator<char>(key), {}};
-  options.caFile = (*collector)->caFile();
   // Without consent no answer carries the text of what was sent, so that every answer has one size.
-  options.device = {{"ProductVersion", "12.5"},
-                    {"BuildVersion", "12F5"},
-                    {"ProductType", "Parva3,2"},
-                    {"DeviceName", "Parva"},
-                    {"CountryCode", "DE"}};
-  const auto daemon = startDaemon(options);
+  const BenchDaemon daemon({{"http_post", Dictionary{{"clients", Array{Dictionary{{"post_url", sink.url()},
+                                                                                  {"locale_whitelist", Array{"DE"}},
+                                                                                  {"filters", Array{}},
+                                                                                  {"sampling_threshold", 1.0},
+                                                                                  {"override_dnu", 1},
+                                                                                  {"event_threshold", 49}}}}}}},
+                           false);
 
   for (const bool batched : {true, false}) {
-    CallDriver driver(daemon->socketPath());
-    driver.call(encodeCall("setSessionInfo", {Dictionary{{"sessionID", 1}, {"clientType", 5}, {"batchEvent", batched}},
-                                              nullptr, nullptr, false}));
-    driver.call(encodeCall("startConfigWithCompletionHandler", {}));
+    CallDriver driver(daemon.process().socketPath());
+    driver.configure(batched);
     const auto burst = encodeEvents(kWindow);
     const std::uint64_t events = batched ? 200'000 : 20'000;
     const auto postsBefore = sink.posts();
-    const Stretch time(daemon->process().pid());
+    const Stretch time(daemon.process().process().pid());
     const std::uint64_t perPost = batched ? 50 : 1;
     // What waits in a lane is bounded: a client that calls faster than posts are answered would have posts refused.
     for (std::uint64_t sent = 0; sent < events; sent += kChunk) {

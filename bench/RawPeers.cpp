@@ -108,6 +108,36 @@ int completed(HalfRequest& half, const char* bytes, std::size_t length) {
   }
 }
 
+[[noreturn]] void takeDatagrams(int socket, volatile std::uint64_t* datagrams) {
+  char buffer[2048];
+  for (;;) {
+    if (::recv(socket, buffer, sizeof buffer, 0) >= 0) *datagrams = *datagrams + 1;
+  }
+}
+
+// In memory that a forked process shares.
+volatile std::uint64_t* sharedCounter() {
+  void* const memory =
+      ::mmap(nullptr, sizeof(std::uint64_t), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
+  if (memory == MAP_FAILED) throw std::runtime_error("no shared memory");
+  return static_cast<volatile std::uint64_t*>(memory);
+}
+
+// On any port of the loopback address.
+int boundSocket(int type, std::uint16_t& port) {
+  const int socket = ::socket(AF_INET, type | SOCK_CLOEXEC, 0);
+  sockaddr_in address{};
+  address.sin_family = AF_INET;
+  address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+  socklen_t length = sizeof address;
+  if (::bind(socket, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0 ||
+      ::getsockname(socket, reinterpret_cast<sockaddr*>(&address), &length) != 0) {
+    throw std::runtime_error("no port on the loopback address");
+  }
+  port = ntohs(address.sin_port);
+  return socket;
+}
+
 }  // namespace
 
 RawPeer::~RawPeer() {
@@ -132,19 +162,9 @@ EchoServer::EchoServer(const std::string& socketPath, std::size_t requestSize, s
   ::close(listener);
 }
 
-PostSink::PostSink() {
-  _posts = static_cast<volatile std::uint64_t*>(
-      ::mmap(nullptr, sizeof(std::uint64_t), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0));
-  const int listener = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  sockaddr_in address{};
-  address.sin_family = AF_INET;
-  address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-  socklen_t length = sizeof address;
-  if (::bind(listener, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0 || ::listen(listener, 64) != 0 ||
-      ::getsockname(listener, reinterpret_cast<sockaddr*>(&address), &length) != 0) {
-    throw std::runtime_error("cannot listen for posts");
-  }
-  _port = ntohs(address.sin_port);
+PostSink::PostSink() : _posts(sharedCounter()) {
+  const int listener = boundSocket(SOCK_STREAM, _port);
+  if (::listen(listener, 64) != 0) throw std::runtime_error("cannot listen for posts");
   _pid = ::fork();
   if (_pid == 0) {
     ::prctl(PR_SET_PDEATHSIG, SIGKILL);
@@ -155,6 +175,22 @@ PostSink::PostSink() {
 
 std::uint64_t PostSink::posts() const {
   return *_posts;
+}
+
+DatagramSink::DatagramSink() : _datagrams(sharedCounter()) {
+  const int socket = boundSocket(SOCK_DGRAM, _port);
+  const int size = 8 << 20;
+  ::setsockopt(socket, SOL_SOCKET, SO_RCVBUFFORCE, &size, sizeof size);
+  _pid = ::fork();
+  if (_pid == 0) {
+    ::prctl(PR_SET_PDEATHSIG, SIGKILL);
+    takeDatagrams(socket, _datagrams);
+  }
+  ::close(socket);
+}
+
+std::uint64_t DatagramSink::datagrams() const {
+  return *_datagrams;
 }
 
 }  // namespace orvanta::bench

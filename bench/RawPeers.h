@@ -41,4 +41,17 @@ class PostSink : public RawPeer {
   volatile std::uint64_t* _posts = nullptr;  // shared with the process
 };
 
+// Takes UDP datagrams as they come, as fast as its processor lets it.
+class DatagramSink : public RawPeer {
+ public:
+  DatagramSink();
+  std::uint16_t port() const { return _port; }
+  // Datagrams received so far; what finds no room in the socket is lost.
+  std::uint64_t datagrams() const;
+
+ private:
+  std::uint16_t _port = 0;
+  volatile std::uint64_t* _datagrams = nullptr;  // shared with the process
+};
+
 }  // namespace orvanta::bench

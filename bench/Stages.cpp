@@ -2,7 +2,6 @@
 
 #include <arpa/inet.h>
 #include <curl/curl.h>
-#include <fcntl.h>
 #include <fmt/core.h>
 #include <netinet/in.h>
 #include <netinet/tcp.h>
@@ -25,7 +24,6 @@
 #include "platform/Json.h"
 #include "tests/support/TestPlatform.h"
 #include "util/Compression.h"
-#include "util/MessageLog.h"
 
 namespace orvanta::bench {
 
@@ -240,23 +238,6 @@ double benchPost(const std::string& body) {
   return raw;
 }
 
-void benchMessageLog(test::TestPlatform& device) {
-  const std::string line = "[http_post -> sendMessageWithDictionary] " + std::string(400, 'x');
-  const std::string file = device.directory / "raw.log";
-  const auto raw = measure(kSeconds, [&] {
-    const int fd = ::open(file.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
-    if (::write(fd, line.data(), line.size()) < 0) throw std::runtime_error("write");
-    ::close(fd);
-    return 1;
-  });
-  const auto figure = measure(kSeconds, [&] {
-    writeToLogFile(device.get(), line);
-    return 1;
-  });
-  printFigure("message-log line", figure);
-  printRatio("  against open, append, close", figure.cpuPerEvent, raw.cpuPerEvent, 3.0);
-}
-
 }  // namespace
 
 RawLimits benchStages() {
@@ -269,7 +250,7 @@ RawLimits benchStages() {
   limits.gzip = benchGzip(encoded.body, "a body of 50 records") / kBatch;
   limits.gzipSingle = benchGzip(encoded.single, "a body of one record");
   limits.post = benchPost(*gzipDeflate(encoded.body));
-  benchMessageLog(device);
+  benchMessageLog();
   return limits;
 }
 

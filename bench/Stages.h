@@ -17,6 +17,9 @@ struct RawLimits {
 // Each prints its lines.
 RawLimits benchStages();
 void benchCallPath();
+void benchDashboard();
 void benchWholePath(const RawLimits& limits);
+// CPU microseconds of the system calls that a message-log line takes at least: listing, statx, open, write, close.
+double benchMessageLog();
 
 }  // namespace orvanta::bench

@@ -34,6 +34,16 @@ std::optional<std::string> makeToken() {
   return token;
 }
 
+// What is no regular file is not opened but only referred to, since the daemon refuses it by its type alone: opening a
+// FIFO would wake its writer and lose what waits in it, and some devices act when they are opened.
+UniqueFd openForDaemon(const std::string& path) {
+  UniqueFd reference(::open(path.c_str(), O_PATH | O_CLOEXEC));
+  struct stat attributes {};
+  if (!reference || ::fstat(reference.get(), &attributes) != 0) return {};
+  if (!S_ISREG(attributes.st_mode)) return reference;
+  return UniqueFd(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+}
+
 bool sameFile(const struct stat& a, const struct stat& b) {
   return a.st_dev == b.st_dev && a.st_ino == b.st_ino;
 }
@@ -56,7 +66,7 @@ CallResult<UploadTokens::Opened> UploadTokens::open(const std::string& path, std
   std::error_code failure;
   const std::string absolute = std::filesystem::absolute(path, failure).string();
   if (failure) return notReadable(path, failure.value());
-  UniqueFd file(::open(absolute.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+  UniqueFd file = openForDaemon(absolute);
   if (!file) return notReadable(absolute, errno);
   UniqueFd kept(::fcntl(file.get(), F_DUPFD_CLOEXEC, 0));
   if (!kept) return notReadable(absolute, errno);

@@ -29,7 +29,8 @@ class UploadTokens {
     std::string token;
     platform::UniqueFd descriptor;  // for the daemon, which reads the file through it alone
   };
-  // Opens the file for reading without ever waiting for it (a FIFO, a device). A token is made up when none is given.
+  // Opens the file for reading; of anything but a regular file the descriptor only says what it is, so that nothing is
+  // woken or read by opening it (a FIFO, a device). Never waits for the file. A token is made up when none is given.
   // While kMaximumInFlight files are being uploaded: waits for one to end if `wait`, else fails. The entry stays until
   // forget().
   CallResult<Opened> open(const std::string& path, std::optional<std::string> token, bool wait);

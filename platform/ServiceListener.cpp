@@ -46,6 +46,7 @@ void Acceptor::start() {
 void Acceptor::acceptSome() {
   if (_closed) return;
   if (!_watch) _watch = _queue->makeDescriptorWatch(_socket.socket.get());
+  if (!_watch) return pause(ENOSPC);  // the limit of watched descriptors
   for (int i = 0; i < kAcceptsPerTurn; ++i) {
     if (!acceptOne()) return;
   }

@@ -83,6 +83,7 @@ void SocketConnection::begin(std::shared_ptr<ConnectionDelegate> delegate) {
   _phase = Phase::open;
   _delegate = std::move(delegate);
   _watch = _queue->makeDescriptorWatch(_socket.get());
+  if (!_watch) return end();
   takeTurn();
 }
 

@@ -213,8 +213,8 @@ void SocketOutbox::waitUntilWritable(const std::shared_ptr<void>& owner) {
     if (!_writer.socket) _writer.socket.reset(::fcntl(_socket, F_DUPFD_CLOEXEC, 0));
   }
   const auto write = [self = shared_from_this(), owner] { self->writeOn(owner); };
-  if (_writer.socket) {
-    if (!_writer.watch) _writer.watch = _writerQueue->makeDescriptorWatch(_writer.socket.get());
+  if (_writer.socket && !_writer.watch) _writer.watch = _writerQueue->makeDescriptorWatch(_writer.socket.get());
+  if (_writer.watch) {
     _writer.watch->whenWritable(write);
   } else {
     retryLater(owner);

@@ -142,16 +142,19 @@ class SteadyTimer final : public Timer {
 
 class StrandWatch final : public DescriptorWatch {
  public:
-  StrandWatch(std::shared_ptr<StrandQueue> queue, int fd) : _queue(std::move(queue)), _descriptor(_queue->io()) {
-    asio::error_code error;
-    _descriptor.assign(fd, error);
-    if (error) PLATFORM_LOG(error, "DescriptorWatch: Descriptor {} cannot be watched: {}", fd, error.message());
-  }
+  explicit StrandWatch(std::shared_ptr<StrandQueue> queue) : _queue(std::move(queue)), _descriptor(_queue->io()) {}
   ~StrandWatch() override {
     disarm();
     if (_descriptor.is_open()) _descriptor.release();  // it stays open: it is the caller's
   }
 
+  // Before anything else. False, with a log line, when the descriptor cannot be watched.
+  bool assign(int fd) {
+    asio::error_code error;
+    _descriptor.assign(fd, error);
+    if (error) PLATFORM_LOG(error, "DescriptorWatch: Descriptor {} cannot be watched: {}", fd, error.message());
+    return !error;
+  }
   void whenReadable(Job handler) override {
     wait(asio::posix::descriptor_base::wait_read, _readable, std::move(handler));
   }
@@ -188,7 +191,8 @@ std::unique_ptr<Timer> StrandQueue::makeTimer() {
 }
 
 std::unique_ptr<DescriptorWatch> StrandQueue::makeDescriptorWatch(int fd) {
-  return std::make_unique<StrandWatch>(std::static_pointer_cast<StrandQueue>(shared_from_this()), fd);
+  auto watch = std::make_unique<StrandWatch>(std::static_pointer_cast<StrandQueue>(shared_from_this()));
+  return watch->assign(fd) ? std::move(watch) : nullptr;
 }
 
 }  // namespace

@@ -61,7 +61,7 @@ class WorkQueue : public std::enable_shared_from_this<WorkQueue> {
 
   // A timer and a watch whose handlers run on this queue. Not armed yet.
   virtual std::unique_ptr<Timer> makeTimer() = 0;
-  // Watches `fd`, which the caller keeps open until cancel() or the watch's destruction.
+  // Watches `fd`, which the caller keeps open until cancel() or the watch's destruction; null if the system cannot.
   virtual std::unique_ptr<DescriptorWatch> makeDescriptorWatch(int fd) = 0;
 };
 

@@ -134,13 +134,15 @@ TEST_F(Upload, ofWhatCannotBeOpenedFailsHere) {
   exchangeOneCall();
 }
 
-TEST_F(Upload, neverWaitsForAFifo) {
+TEST_F(Upload, neitherWaitsForAFifoNorOpensIt) {
   const auto fifo = files / "fifo";
   ASSERT_EQ(::mkfifo(fifo.c_str(), 0600), 0);
   Awaited<UploadReply> uploaded;
   session().uploadFileAtPath(fifo, uploaded.reply());
   const auto call = nextUpload();
-  EXPECT_TRUE(call.file);
+  struct stat attributes {};
+  EXPECT_TRUE(::fstat(call.file.get(), &attributes) == 0 && S_ISFIFO(attributes.st_mode));
+  EXPECT_EQ(::open(fifo.c_str(), O_WRONLY | O_NONBLOCK | O_CLOEXEC), -1) << "no reader, so no writer was woken";
   peer->notify("removeFile", {call.token});
   peer->answer(call.frame, {false});
   EXPECT_FALSE(std::get<0>(*uploaded.get().values));

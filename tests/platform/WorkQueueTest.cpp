@@ -348,6 +348,14 @@ TEST_F(WatchTest, FiresOnceForEachWait) {
   EXPECT_TRUE(readable.waitFor(2));
 }
 
+TEST_F(WatchTest, ThereIsNoneForWhatCannotBeWatched) {
+  const int closed = _ours.get();
+  _ours.reset();
+  std::unique_ptr<DescriptorWatch> none;
+  onQueue([&] { none = _queue->makeDescriptorWatch(closed); });
+  EXPECT_EQ(none, nullptr);
+}
+
 TEST_F(WatchTest, WaitsForRoomToWrite) {
   watch();
   std::vector<char> block(1U << 16U);

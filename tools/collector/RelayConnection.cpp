@@ -15,6 +15,16 @@ namespace orvanta::collector {
 
 namespace {
 
+// A query may hold further question marks, but the library refuses them.
+std::string targetForLibrary(std::string target) {
+  const auto query = target.find('?');
+  if (query == std::string::npos) return target;
+  for (auto next = target.find('?', query + 1); next != std::string::npos; next = target.find('?', next)) {
+    target.replace(next, 1, "%3F");
+  }
+  return target;
+}
+
 // A body may inflate to a few times what it may measure on the wire, not to all that a hostile one could.
 constexpr std::size_t kInflationAllowance = 4;
 
@@ -146,8 +156,9 @@ bool RelayConnection::refuse(ReceivedRequest& request, int status, const std::st
 }
 
 BackendAnswer RelayConnection::usualAnswer(const ReceivedRequest& request) {
-  const std::string head = fmt::format("{} {} HTTP/1.1\r\nHost: collector\r\n{}: {}\r\nContent-Length: 0\r\n\r\n",
-                                       request.method, request.target, Exchanges::kHeader, request.exchange);
+  const std::string head =
+      fmt::format("{} {} HTTP/1.1\r\nHost: collector\r\n{}: {}\r\nContent-Length: 0\r\n\r\n", request.method,
+                  targetForLibrary(request.target), Exchanges::kHeader, request.exchange);
   auto answer = _context.backend.exchange(head, request.method != "HEAD");
   if (answer) return std::move(answer.value());
   return {{502, {{"Content-Type", "text/plain"}}}, answer.error() + "\n"};

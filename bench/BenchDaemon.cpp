@@ -1,0 +1,32 @@
+#include "bench/BenchDaemon.h"
+
+#include <fstream>
+#include <iterator>
+#include <stdexcept>
+#include <utility>
+
+namespace orvanta::bench {
+
+BenchDaemon::BenchDaemon(platform::Dictionary section, bool consent) {
+  test::DaemonProcess::Options options;
+  if (!section.empty()) {
+    collector::CollectorOptions serving;
+    serving.directory = _directory / "collector";
+    auto started = collector::Collector::start(std::move(serving));
+    if (!started) throw std::runtime_error(started.error());
+    _collector = std::move(*started);
+    _collector->setSection(std::move(section));
+    options.storebagURL = _collector->storebagURL();
+    std::ifstream key(_collector->publicKeyFile(), std::ios::binary);
+    options.publicKey = {std::istreambuf_iterator<char>(key), {}};
+  }
+  options.device = {{"ProductVersion", "12.5"}, {"BuildVersion", "12F5"}, {"ProductType", "Parva3,2"},
+                    {"DeviceName", "Parva"},    {"CountryCode", "DE"},    {"DiagnosticsSubmissionAllowed", consent}};
+  options.logLevel = "4";
+  _process = std::make_unique<test::DaemonProcess>(std::move(options));
+  if (!_process->startQuietly()) {
+    throw std::runtime_error("orvantad does not start: " + _process->process().allLines());
+  }
+}
+
+}  // namespace orvanta::bench

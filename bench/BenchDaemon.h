@@ -1,0 +1,26 @@
+#pragma once
+
+#include <memory>
+
+#include "platform/Value.h"
+#include "tests/support/DaemonProcess.h"
+#include "tests/support/TemporaryDirectory.h"
+#include "tools/collector/Collector.h"
+
+namespace orvanta::bench {
+
+// A real daemon that logs nothing but warnings, with its storebag's section from a collector. Construction throws when
+// something does not start.
+class BenchDaemon {
+ public:
+  // Without a section there is no collector, and no session has a backend. `consent`: to diagnostics, by the user.
+  explicit BenchDaemon(platform::Dictionary section = {}, bool consent = true);
+  test::DaemonProcess& process() const { return *_process; }
+
+ private:
+  test::TemporaryDirectory _directory;
+  std::unique_ptr<collector::Collector> _collector;
+  std::unique_ptr<test::DaemonProcess> _process;
+};
+
+}  // namespace orvanta::bench

@@ -1,0 +1,262 @@
+#include <fmt/core.h>
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <atomic>
+#include <cmath>
+#include <ctime>
+#include <map>
+#include <thread>
+
+#include "backends/DashboardDatagram.h"
+#include "tests/integration/IntegrationFixture.h"
+#include "tests/support/UdpServer.h"
+
+namespace orvanta::test {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+using Seconds = std::chrono::duration<double>;
+
+// What allocators keep. Sanitizers keep what has been freed.
+#if defined(__SANITIZE_THREAD__) || defined(__SANITIZE_ADDRESS__)
+constexpr std::size_t kMemoryLeewayKiB = 256 * 1024;
+#else
+constexpr std::size_t kMemoryLeewayKiB = 512;
+#endif
+
+class DashboardTest : public IntegrationFixture {
+ protected:
+  static constexpr double kLeeway = 0.1;
+  static constexpr std::size_t kPerSession = 2;  // descriptors: its connection's and its dashboard backend's
+  // The last tick before each transmission but the first, counted from the tick before the first.
+  static constexpr double kTicksBetween[] = {3, 5, 9};
+
+  Dictionary dashboard(int period, std::uint16_t port) const {
+    return {{"dashboard", Dictionary{{"ip", "127.0.0.1"}, {"port", port}, {"reliable", period}}}};
+  }
+  // With a log that costs nothing.
+  void startQuietDaemon() {
+    options.logLevel = "4";
+    daemon = std::make_unique<DaemonProcess>(options);
+    ASSERT_TRUE(daemon->startQuietly());
+  }
+  // What the collector has received, by event number.
+  std::map<std::uint16_t, std::vector<collector::ReceivedDatagram>> transmissions() {
+    std::map<std::uint16_t, std::vector<collector::ReceivedDatagram>> found;
+    for (auto& datagram : server->datagrams()) found[datagram.eventNumber].push_back(std::move(datagram));
+    return found;
+  }
+  // The first retransmission follows after the second tick from now, the others a whole number of periods later.
+  static void expectSchedule(const std::vector<collector::ReceivedDatagram>& sent, double period) {
+    ASSERT_LE(sent.size(), 5U);
+    for (std::size_t i = 1; i < sent.size(); ++i) {
+      const double waited = sent[i].time - sent[i - 1].time;
+      const double least = i == 1 ? period : kTicksBetween[i - 2] * period;
+      const double most = i == 1 ? 2 * period : least;
+      EXPECT_GT(waited, least - kLeeway) << "event " << sent[i].eventNumber << ", retransmission " << i;
+      EXPECT_LT(waited, most + kLeeway) << "event " << sent[i].eventNumber << ", retransmission " << i;
+      EXPECT_EQ(sent[i].bytes, sent[0].bytes);
+    }
+  }
+};
+
+TEST_F(DashboardTest, NothingIsLostOrAcknowledgedTwiceWhenAcknowledgementsAreLost) {
+  constexpr int kPeriod = 200;
+  constexpr std::uint16_t kEvents = 40;
+  setSection(dashboard(kPeriod, server->dashboardPort()));
+  collector::AcknowledgementSettings losing;
+  losing.lossPercent = 30;
+  server->setAcknowledgements(losing);
+  startDaemon();
+  auto session = openSession({.sessionID = 7});
+  const auto descriptors = daemon->descriptorCount() - kPerSession;
+  for (std::uint16_t i = 0; i < kEvents; ++i) send(*session, event(9, i));
+  session.reset();  // its backend stays until everything is settled
+  const auto settled = [this] {
+    const auto all = transmissions();
+    return all.size() == kEvents + 2U && std::all_of(all.begin(), all.end(), [](const auto& each) {
+             return each.second.back().acknowledgements > 0 || each.second.size() == 5;
+           });
+  };
+  ASSERT_TRUE(server->inbox().waitUntil(settled, kPatience));
+  EXPECT_TRUE(daemon->settles([this] { return daemon->descriptorCount(); }, descriptors));
+  EXPECT_TRUE(settled()) << "nothing was sent again after its acknowledgement";
+
+  std::size_t repeated = 0;
+  for (const auto& [number, sent] : transmissions()) {
+    std::int64_t acknowledged = 0;
+    for (const auto& each : sent) acknowledged += each.acknowledgements;
+    EXPECT_LE(acknowledged, 1) << "event " << number;
+    repeated += sent.size() > 1 ? 1 : 0;
+    expectSchedule(sent, kPeriod / 1000.0);
+  }
+  EXPECT_GT(repeated, 3U);
+}
+
+TEST_F(DashboardTest, ASilentServerGetsEachDatagramFiveTimesOnSchedule) {
+  constexpr int kPeriod = 200;
+  setSection(dashboard(kPeriod, server->dashboardPort()));
+  collector::AcknowledgementSettings silent;
+  silent.acknowledge = false;
+  server->setAcknowledgements(silent);
+  startDaemon();
+  auto session = openSession({.sessionID = 7});
+  const auto descriptors = daemon->descriptorCount() - kPerSession;
+  ASSERT_TRUE(server->waitForDatagrams(5, kPatience));
+  expectSchedule(transmissions()[1], kPeriod / 1000.0);
+  server->setAcknowledgements({});
+  send(*session, event(9, 1));  // acknowledged at once, while the tick that gives up the first is still to come
+  ASSERT_TRUE(server->waitForDatagrams(6, kPatience));
+  session.reset();
+  EXPECT_TRUE(daemon->settles([this] { return daemon->descriptorCount(); }, descriptors));
+  EXPECT_EQ(daemon->count("<7>DashboardBackend(myPeriodicTask): clean up at myPeriodicTask."), 1U);
+  const auto all = transmissions();
+  EXPECT_EQ(all.size(), 3U);
+  for (const auto& [number, sent] : all) EXPECT_EQ(sent.size(), number == 1 ? 5U : 1U) << "event " << number;
+}
+
+TEST_F(DashboardTest, AThousandSessionsLeaveNothingBehind) {
+  setSection(dashboard(20, server->dashboardPort()));
+  startQuietDaemon();
+  const auto openAndClose = [this](int sessions) {
+    constexpr int kAtOnce = 50;
+    for (int opened = 0; opened < sessions; opened += kAtOnce) {
+      std::vector<std::unique_ptr<OrvantaConnection>> open;
+      for (int i = 0; i < kAtOnce; ++i) {
+        open.push_back(openSession({.sessionID = 1}));
+        send(*open.back(), event(9, 1, {{"key", std::string(100, 'x')}}));
+      }
+    }
+  };
+  const auto descriptorCount = [this] { return daemon->descriptorCount(); };
+  const auto first = openSession({.sessionID = 1});  // beside it, the connection to the storebag server is kept
+  const auto descriptors = daemon->descriptorCount();
+  openAndClose(200);  // fills what is kept
+  ASSERT_TRUE(daemon->settles(descriptorCount, descriptors));
+  const auto threads = daemon->threadCount();
+  const auto resident = daemon->residentKiB();
+  openAndClose(1000);
+  EXPECT_TRUE(daemon->settles(descriptorCount, descriptors));
+  EXPECT_TRUE(daemon->settles([this] { return daemon->threadCount(); }, threads));
+  fmt::print("resident memory: {} KiB before a thousand sessions, {} KiB after\n", resident, daemon->residentKiB());
+  EXPECT_LT(daemon->residentKiB(), resident + kMemoryLeewayKiB);
+}
+
+// A dashboard server that floods the daemon with everything but the right acknowledgement.
+class FloodTest : public DashboardTest {
+ protected:
+  static constexpr int kFlood = 1'000'000;
+  static constexpr double kPeriod = 0.3;
+
+  static std::vector<std::uint8_t> acknowledgement(unsigned number) {
+    std::vector<std::uint8_t> datagram(64, 0);
+    datagram[60] = static_cast<std::uint8_t>(number >> 8U);
+    datagram[61] = static_cast<std::uint8_t>(number);
+    return datagram;
+  }
+  // The number of the next datagram's event.
+  std::uint16_t received() {
+    const auto datagram = dashboardServer.receive();
+    EXPECT_TRUE(datagram) << "no datagram came";
+    return datagram ? decodeDashboardDatagram(*datagram)->header.eventNumber : 0;
+  }
+  void flood(std::uint16_t awaited, const std::vector<std::uint8_t>& right) {
+    const std::vector<std::uint8_t> tooShort(right.begin(), right.begin() + 61);
+    const std::vector<std::uint8_t> tooLong(2000, 0xff);
+    const auto daemonsAddress = dashboardServer.sender();
+    for (unsigned i = 0; i < kFlood; ++i) {
+      if (i % 100 == 0) stranger.sendTo(daemonsAddress, right);
+      if (i % 100 == 50) {
+        dashboardServer.send(tooShort);
+      } else if (i % 100 == 51) {
+        dashboardServer.send(tooLong);
+      } else if (i % 0x10000 != awaited) {
+        dashboardServer.send(acknowledgement(i));
+      }
+    }
+  }
+  double daemonCpuSeconds() const {
+    clockid_t clock{};
+    timespec time{};
+    if (::clock_getcpuclockid(daemon->process().pid(), &clock) != 0 || ::clock_gettime(clock, &time) != 0) return 0;
+    return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) / 1e9;
+  }
+  // The round trips of a session's calls, in seconds and in order of length, until `enough`.
+  template <class Enough>
+  static std::vector<double> roundTrips(OrvantaConnection& session, Enough enough) {
+    std::vector<double> times;
+    while (!enough(times.size())) {
+      const auto begun = Clock::now();
+      send(session, event(9, 1));
+      times.push_back(Seconds(Clock::now() - begun).count());
+    }
+    std::sort(times.begin(), times.end());
+    return times;
+  }
+
+  UdpServer dashboardServer;
+  UdpServer stranger;
+};
+
+TEST_F(FloodTest, AMillionWrongAcknowledgementsRemoveNothingAndHarmNobody) {
+  setSection(dashboard(static_cast<int>(kPeriod * 1000), dashboardServer.port()));
+  startQuietDaemon();
+  auto bystander = connect();  // without a backend; its calls are carried out by the same threads
+  auto session = openSession({.sessionID = 7});
+  EXPECT_EQ(received(), 1) << "the session's start";
+  dashboardServer.send(acknowledgement(1));
+  const auto calm = roundTrips(*bystander, [](std::size_t count) { return count == 2000; });
+
+  send(*session, event(9, 1));
+  const auto sentAt = Clock::now();
+  const auto datagram = dashboardServer.receive();
+  ASSERT_TRUE(datagram);
+  const auto awaited = decodeDashboardDatagram(*datagram)->header.eventNumber;
+  EXPECT_EQ(awaited, 2);
+  std::atomic<bool> over{false};
+  const double cpuBefore = daemonCpuSeconds();
+  std::thread flooder([&] {
+    flood(awaited, *datagram);
+    over = true;
+  });
+  const auto flooded = roundTrips(*bystander, [&](std::size_t count) { return over && count >= 100; });
+  flooder.join();
+  const double wall = Seconds(Clock::now() - sentAt).count();
+  const double cpu = daemonCpuSeconds() - cpuBefore;
+  const auto median = [](const std::vector<double>& times) { return times[times.size() / 2]; };
+  const auto p99 = [](const std::vector<double>& times) { return times[times.size() * 99 / 100]; };
+  fmt::print("a flood of {:.1f} s: {:.2f} s of the daemon's CPU for it and for {} calls of another session, whose\n",
+             wall, cpu, flooded.size());
+  fmt::print("median was {:.0f} us, {:.1f} x the calm one of {:.0f} us (99 %: {:.0f} us, {:.1f} x of {:.0f} us)\n",
+             median(flooded) * 1e6, median(flooded) / median(calm), median(calm) * 1e6, p99(flooded) * 1e6,
+             p99(flooded) / p99(calm), p99(calm) * 1e6);
+  // The flooder takes a processor of its own, which on a small machine the calls would otherwise have.
+  EXPECT_LT(median(flooded), 0.05);
+
+  // The datagram has kept its schedule, which a removal would have ended.
+  const double ticks = std::floor(wall / kPeriod) - 1;
+  std::size_t due = 1;
+  for (const int tick : {2, 5, 10, 19}) due += tick <= ticks ? 1 : 0;
+  std::size_t seen = 1;
+  for (; seen < due; ++seen) EXPECT_EQ(received(), awaited);
+
+  // And the right ones still count: they end everything before the last resort or the schedule's end does.
+  const auto openBefore = daemon->descriptorCount();
+  send(*session, event(9, 2));
+  session.reset();
+  std::map<std::uint16_t, std::size_t> transmissions;
+  while (daemon->descriptorCount() > openBefore - kPerSession) {
+    const auto late = dashboardServer.receive(50);
+    if (!late) continue;
+    ++transmissions[decodeDashboardDatagram(*late)->header.eventNumber];
+    dashboardServer.send(*late);
+  }
+  for (const std::uint16_t number : {3, 4}) {
+    EXPECT_GE(transmissions[number], 1U);
+    EXPECT_LT(transmissions[number], 5U) << "event " << number;
+  }
+}
+
+}  // namespace
+}  // namespace orvanta::test
