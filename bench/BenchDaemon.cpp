@@ -7,8 +7,9 @@
 
 namespace orvanta::bench {
 
-BenchDaemon::BenchDaemon(platform::Dictionary section, bool consent) {
+BenchDaemon::BenchDaemon(platform::Dictionary section, bool consent, bool sandbox) {
   test::DaemonProcess::Options options;
+  options.sandbox = sandbox;
   if (!section.empty()) {
     collector::CollectorOptions serving;
     serving.directory = _directory / "collector";

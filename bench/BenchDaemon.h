@@ -14,7 +14,7 @@ namespace orvanta::bench {
 class BenchDaemon {
  public:
   // Without a section there is no collector, and no session has a backend. `consent`: to diagnostics, by the user.
-  explicit BenchDaemon(platform::Dictionary section = {}, bool consent = true);
+  explicit BenchDaemon(platform::Dictionary section = {}, bool consent = true, bool sandbox = true);
   test::DaemonProcess& process() const { return *_process; }
 
  private:
