@@ -138,7 +138,7 @@ void benchDashboard() {
     const std::size_t answerSize = driver.call(call);  // the log line, always of the same length
     const double echo = rawEcho(daemon.process().runtimeDirectory() + "/echo", call, answerSize);
 
-    constexpr std::uint64_t kEvents = 64 * 1000;
+    constexpr std::uint64_t kEvents = kWindow * 300;
     const auto before = sink.datagrams();
     const Stretch time(daemon.process().process().pid());
     driver.pipeline(repeated(call, kWindow), answerSize, kEvents, kWindow);
