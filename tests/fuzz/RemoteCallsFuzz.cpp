@@ -1,0 +1,132 @@
+#include <memory>
+#include <vector>
+
+#include "interface/RemoteCalls.h"
+#include "tests/fuzz/Require.h"
+
+namespace {
+
+using namespace orvanta;
+using platform::Frame;
+using platform::FrameDecoder;
+
+// Takes the answers to one request at a time.
+class Answers final : public platform::Outbox {
+ public:
+  bool send(std::span<const std::uint8_t> message, Urgency) override {
+    FrameDecoder decoder;
+    decoder.append(message);
+    const auto outcome = decoder.next();
+    const Frame* frame = std::get_if<Frame>(&outcome);
+    REQUIRE(frame != nullptr && decoder.pending() == 0);
+    REQUIRE(frame->kind == Frame::Kind::response && frame->messageID == expected && !frame->refusal);
+    ++count;
+    return true;
+  }
+  bool sendWithDescriptor(std::span<const std::uint8_t>, platform::UniqueFd) override { return false; }
+  std::size_t pending() const override { return 0; }
+  bool isClosed() const override { return false; }
+
+  std::uint32_t expected = 0;
+  int count = 0;
+};
+
+// Answers with what it was given, or, when told to, with nothing.
+class Echo final : public ClientSessionInterface {
+ public:
+  bool drops = false;
+
+  void setSessionInfo(SharedDictionary info, SharedDictionary, SharedArray, bool, DoneReply done) override {
+    REQUIRE(info != nullptr);
+    if (!drops) done();
+  }
+  void startConfigWithCompletionHandler(BackendNamesReply reply) override { names(std::move(reply)); }
+  void fetchStatesWithUserInfo(SharedDictionary, BackendNamesReply reply) override { names(std::move(reply)); }
+  void fetchDisplayURL(StringReply reply) override { text(nullptr, std::move(reply)); }
+  void sendMessageWithCategory(std::uint16_t, std::uint16_t, SharedDictionary payload, StringReply reply) override {
+    text(payload, std::move(reply));
+  }
+  void sendMessageWithDictionary(SharedDictionary parameters, StringReply reply) override {
+    REQUIRE(parameters != nullptr);
+    text(parameters, std::move(reply));
+  }
+  void flushMessagesWithCompletion(FlushReply reply) override {
+    if (!drops) reply("flushed", makeOrvantaError("description", 503));
+  }
+  void finishSessionWithReply(StringReply reply) override { text(nullptr, std::move(reply)); }
+  void uploadFileAtPath(std::string, std::optional<std::string>, UploadReply reply) override {
+    if (!drops) reply(true);
+  }
+  void uploadLogData(SharedArray, LogDataReply reply) override {
+    if (!drops) reply(false, makeOrvantaError("description", -1));
+  }
+  void sendMessageWithSessionInfo(SharedDictionary info, SharedDictionary, std::uint16_t, std::uint16_t,
+                                  SharedDictionary payload, StringReply reply) override {
+    REQUIRE(info != nullptr);
+    text(payload, std::move(reply));
+  }
+
+ private:
+  void names(BackendNamesReply reply) {
+    if (!drops) reply(std::vector<std::string>{"one", "two"});
+  }
+  void text(const SharedDictionary& given, StringReply reply) {
+    if (drops) return;
+    reply(given ? std::optional(platform::Value(*given).description()) : std::nullopt);
+  }
+};
+
+template <class... Values>
+void deliverTo(const Frame& frame, Reply<Values...> /*kind*/) {
+  int calls = 0;
+  deliverResponse(Frame(frame), Reply<Values...>([&calls](auto) { ++calls; }));
+  REQUIRE(calls == 1);
+}
+
+void takeAsClient(Frame frame) {
+  if (frame.kind == Frame::Kind::response) {
+    deliverTo(frame, BackendNamesReply());
+    deliverTo(frame, StringReply());
+    deliverTo(frame, FlushReply());
+    deliverTo(frame, UploadReply());
+    deliverTo(frame, LogDataReply());
+    deliverTo(frame, DoneReply());
+  }
+  if (const auto token = decodeRemoveFile(frame)) REQUIRE(frame.method == "removeFile");
+  auto event = decodeSendMessageToClient(frame);
+  if (!event) return;
+  // What it means survives being sent on.
+  FrameDecoder decoder;
+  decoder.append(
+      encodeSendMessageToClient(event->sessionInfo, event->timestamp, event->category, event->type, event->payload));
+  auto outcome = decoder.next();
+  auto again = decodeSendMessageToClient(std::get<Frame>(outcome));
+  REQUIRE(again && again->category == event->category && again->type == event->type);
+  REQUIRE((again->payload == nullptr) == (event->payload == nullptr));
+  REQUIRE(again->isEndNotice() == event->isEndNotice());
+}
+
+}  // namespace
+
+// A peer's bytes as calls on a session, and as answers and notices to a client. The first byte says whether the session
+// answers or drops its replies; either way each request has one answer and a notification none.
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
+  if (size == 0) return 0;
+  Echo session;
+  session.drops = (bytes[0] & 1U) != 0;
+  const auto answers = std::make_shared<Answers>();
+  FrameDecoder decoder({4096, 64U << 10U, 16});
+  decoder.append({bytes + 1, size - 1});
+  for (;;) {
+    auto outcome = decoder.next();
+    Frame* frame = std::get_if<Frame>(&outcome);
+    if (frame == nullptr) return 0;
+    takeAsClient(*frame);
+    if (frame->kind == Frame::Kind::response) continue;  // ends the connection before it becomes a call
+    const bool isRequest = frame->kind == Frame::Kind::request;
+    answers->expected = frame->messageID;
+    answers->count = 0;
+    dispatchCall(std::move(*frame), session, answers);
+    REQUIRE(answers->count == (isRequest ? 1 : 0));
+  }
+}

@@ -1,0 +1,71 @@
+#include <memory>
+#include <string>
+
+#include "backends/HTTPSPostBackend.h"
+#include "platform/LogSink.h"
+#include "tests/fuzz/Require.h"
+#include "tests/support/TestPlatform.h"
+#include "tests/util/SignedStorebag.h"
+#include "util/Storebag.h"
+
+namespace {
+
+using namespace orvanta;
+
+struct Swallow final : platform::LogSink {
+  void write(platform::LogLevel, std::string_view line) override { REQUIRE(line.find('\n') == std::string_view::npos); }
+};
+
+// A device that trusts the server's key, and the server.
+struct World {
+  World() {
+    const auto key = signer.publicKeyDer(test::KeyLayout::subjectPublicKeyInfo);
+    device.directory.write("share/publicKey.der", {reinterpret_cast<const char*>(key.data()), key.size()});
+    device.http.answer = [this](const platform::HttpRequest&) {
+      return test::ScriptedHttpClient::status(200, document);
+    };
+    platform::installLogSink(&log);
+    platform::setLogLevel(platform::LogLevel::debug);
+  }
+  Swallow log;
+  test::StorebagSigner signer;
+  test::TestPlatform device;
+  std::string document;
+};
+
+void evaluate(platform::Platform& platform, const platform::Value& profile) {
+  if (profile.dictionary() == nullptr) return;
+  const auto backend = HTTPSPostBackend::create(
+      platform, "http_post", std::make_shared<const platform::Dictionary>(*profile.dictionary()), "Parva");
+  if (!backend) return;
+  BackendIdentity identity;
+  identity.compType = 5;
+  identity.requireUserInfo = true;
+  identity.selfVersion = "8.0.0";
+  backend->setIdentity(std::move(identity));
+  backend->updateState();
+  REQUIRE(backend->state() == kBackendWaiting);
+  backend->setUserInfoDict(
+      std::make_shared<const platform::Dictionary>(platform::Dictionary{{"clientName", "c"}, {"serviceName", "s"}}));
+  backend->updateState();
+  REQUIRE(backend->state() >= kBackendWaiting && backend->state() <= kBackendSampledOut);
+  REQUIRE(backend->state() == kBackendWaiting || backend->reason());
+}
+
+}  // namespace
+
+// What a configuration server sends: the whole document when the first byte is even, else a bag that is signed as the
+// server would. A bag that comes through is evaluated for a client, profile by profile.
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
+  static World& world = *new World;
+  if (size == 0) return 0;
+  const std::span<const std::uint8_t> rest(bytes + 1, size - 1);
+  const bool isSigned = (bytes[0] & 1U) != 0;
+  world.document = isSigned ? world.signer.document(rest) : std::string(rest.begin(), rest.end());
+  StorebagFetch fetch;
+  const auto section = fetchStorebagForEnvironmentAndClientType(world.device, 5, fetch);
+  if (!section) return 0;
+  REQUIRE(isSigned);  // nobody can guess a signature
+  for (const auto& [name, profile] : *section) evaluate(world.device, profile);
+  return 0;
+}
