@@ -253,6 +253,7 @@ TEST_F(OutboxTest, ADescriptorWaitsForItsFrameToComplete) {
 TEST_F(OutboxTest, TooManyWaitingDescriptorsEndTheConnection) {
   const std::size_t before = openDescriptors();
   for (const bool inOneMessage : {false, true}) {
+    startPool(2);
     auto made = open();
     const UniqueFd descriptor = readableWith(1);
     const Bytes call = notification("takesNothing");
