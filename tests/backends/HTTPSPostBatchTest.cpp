@@ -1,7 +1,5 @@
 #include <gtest/gtest.h>
 
-#include <algorithm>
-
 #include "tests/backends/HTTPSFixture.h"
 
 namespace orvanta::test {
@@ -186,28 +184,6 @@ TEST_F(HTTPSPostBatchTest, Correlation) {
   numeric->setCorrelatedSessionID("c");
   flush(*numeric);
   EXPECT_EQ(sessionIDs(requests().at(3)), (Labels{"info"}));
-}
-
-// Every event arrives once, in order within its category.
-TEST_F(HTTPSPostBatchTest, TenThousandEventsOfFortyCategories) {
-  const auto backend = makeBackend(batching());
-  for (int i = 0; i < 10'000; ++i) {
-    send(*backend, static_cast<std::uint16_t>((i * 7) % 40), 0, shared({{"number", i}}));
-  }
-  flush(*backend);
-  std::vector<int> seen(10'000, 0);
-  std::vector<std::int64_t> last(40, -1);
-  for (const auto& request : requests()) {
-    for (const Value& event : postedEvents(request)) {
-      const std::int64_t number = event.dictionary()->find("number")->integerValue();
-      const auto category = static_cast<std::size_t>(event.dictionary()->find("_method")->integerValue());
-      ++seen.at(static_cast<std::size_t>(number));
-      EXPECT_GT(number, last.at(category));
-      last.at(category) = number;
-    }
-  }
-  EXPECT_EQ(std::count(seen.begin(), seen.end(), 1), 10'000);
-  EXPECT_GT(requests().size(), 1U);
 }
 
 }  // namespace

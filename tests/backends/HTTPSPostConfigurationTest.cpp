@@ -35,12 +35,6 @@ TEST_F(HTTPSPostConfigurationTest, RefusesProfilesWithoutClients) {
   EXPECT_EQ(log.count(line), 2U);
 }
 
-TEST_F(HTTPSPostConfigurationTest, DisplayURL) {
-  Setup setup;
-  setup.profile.set("display_url", "https://show.example");
-  EXPECT_EQ(makeBackend(setup)->displayURL(), "https://show.example");
-}
-
 TEST_F(HTTPSPostConfigurationTest, LinesOfAnEvaluation) {
   Dictionary section = openSection();
   section.set("expedite", 0);
@@ -148,15 +142,6 @@ TEST_F(HTTPSPostConfigurationTest, EmptyFiltersKeepTheEarlierOnes) {
   backend->updateState();
   send(*backend, 1, 0, shared({{"secret", "x"}}));
   EXPECT_FALSE(postedEvents(requests().at(0)).at(0).dictionary()->contains("secret"));
-}
-
-TEST_F(HTTPSPostConfigurationTest, URLsOfTheStorebag) {
-  const auto backend = makeBackend({});
-  EXPECT_EQ(urlOf(*backend, 0), "https://events.example/batch");
-  EXPECT_EQ(urlOf(*backend, 1), "https://events.example/realtime");
-  EXPECT_EQ(urlOf(*backend, 2), "https://events.example/batch");
-  EXPECT_EQ(urlOf(*backend, 3), "https://events.example/realtime");
-  EXPECT_EQ(urlOf(*backend, 5), "https://events.example/batch") << "a flag beyond the two bits is none of them";
 }
 
 TEST_F(HTTPSPostConfigurationTest, TheLastVisitedSectionDecidesTheRealtimeURL) {

@@ -245,19 +245,5 @@ TEST_F(RsaTest, RefusesWhatIsNoUsableKey) {
   for (const auto& row : rows) EXPECT_EQ(RsaPublicKey::fromDer(row.der), nullptr) << row.what;
 }
 
-TEST_F(RsaTest, SeveralThreadsVerifyWithOneKey) {
-  const Bytes digest = digestBytes();
-  const Bytes signature = pair().signBlock(block(joined({kDigestInfo, digest})));
-  std::atomic<int> good{0};
-  std::vector<std::thread> threads;
-  for (int i = 0; i < 4; ++i) {
-    threads.emplace_back([&] {
-      for (int n = 0; n < 50; ++n) good += _key->verifySha1(digest, signature);
-    });
-  }
-  for (auto& thread : threads) thread.join();
-  EXPECT_EQ(good, 200);
-}
-
 }  // namespace
 }  // namespace platform

@@ -81,12 +81,6 @@ class HttpShutdownTest : public HttpFixture {
   }
 };
 
-TEST_F(HttpShutdownTest, WithoutARequestItReturnsAtOnce) {
-  client().abortBlockingRequests();
-  client().shutdown(seconds(60));
-  client().shutdown(seconds(60));
-}
-
 TEST_F(HttpShutdownTest, RequestsThatEndInTimeGetTheirAnswers) {
   RawServer server(RawServer::answering(RawServer::response("200 OK")));
   const auto lane = client().makeLane();

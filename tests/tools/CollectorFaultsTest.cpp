@@ -77,15 +77,6 @@ TEST_F(CollectorFaultsTest, BreaksAnswersAsAsked) {
   EXPECT_EQ(requests[2].note, "truncate");
 }
 
-TEST_F(CollectorFaultsTest, BreaksAnswersOverTlsToo) {
-  for (const auto fault : {ConnectionFault::reset, ConnectionFault::truncate, ConnectionFault::garbage}) {
-    collector->setFault("/events", fault);
-    EXPECT_FALSE(https()->Post("/events", kPost, "application/json")) << connectionFaultText(fault);
-  }
-  collector->clearBehaviours();
-  EXPECT_TRUE(https()->Post("/events", kPost, "application/json"));
-}
-
 TEST_F(CollectorFaultsTest, StaysSilentUntilTheClientOrTheCollectorEnds) {
   collector->setFault("/events", ConnectionFault::silent);
   auto impatient = http();

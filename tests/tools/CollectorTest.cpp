@@ -3,7 +3,6 @@
 #include <gmock/gmock.h>
 
 #include <filesystem>
-#include <future>
 #include <vector>
 
 #include "platform/PropertyList.h"
@@ -178,33 +177,6 @@ TEST_F(CollectorTest, KeepsUploadsAndLogData) {
   EXPECT_EQ(at(at(at(logData, "logdata"), 0), "archive"), (Dictionary{{"root", Array{"one", 2}}}));
 }
 
-TEST_F(CollectorTest, ServesManyConnectionsAtOnceAndManyPostsOnEach) {
-  constexpr int kClients = 40;
-  constexpr int kPosts = 25;
-  std::vector<std::future<int>> clients;
-  for (int i = 0; i < kClients; ++i) {
-    clients.push_back(std::async(std::launch::async, [this, i] {
-      auto client = http();
-      client.set_keep_alive(true);
-      int accepted = 0;
-      for (int n = 0; n < kPosts; ++n) {
-        const std::string body =
-            R"({"events":[{"client":)" + std::to_string(i) + R"(,"n":)" + std::to_string(n) + "}]}";
-        const auto answer = client.Post("/events", body, "application/json");
-        accepted += answer && answer->status == 200 ? 1 : 0;
-      }
-      return accepted;
-    }));
-  }
-  for (auto& client : clients) EXPECT_EQ(client.get(), kPosts);
-  std::vector<std::int64_t> next(kClients, 0);
-  for (const auto& event : collector->events()) {
-    auto& expected = next.at(static_cast<std::size_t>(event.event.find("client")->integerValue()));
-    EXPECT_EQ(event.event.find("n")->integerValue(), expected++);
-  }
-  EXPECT_THAT(next, testing::Each(kPosts));
-}
-
 TEST_F(CollectorTest, KeepsItsIdentityAndItsRecordsAcrossStarts) {
   ASSERT_TRUE(post("/events", R"({"events":[{"n":1}]})"));
   const auto key = http().Get("/publicKey.der")->body;
@@ -219,33 +191,6 @@ TEST_F(CollectorTest, KeepsItsIdentityAndItsRecordsAcrossStarts) {
   EXPECT_GT(collector->requests()[1].exchange, exchange);
   EXPECT_EQ(std::filesystem::status(directory / "ca-key.pem").permissions(),
             std::filesystem::perms::owner_read | std::filesystem::perms::owner_write);
-}
-
-TEST_F(CollectorTest, ShowsEachFlawOfItsCertificateAndNoOther) {
-  // What a verifying client sees; the unflawed one is used by the tests above.
-  for (const auto flaw : {CertificateFlaw::wrongHost, CertificateFlaw::expired, CertificateFlaw::selfSigned}) {
-    CollectorOptions options;
-    options.certificateFlaw = flaw;
-    start(std::move(options));
-    const auto client = https();
-    const auto answer = client->Post("/events", R"({"events":[]})", "application/json");
-    EXPECT_FALSE(answer);
-    const long verified = client->get_openssl_verify_result();
-    switch (flaw) {
-      case CertificateFlaw::expired:
-        EXPECT_EQ(verified, X509_V_ERR_CERT_HAS_EXPIRED);
-        break;
-      case CertificateFlaw::selfSigned:
-        EXPECT_EQ(verified, X509_V_ERR_DEPTH_ZERO_SELF_SIGNED_CERT);
-        break;
-      default:
-        EXPECT_EQ(verified, X509_V_OK) << "the chain is fine, the name is not";
-    }
-    EXPECT_TRUE(collector->requests().empty());
-    client->enable_server_certificate_verification(false);
-    EXPECT_TRUE(client->Post("/events", R"({"events":[]})", "application/json"));
-    collector->clear();
-  }
 }
 
 TEST_F(CollectorTest, SaysWhyItCannotStart) {

@@ -155,16 +155,5 @@ TEST_F(DashboardServerTest, LosesAShareAndCanBeSwitchedOff) {
   EXPECT_EQ(collector->datagrams().back().acknowledgements, 0);
 }
 
-TEST_F(DashboardServerTest, DelaysAcknowledgements) {
-  AcknowledgementSettings settings;
-  settings.delay = std::chrono::milliseconds(200);
-  collector->setAcknowledgements(settings);
-  const auto before = std::chrono::steady_clock::now();
-  send(datagram(1));
-  ASSERT_TRUE(collector->waitForDatagrams(1, kPatience));
-  EXPECT_EQ(receive().bytes.size(), 64U);
-  EXPECT_GE(std::chrono::steady_clock::now() - before, settings.delay);
-}
-
 }  // namespace
 }  // namespace orvanta::collector

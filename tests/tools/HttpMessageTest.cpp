@@ -71,16 +71,5 @@ TEST(HttpMessageTest, WritesAndReadsDates) {
   }
 }
 
-TEST(HttpMessageTest, TellsOwnRequestsFromReceivedOnes) {
-  EXPECT_TRUE(isOwnRequest("GET", "/requests"));
-  EXPECT_TRUE(isOwnRequest("GET", "/events"));
-  EXPECT_TRUE(isOwnRequest("POST", "/control/paths"));
-  EXPECT_TRUE(isOwnRequest("DELETE", "/requests"));
-  EXPECT_FALSE(isOwnRequest("POST", "/events"));
-  EXPECT_FALSE(isOwnRequest("GET", "/storebags/x"));
-  EXPECT_FALSE(isOwnRequest("GET", "/eventsmore"));
-  EXPECT_FALSE(isOwnRequest("DELETE", "/events"));
-}
-
 }  // namespace
 }  // namespace orvanta::collector

@@ -2,8 +2,6 @@
 
 #include <gmock/gmock.h>
 
-#include <future>
-
 #include "platform/Json.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -34,21 +32,6 @@ class InboxTest : public testing::Test {
   test::TemporaryDirectory _directory;
 };
 
-TEST_F(InboxTest, GivesBackWhatItWasGiven) {
-  const auto inbox = open();
-  ReceivedRequest request = post(5, 10);
-  inbox->add(request);
-  EXPECT_EQ(request.id, 1);
-  const auto stored = inbox->requestOfExchange(5);
-  ASSERT_TRUE(stored);
-  EXPECT_EQ(stored->headers, request.headers);
-  EXPECT_EQ(stored->rawBody, request.rawBody);
-  EXPECT_EQ(stored->body, "decoded");
-  EXPECT_FALSE(inbox->request(2));
-  EXPECT_EQ(inbox->nextExchange(), 1);
-  EXPECT_EQ(open()->nextExchange(), 6);
-}
-
 TEST_F(InboxTest, ForgetsTheOldestBeyondItsLimits) {
   InboxLimits limits;
   limits.maximumRequests = 20;
@@ -72,23 +55,6 @@ TEST_F(InboxTest, ForgetsTheOldestBeyondItsLimits) {
     ASSERT_LE(byBytes->counts().requests, 10U);
   }
   EXPECT_EQ(byBytes->requests().back().exchange, 50);
-}
-
-TEST_F(InboxTest, WakesWhoWaits) {
-  const auto inbox = open();
-  EXPECT_FALSE(inbox->waitForCounts({1, 0, 0}, std::chrono::milliseconds(1)));
-  auto counted = std::async(std::launch::async, [&] {
-    return inbox->waitForCounts({3, 3, 0}, std::chrono::seconds(30));
-  });
-  auto found = std::async(std::launch::async, [&] {
-    return inbox->waitUntil([&] { return inbox->requestOfExchange(3).has_value(); }, std::chrono::seconds(30));
-  });
-  for (int i = 1; i <= 3; ++i) {
-    ReceivedRequest request = post(i, 1);
-    inbox->add(request);
-  }
-  EXPECT_TRUE(counted.get());
-  EXPECT_TRUE(found.get());
 }
 
 TEST_F(InboxTest, SaysWhyItCannotOpen) {

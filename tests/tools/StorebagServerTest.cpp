@@ -8,7 +8,6 @@
 #include "platform/Digest.h"
 #include "platform/PropertyList.h"
 #include "tests/tools/CollectorFixture.h"
-#include "tools/collector/HttpMessage.h"
 
 namespace orvanta::collector {
 namespace {
@@ -124,17 +123,6 @@ TEST_F(StorebagServerTest, SaysWhatIsWrongWithABag) {
     EXPECT_THAT(answer->body, testing::HasSubstr(std::string(name) + ".json")) << name;
   }
   for (const char* name : {"..%2Fx", ".hidden", "a%20b", "a%00b"}) EXPECT_EQ(get(name)->status, 404) << name;
-}
-
-TEST_F(StorebagServerTest, LeavesOutHeadersAsAsked) {
-  StorebagSettings settings;
-  settings.maxAge = std::nullopt;
-  settings.lastModified = false;
-  collector->setStorebagSettings(settings);
-  const auto answer = get("x");
-  EXPECT_FALSE(answer->has_header("Cache-Control"));
-  EXPECT_FALSE(answer->has_header("Last-Modified"));
-  EXPECT_EQ(get("x", {{"If-Modified-Since", httpDate(4'000'000'000)}})->status, 200);
 }
 
 }  // namespace

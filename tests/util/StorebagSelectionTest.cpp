@@ -124,19 +124,6 @@ TEST_F(StorebagSelectionTest, readsTheVersion) {
   }
 }
 
-TEST_F(StorebagSelectionTest, fetchesUnderTheClientTypesName) {
-  const std::pair<std::int32_t, const char*> rows[] = {{5, "/quillon?"},  {7, "/confluo?"},  {11, "/confluo?"},
-                                                       {13, "/confluo?"}, {15, "/brindle?"}, {18, "/parrowick?"}};
-  for (const auto& [clientType, path] : rows) {
-    platform.http.clear();
-    serve(signer.document(Dictionary{{"release", section("release")}}));
-    EXPECT_TRUE(select(clientType));
-    const auto requests = platform.http.requests();
-    ASSERT_EQ(requests.size(), 1);
-    EXPECT_THAT(requests[0].url, HasSubstr(path));
-  }
-}
-
 TEST_F(StorebagSelectionTest, refusesTypesWithoutAStorebagBeforeAnyRequest) {
   for (const std::int32_t clientType : {0, 1, 4, 19, -1}) {
     log.clear();
@@ -147,22 +134,6 @@ TEST_F(StorebagSelectionTest, refusesTypesWithoutAStorebagBeforeAnyRequest) {
                                      std::to_string(clientType)));
   }
   EXPECT_TRUE(platform.http.requests().empty());
-}
-
-TEST_F(StorebagSelectionTest, withoutAServerConferencingClientsRunOnTheFallback) {
-  failTransport("unreachable");
-  for (const std::int32_t clientType : {7, 11, 13}) {
-    fetch = {};
-    const auto chosen = select(clientType);
-    ASSERT_TRUE(chosen);
-    const Dictionary expected{{"brisk", Dictionary{{"active", true}}}};
-    EXPECT_EQ(*chosen, expected);
-    EXPECT_EQ(fetch.maxAge, 3600);
-    EXPECT_EQ(fetch.version, "1.0.0-Confluo-Fallback");
-  }
-  log.clear();
-  EXPECT_FALSE(select(5));
-  EXPECT_TRUE(log.contains("<3>fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type 5"));
 }
 
 TEST_F(StorebagSelectionTest, anUnchangedBagIsNoFailure) {

@@ -46,31 +46,6 @@ TEST_F(StorebagVerificationTest, refusesAnyChangedBit) {
   }
 }
 
-TEST_F(StorebagVerificationTest, refusesOtherSignatures) {
-  Bytes longer = signature;
-  longer.push_back(0);
-  Bytes leadingZero = signature;
-  leadingZero.insert(leadingZero.begin(), 0);
-  const struct {
-    const char* what;
-    Bytes signature;
-  } rows[] = {
-      {"empty", {}},
-      {"cut", {signature.begin(), signature.end() - 1}},
-      {"one byte more", longer},
-      {"a zero in front", leadingZero},
-      {"all zeros", Bytes(signature.size(), 0)},
-      {"all ones", Bytes(signature.size(), 0xff)},
-      {"SHA-256", signer.sign(bag, test::SigningDigest::sha256)},
-      {"of another bag", signer.sign(plistBytes(Dictionary{{"version", "7.2"}}, PlistForm::binary))},
-      {"by another key", test::StorebagSigner("stranger").sign(bag)},
-  };
-  for (const auto& row : rows) {
-    EXPECT_FALSE(open(outerDocument(row.signature, bag))) << row.what;
-    EXPECT_EQ(log.count(kNotVerified), 1) << row.what;
-  }
-}
-
 TEST_F(StorebagVerificationTest, refusesDocumentsWithoutWhatItNeeds) {
   const std::string signatureText = platform::encodeBase64(signature);
   const std::string bagText = platform::encodeBase64(bag);
