@@ -8,7 +8,7 @@
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/JsonLinesPowerLog.h"
-#include "platform/Sandbox.h"
+#include "platform/LibraryPowerLog.h"
 
 namespace orvanta {
 
@@ -31,8 +31,11 @@ std::unique_ptr<platform::Platform> makeDaemonPlatform(platform::FileLocations f
   platform::HttpClientOptions options;
   options.caFile = files.caFile;
   parts.http = platform::makeCurlHttpClient(*parts.pool, options);
-  parts.powerLog =
-      std::make_unique<platform::JsonLinesPowerLog>(files.stateDirectory + "/powerlog.jsonl", *parts.clock);
+  parts.powerLog = platform::LibraryPowerLog::load();
+  if (!parts.powerLog) {
+    parts.powerLog =
+        std::make_unique<platform::JsonLinesPowerLog>(files.stateDirectory + "/powerlog.jsonl", *parts.clock);
+  }
   parts.files = std::move(files);
   return std::make_unique<platform::Platform>(std::move(parts));
 }
@@ -53,20 +56,20 @@ std::map<std::string, std::string> sandboxVariables(const platform::FileLocation
           {"ORVANTA_CA_DIRECTORY", caDirectory}};
 }
 
-bool enterDaemonSandbox(const platform::FileLocations& files) {
+std::unique_ptr<platform::Sandbox> enterDaemonSandbox(const platform::FileLocations& files) {
   const char* setting = std::getenv("ORVANTA_SANDBOX");
   if (setting != nullptr && std::string_view(setting) == "off") {
     ORVANTA_LOG(warning, "main: ORVANTA_SANDBOX is off: the daemon runs without its sandbox");
-    return true;
+    return platform::Sandbox::none();
   }
-  const auto entered = platform::enterSandbox(files.frameworkDirectory + "/sandbox", std::string(kOrvantaServiceName),
-                                              sandboxVariables(files));
+  auto entered = platform::Sandbox::enter(files.frameworkDirectory + "/sandbox", std::string(kOrvantaServiceName),
+                                          sandboxVariables(files));
   if (!entered) {
     ORVANTA_LOG(error, "main: Failed to enter sandbox {}: {}", kOrvantaServiceName, entered.error());
-    return false;
+    return nullptr;
   }
-  ORVANTA_LOG(info, "main: {}", *entered);
-  return true;
+  ORVANTA_LOG(info, "main: {}", (*entered)->description());
+  return std::move(*entered);
 }
 
 }  // namespace orvanta

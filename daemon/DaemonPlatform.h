@@ -5,6 +5,7 @@
 #include <string>
 
 #include "platform/Platform.h"
+#include "platform/Sandbox.h"
 
 namespace orvanta {
 
@@ -14,7 +15,7 @@ std::unique_ptr<platform::Platform> makeDaemonPlatform(platform::FileLocations f
 // What the sandbox profile's ${NAME} places stand for.
 std::map<std::string, std::string> sandboxVariables(const platform::FileLocations& files);
 
-// Enters the service's sandbox, or says why not and returns false. ORVANTA_SANDBOX=off stays outside, with a warning.
-bool enterDaemonSandbox(const platform::FileLocations& files);
+// Enters the service's sandbox, or says why not and returns null. ORVANTA_SANDBOX=off stays outside, with a warning.
+std::unique_ptr<platform::Sandbox> enterDaemonSandbox(const platform::FileLocations& files);
 
 }  // namespace orvanta

@@ -21,7 +21,8 @@ OrvantadAgent::OrvantadAgent(platform::Platform& platform)
 
 OrvantadAgent::OrvantadAgent(platform::Platform& platform, StorebagCache::Fetch fetch)
     : _platform(platform),
-      _entitlements(platform.files().configurationDirectory + "/entitlements.d"),
+      _entitlements(platform::Entitlements::of(platform)),
+      _status(platform.pool()),
       _storebags(platform.clock(), std::move(fetch)) {}
 
 bool OrvantadAgent::listenerShouldAcceptNewConnection(platform::OfferedConnection&& offered) {
@@ -42,6 +43,7 @@ bool OrvantadAgent::listenerShouldAcceptNewConnection(platform::OfferedConnectio
     if (!_ending) {
       if (_sessionList.empty()) _platform.keepAlive().begin();
       _sessionList.push_back({session, handler});
+      _status.changed(_sessionList.size());
       ++_unended;
       admitted = true;
     }
@@ -63,6 +65,7 @@ void OrvantadAgent::invalidated(const std::shared_ptr<OrvantadSession>& session)
     if (found != _sessionList.end()) {
       removed = std::move(*found);
       _sessionList.erase(found);
+      _status.changed(_sessionList.size());
       if (_sessionList.empty()) _platform.keepAlive().end();
     }
   }

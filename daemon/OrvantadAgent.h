@@ -5,6 +5,7 @@
 #include <mutex>
 #include <vector>
 
+#include "daemon/SessionCountStatus.h"
 #include "daemon/SessionRegistry.h"
 #include "daemon/StorebagCache.h"
 #include "platform/Entitlements.h"
@@ -60,7 +61,8 @@ class OrvantadAgent final : public OrvantadSessionDelegate {
   void releaseMemoryWhenIdle();  // with _sessionListLock held
 
   platform::Platform& _platform;
-  const platform::Entitlements _entitlements;
+  platform::Entitlements& _entitlements;
+  SessionCountStatus _status;
 
   mutable std::mutex _sessionListLock;
   std::vector<Entry> _sessionList;  // guarded by _sessionListLock; in order of admission

@@ -1,13 +1,17 @@
 #include <chrono>
+#include <utility>
 
 #include "daemon/DaemonPlatform.h"
 #include "daemon/OrvantadAgent.h"
+#include "daemon/StartupChecks.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/KeepAlive.h"
 #include "platform/Listener.h"
 #include "platform/MemoryUse.h"
 #include "platform/Process.h"
+#include "platform/Sandbox.h"
+#include "platform/ServiceSocket.h"
 
 int main() {
   using namespace orvanta;
@@ -17,21 +21,28 @@ int main() {
   platform::tuneAllocator();
   OrvantaLogging::startLogging("orvantad", "Daemon");
   const auto files = platform::FileLocations::fromEnvironment();
-  if (!enterDaemonSandbox(files)) return -1;
+  const auto sandbox = enterDaemonSandbox(files);
+  if (!sandbox) return -1;
 
   platform::blockTerminationSignals();
-  const auto device = makeDaemonPlatform(files);
-  OrvantadAgent agent(*device);
-  auto listener = platform::Listener::create(device->pool(), files.runtimeDirectory, std::string(kOrvantaServiceName),
-                                             [&agent](platform::OfferedConnection&& offered) {
-                                               return agent.listenerShouldAcceptNewConnection(std::move(offered));
-                                             });
-  if (!listener) {
-    ORVANTA_LOG(error, "main: {}", listener.error());
+  auto socket = platform::openServiceSocket(files.runtimeDirectory, std::string(kOrvantaServiceName));
+  if (!socket) {
+    ORVANTA_LOG(error, "main: {}", socket.error());
     return 1;
   }
+  // Before the first thread, so that it holds for all: nobody listens anywhere else.
+  if (const auto started = sandbox->started(); !started) {
+    ORVANTA_LOG(error, "main: Failed to enter sandbox {}: {}", kOrvantaServiceName, started.error());
+    return -1;
+  }
+  const auto device = makeDaemonPlatform(files);
+  OrvantadAgent agent(*device);
+  auto listener = platform::Listener::create(device->pool(), std::move(*socket), [&agent](auto&& offered) {
+    return agent.listenerShouldAcceptNewConnection(std::move(offered));
+  });
+  warnOfUselessConfiguration(*device);
   device->pool().start();
-  (*listener)->resume();
+  listener->resume();
   platform::KeepAlive::ready();
   ORVANTA_LOG(info, "main: Listener resumes with sandbox, start loop.");
   platform::releaseUnusedMemory();  // what only the start needed
@@ -40,14 +51,14 @@ int main() {
 
   ORVANTA_LOG(info, "main: Ending on signal {}", signal);
   platform::KeepAlive::stopping();
-  (*listener)->stop();
+  listener->stop();
   device->http().abortBlockingRequests();
   agent.endAllSessions();
   // Datagrams and posts that the sessions' ends made are jobs by now; then they are requests in flight.
   device->pool().drain(milliseconds(2000));
   device->http().shutdown(milliseconds(5000));
   device->pool().drain(milliseconds(1000));
-  listener.value().reset();
+  listener.reset();
   device->pool().stop();
   OrvantaLogging::close();
   return 0;

@@ -7,9 +7,11 @@
 #include <initializer_list>
 #include <mutex>
 #include <string_view>
+#include <vector>
 
 #include "platform/FileStamp.h"
 #include "platform/Log.h"
+#include "platform/NearestWord.h"
 #include "platform/PropertyList.h"
 #include "platform/SystemFacts.h"
 
@@ -41,7 +43,10 @@ Dictionary understood(const Dictionary& content, const std::string& path) {
       PLATFORM_LOG(warning, "DeviceProperties: {} is not a {} in {} and does not count", key,
                    contains(kTextKeys, key) ? "string" : "boolean", path);
     } else {
-      PLATFORM_LOG(warning, "DeviceProperties: unknown key {} in {}", key, path);
+      std::vector<std::string_view> known(kTextKeys.begin(), kTextKeys.end());
+      known.insert(known.end(), kBooleanKeys.begin(), kBooleanKeys.end());
+      PLATFORM_LOG(warning, "DeviceProperties: unknown key {} in {}, did you mean {}?", key, path,
+                   nearestWord(key, known));
     }
   }
   return result;

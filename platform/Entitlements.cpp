@@ -8,11 +8,14 @@
 #include <charconv>
 #include <filesystem>
 #include <limits>
+#include <memory>
 #include <optional>
 #include <system_error>
+#include <utility>
 #include <vector>
 
 #include "platform/Log.h"
+#include "platform/NearestWord.h"
 #include "platform/PropertyList.h"
 #include "platform/WorkQueue.h"
 
@@ -69,13 +72,15 @@ Result<std::uint32_t> identityNumber(const Value& value, Result<std::uint32_t> (
 }
 
 struct Grant {
-  bool matches = false;  // the peer in question
+  bool matches = false;  // the peer in question, or anybody
   const Dictionary* entitlements = nullptr;
 };
 
-Result<Grant> readGrant(const Value& file, const PeerIdentity& peer) {
+Result<Grant> readGrant(const Value& file, const PeerIdentity* peer) {
   const Dictionary* const content = file.dictionary();
   if (content == nullptr) return Failure{"it holds no dictionary"};
+  static constexpr std::string_view kKeys[] = {"user", "group", "label", "entitlements"};
+  if (std::string unknown = describeUnknownKey(*content, kKeys); !unknown.empty()) return Failure{std::move(unknown)};
   Grant grant;
   int subjects = 0;
   for (const auto& [key, value] : *content) {
@@ -88,17 +93,15 @@ Result<Grant> readGrant(const Value& file, const PeerIdentity& peer) {
     ++subjects;
     if (key == "user") {
       number = identityNumber(value, userNumber);
-      grant.matches = number && *number == peer.uid;
+      grant.matches = number && (peer == nullptr || *number == peer->uid);
     } else if (key == "group") {
       number = identityNumber(value, groupNumber);
-      grant.matches = number && (*number == peer.gid ||
-                                 std::find(peer.groups.begin(), peer.groups.end(), *number) != peer.groups.end());
-    } else if (key == "label") {
+      grant.matches = number && (peer == nullptr || *number == peer->gid ||
+                                 std::find(peer->groups.begin(), peer->groups.end(), *number) != peer->groups.end());
+    } else {
       // An empty label would be that of every process where no security module runs.
       if (value.string() == nullptr || value.string()->empty()) return Failure{"\"label\" is no text"};
-      grant.matches = *value.string() == peer.label;
-    } else {
-      return Failure{"\"" + key + "\" means nothing here"};
+      grant.matches = peer == nullptr || *value.string() == peer->label;
     }
     if (!number) return Failure{"\"" + key + "\" is wrong: " + number.error()};
   }
@@ -124,26 +127,48 @@ std::vector<std::string> grantFiles(const std::string& directory) {
 
 }  // namespace
 
-bool Entitlements::holds(const PeerIdentity& peer, std::string_view entitlement) const {
+Entitlements& Entitlements::of(Platform& platform) {
+  return *platform.once<std::unique_ptr<Entitlements>>([&platform] {
+    return std::make_unique<Entitlements>(platform.files().configurationDirectory + "/entitlements.d");
+  });
+}
+
+bool Entitlements::holds(const PeerIdentity& peer, std::string_view entitlement) {
+  return isGranted(&peer, entitlement);
+}
+
+bool Entitlements::isHeldByAnybody(std::string_view entitlement) {
+  return isGranted(nullptr, entitlement);
+}
+
+bool Entitlements::isGranted(const PeerIdentity* peer, std::string_view entitlement) {
   PropertyListLimits limits;
   limits.maximumBytes = kMaximumFileSize;
   bool held = false;
   for (const std::string& path : grantFiles(_directory)) {
     const Result<Value> file = readPropertyListFile(path, limits);
     if (!file) {
-      PLATFORM_LOG(warning, "Entitlements: {}", file.error());
+      tell(path, file.error());
       continue;
     }
     const Result<Grant> grant = readGrant(*file, peer);
-    if (!grant) {
-      PLATFORM_LOG(warning, "Entitlements: {} grants nothing: {}", path, grant.error());
-      continue;
-    }
-    if (!grant->matches) continue;
+    tell(path, grant ? std::string() : path + " grants nothing: " + grant.error());
+    if (!grant || !grant->matches) continue;
     const Value* const value = grant->entitlements->find(entitlement);
     held = held || (value != nullptr && value->booleanReading().value_or(false));
   }
   return held;
+}
+
+// Anybody may connect as often as he likes: that must not fill the log.
+void Entitlements::tell(const std::string& path, const std::string& problem) {
+  {
+    const std::lock_guard lock(_mutex);
+    std::string& told = _problems[path];
+    if (told == problem) return;
+    told = problem;
+  }
+  if (!problem.empty()) PLATFORM_LOG(warning, "Entitlements: {}", problem);
 }
 
 }  // namespace platform

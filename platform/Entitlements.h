@@ -1,26 +1,39 @@
 #pragma once
 
+#include <map>
+#include <mutex>
 #include <string>
 #include <string_view>
 
 #include "platform/PeerIdentity.h"
+#include "platform/Platform.h"
 #include "platform/Value.h"
 
 namespace platform {
 
 // Who may do what: property lists in a directory, each granting entitlement values to a "user", a "group" (name or
 // number) or a security "label". Read anew at each question, so that a grant needs no restart. Nothing is granted by
-// default; a file that cannot be read or makes no sense grants nothing and is logged with its reason. Thread-safe:
-// holds no state but the directory's name.
+// default; a file that cannot be read or makes no sense grants nothing and is logged with its reason, once until that
+// changes. Thread-safe.
 class Entitlements {
  public:
+  // The device's, one per platform: entitlements.d of the configuration directory.
+  static Entitlements& of(Platform& platform);
   explicit Entitlements(std::string directory) : _directory(std::move(directory)) {}
 
   // True when any grant that matches the peer gives `entitlement` a value that reads as true.
-  bool holds(const PeerIdentity& peer, std::string_view entitlement) const;
+  bool holds(const PeerIdentity& peer, std::string_view entitlement);
+  // True when there is anybody at all for whom that is so.
+  bool isHeldByAnybody(std::string_view entitlement);
 
  private:
-  std::string _directory;  // constant after construction
+  // `peer` null: anybody.
+  bool isGranted(const PeerIdentity* peer, std::string_view entitlement);
+  void tell(const std::string& path, const std::string& problem);
+
+  const std::string _directory;
+  std::mutex _mutex;
+  std::map<std::string, std::string> _problems;  // guarded by _mutex: by file, what was logged last
 };
 
 }  // namespace platform

@@ -3,6 +3,7 @@
 #include <systemd/sd-daemon.h>
 
 #include <algorithm>
+#include <cstdlib>
 #include <mutex>
 #include <string>
 
@@ -20,6 +21,10 @@ struct Told {
   void tell(const char* before = "") {
     ::sd_notify(0, (before + ("STATUS=" + std::string(busy > 0 ? "busy" : "idle") + text)).c_str());
   }
+  void change() {
+    text.clear();
+    tell();
+  }
 };
 
 Told& told() {
@@ -32,13 +37,13 @@ Told& told() {
 void KeepAlive::begin() {
   ++_begun;
   const std::lock_guard lock(told().mutex);
-  if (++told().busy == 1) told().tell();
+  if (++told().busy == 1) told().change();
 }
 
 void KeepAlive::end() {
   ++_ended;
   const std::lock_guard lock(told().mutex);
-  if (told().busy > 0 && --told().busy == 0) told().tell();
+  if (told().busy > 0 && --told().busy == 0) told().change();
 }
 
 void KeepAlive::ready() {
@@ -51,6 +56,10 @@ void KeepAlive::status(std::string_view text) {
   told().text = text.empty() ? std::string() : "; " + std::string(text);
   std::replace(told().text.begin(), told().text.end(), '\n', ' ');  // a line break would begin another variable
   told().tell();
+}
+
+bool KeepAlive::isHeard() {
+  return std::getenv("NOTIFY_SOCKET") != nullptr;  // NOLINT(concurrency-mt-unsafe): nobody sets it
 }
 
 void KeepAlive::stopping() {

@@ -16,8 +16,10 @@ class KeepAlive {
   std::uint64_t ended() const { return _ended.load(); }
   // READY=1, once listening.
   static void ready();
-  // Free text behind the busy/idle mark.
+  // Free text behind the busy/idle mark; it goes with the mark's next change.
   static void status(std::string_view text);
+  // Whether there is a service manager that listens.
+  static bool isHeard();
   static void stopping();
 
  private:

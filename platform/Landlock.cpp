@@ -5,7 +5,9 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <cstddef>
 #include <iterator>
 #include <string>
 #include <system_error>
@@ -14,6 +16,16 @@
 namespace platform {
 
 namespace {
+
+// What a ruleset controls, as the newest kernels take it; installed headers may be older. Older kernels take the
+// beginning.
+struct RulesetAttributes {
+  std::uint64_t files;
+  std::uint64_t network;  // ABI 4
+  std::uint64_t scoped;   // ABI 6
+};
+constexpr std::uint64_t kBindTcp = 1U << 0U;
+constexpr std::uint64_t kScopeSignals = 1U << 1U;
 
 Failure failedStep(const char* step) {
   return Failure{std::string(step) + ": " + std::generic_category().message(errno)};
@@ -44,14 +56,23 @@ std::uint64_t landlockFileRights(std::uint64_t rights) {
          (kLandlockExecute | kLandlockWriteFile | kLandlockReadFile | kLandlockTruncate | kLandlockIoctlDevice);
 }
 
-Result<Landlock> Landlock::create() {
-  const long abi = ::syscall(SYS_landlock_create_ruleset, nullptr, 0, LANDLOCK_CREATE_RULESET_VERSION);
-  if (abi < 1) return missingLandlock();
-  // Only the first member, as the kernel of every ABI takes it; later ones would be about the network.
-  const std::uint64_t handled = landlockRightsOfAbi(static_cast<int>(abi));
-  const long fd = ::syscall(SYS_landlock_create_ruleset, &handled, sizeof handled, 0);
+Result<Landlock> Landlock::create(int highestAbi) {
+  const long kernelAbi = ::syscall(SYS_landlock_create_ruleset, nullptr, 0, LANDLOCK_CREATE_RULESET_VERSION);
+  if (kernelAbi < 1) return missingLandlock();
+  const int abi = static_cast<int>(std::min<long>(kernelAbi, highestAbi));
+  RulesetAttributes attributes{landlockRightsOfAbi(abi), 0, 0};
+  std::size_t size = offsetof(RulesetAttributes, network);
+  if (abi >= 4) {
+    attributes.network = kBindTcp;
+    size = offsetof(RulesetAttributes, scoped);
+  }
+  if (abi >= 6) {
+    attributes.scoped = kScopeSignals;
+    size = sizeof attributes;
+  }
+  const long fd = ::syscall(SYS_landlock_create_ruleset, &attributes, size, 0);
   if (fd < 0) return failedStep("landlock_create_ruleset");
-  return Landlock(static_cast<int>(abi), UniqueFd(static_cast<int>(fd)));
+  return Landlock(abi, UniqueFd(static_cast<int>(fd)));
 }
 
 Result<bool> Landlock::allow(const UniqueFd& target, std::uint64_t rights) {

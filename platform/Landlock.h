@@ -28,7 +28,7 @@ enum LandlockRight : std::uint64_t {
   kLandlockIoctlDevice = 1U << 15U,  // ABI 5
 };
 
-// The rights that a kernel of that Landlock ABI controls; all of them are denied but where a rule grants them.
+// The file rights that a kernel of that Landlock ABI controls; all of them are denied but where a rule grants them.
 std::uint64_t landlockRightsOfAbi(int abi);
 // Those among `rights` that a rule for something else than a directory may name.
 std::uint64_t landlockFileRights(std::uint64_t rights);
@@ -36,11 +36,14 @@ std::uint64_t landlockFileRights(std::uint64_t rights);
 // A set of rules on its way to becoming the thread's confinement. Used by one thread. What has failed has had no
 // effect.
 //
-// Network ports, abstract sockets and signals are left alone: the daemon talks to servers that its configuration names.
+// Beside files it forbids, where the kernel can, to bind TCP ports (ABI 4) and to signal processes outside (ABI 6).
+// Connecting is left alone: the daemon talks to servers that its configuration names, and a service manager may listen
+// at an abstract socket.
 class Landlock {
  public:
-  // Fails where the kernel has no Landlock, with a text that says what to do.
-  static Result<Landlock> create();
+  static constexpr int kAnyAbi = 1 << 30;
+  // Uses no more than ABI `highestAbi`. Fails where the kernel has no Landlock, with a text that says what to do.
+  static Result<Landlock> create(int highestAbi = kAnyAbi);
 
   int abi() const { return _abi; }
   // Grants `rights` to `target`, and to everything beneath a directory, as far as the kernel's ABI knows them.

@@ -11,8 +11,11 @@ Result<std::unique_ptr<Listener>> Listener::create(WorkPool& pool, const std::st
                                                    const std::string& service, Handler handler) {
   auto socket = openServiceSocket(directory, service);
   if (!socket) return Failure{socket.error()};
-  return std::unique_ptr<Listener>(
-      std::make_unique<ServiceListener>(pool, std::move(*socket), std::move(handler), kMaximumConnectionsPerUser));
+  return create(pool, std::move(*socket), std::move(handler));
+}
+
+std::unique_ptr<Listener> Listener::create(WorkPool& pool, ServiceSocket socket, Handler handler) {
+  return std::make_unique<ServiceListener>(pool, std::move(socket), std::move(handler), kMaximumConnectionsPerUser);
 }
 
 }  // namespace platform

@@ -7,6 +7,7 @@
 #include "platform/Connection.h"
 #include "platform/PeerIdentity.h"
 #include "platform/Result.h"
+#include "platform/ServiceSocket.h"
 #include "platform/WorkQueue.h"
 
 namespace platform {
@@ -31,6 +32,8 @@ class Listener {
   // are closed at once, with a log line.
   static Result<std::unique_ptr<Listener>> create(WorkPool& pool, const std::string& directory,
                                                   const std::string& service, Handler handler);
+  // On a socket that was made before, so that its making can come first of all.
+  static std::unique_ptr<Listener> create(WorkPool& pool, ServiceSocket socket, Handler handler);
   virtual ~Listener() = default;
   virtual void resume() = 0;
   // No handler runs after this returns, unless called from one. The socket file that create() made is removed.

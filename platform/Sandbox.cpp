@@ -7,10 +7,12 @@
 #include <cerrno>
 #include <filesystem>
 #include <optional>
+#include <set>
 #include <system_error>
 #include <utility>
 #include <vector>
 
+#include "platform/CallFilter.h"
 #include "platform/Landlock.h"
 #include "platform/PropertyList.h"
 #include "platform/SandboxProfile.h"
@@ -83,34 +85,54 @@ class FileRules {
   std::vector<std::string> _skipped;
 };
 
+std::size_t callsAllowed(const SandboxCalls& calls) {
+  std::set<int> allowed(calls.allow.begin(), calls.allow.end());
+  for (const auto& limit : calls.allowWith) allowed.insert(limit.call);
+  return allowed.size();
+}
+
 }  // namespace
 
-Result<std::string> enterSandbox(const std::string& directory, const std::string& name,
-                                 const std::map<std::string, std::string>& variables) {
+Result<std::unique_ptr<Sandbox>> Sandbox::enter(const std::string& directory, const std::string& name,
+                                                const std::map<std::string, std::string>& variables) {
   const std::string path = directory + "/" + name + ".plist";
   const auto document = readPropertyListFile(path);
   if (!document) return Failure{fmt::format("sandbox profile {}: {}", name, document.error())};
-  const auto profile = SandboxProfile::fromPropertyList(*document);
+  auto profile = SandboxProfile::fromPropertyList(*document);
   if (!profile) return Failure{fmt::format("sandbox profile {}: {}", path, profile.error())};
+  const auto failed = [&name](const std::string& step) {
+    return Failure{fmt::format("sandbox profile {}: {}", name, step)};
+  };
 
-  if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) {
-    return Failure{fmt::format("sandbox profile {}: no-new-privileges: {}", name, describeErrno())};
-  }
-  auto landlock = Landlock::create();
-  if (!landlock) return Failure{fmt::format("sandbox profile {}: {}", name, landlock.error())};
+  if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) return failed("no-new-privileges: " + describeErrno());
+  auto landlock = Landlock::create(profile->landlockAbi);
+  if (!landlock) return failed(landlock.error());
   FileRules rules(*landlock, variables);
   for (const SandboxProfile::FileRule& rule : profile->files) {
-    if (auto added = rules.add(rule); !added) {
-      return Failure{fmt::format("sandbox profile {}: {}", name, added.error())};
-    }
+    if (auto added = rules.add(rule); !added) return failed(added.error());
   }
-  if (auto restricted = landlock->restrictSelf(); !restricted) {
-    return Failure{fmt::format("sandbox profile {}: {}", name, restricted.error())};
+  if (auto restricted = landlock->restrictSelf(); !restricted) return failed(restricted.error());
+  // Last: it leaves out the calls that all this has taken.
+  auto refused = RefusedCalls::enter(profile->calls);
+  if (!refused) return failed(refused.error());
+
+  auto sandbox = none();
+  sandbox->_description = fmt::format("sandbox profile {}: {} file rules, Landlock ABI {}, {} system calls", name,
+                                      rules.added(), landlock->abi(), callsAllowed(profile->calls));
+  if (!rules.skipped().empty()) {
+    sandbox->_description += fmt::format(", not present: {}", fmt::join(rules.skipped(), " "));
   }
-  std::string text =
-      fmt::format("sandbox profile {}: {} file rules, Landlock ABI {}", name, rules.added(), landlock->abi());
-  if (!rules.skipped().empty()) text += fmt::format(", not present: {}", fmt::join(rules.skipped(), " "));
-  return text;
+  sandbox->_calls = std::move(profile->calls);
+  sandbox->_refused = std::move(*refused);
+  return sandbox;
+}
+
+std::unique_ptr<Sandbox> Sandbox::none() {
+  return std::unique_ptr<Sandbox>(new Sandbox());  // NOLINT(modernize-make-unique): the constructor is private
+}
+
+Result<bool> Sandbox::started() {
+  return refuseStartCalls(_calls);
 }
 
 }  // namespace platform

@@ -1,19 +1,40 @@
 #pragma once
 
 #include <map>
+#include <memory>
 #include <string>
+#include <utility>
 
+#include "platform/RefusedCalls.h"
 #include "platform/Result.h"
+#include "platform/SandboxCalls.h"
 
 namespace platform {
 
-// Confines the calling process by a named profile: the property list `directory`/`name`.plist. Its format is described
-// in docs/operation.md. `variables` fill the ${NAME} places of the profile's paths.
-//
-// Must be called while the process has one thread: what is entered holds for that thread and all that it starts later.
-// A failure says which step failed and why; the process may then be partly confined and should end. On success returns
-// a text for the log: what was entered, and the kernel's Landlock ABI.
-Result<std::string> enterSandbox(const std::string& directory, const std::string& name,
-                                 const std::map<std::string, std::string>& variables);
+// The process's confinement by a named profile, the property list `directory`/`name`.plist whose format
+// docs/operation.md describes. Owned by main, on whose thread everything here is called. Its end takes nothing back.
+class Sandbox {
+ public:
+  // Confines the process, which must have one thread: what is entered holds for that thread and all that it starts
+  // later. `variables` fill the ${NAME} places of the profile's paths. A failure says which step failed and why; the
+  // process may then be partly confined and should end.
+  static Result<std::unique_ptr<Sandbox>> enter(const std::string& directory, const std::string& name,
+                                                const std::map<std::string, std::string>& variables);
+  // No confinement at all.
+  static std::unique_ptr<Sandbox> none();
+
+  // For the log: what was entered, and the kernel's Landlock ABI.
+  const std::string& description() const { return _description; }
+  // The process has made what only its start makes, and has still no threads of its own: takes back what the profile
+  // allows only until then.
+  Result<bool> started();
+
+ private:
+  Sandbox() = default;
+
+  std::string _description;
+  SandboxCalls _calls;
+  std::unique_ptr<RefusedCalls> _refused;
+};
 
 }  // namespace platform

@@ -3,12 +3,10 @@
 #include <fmt/format.h>
 
 #include <algorithm>
-#include <initializer_list>
-#include <numeric>
-#include <span>
 #include <utility>
 
 #include "platform/Landlock.h"
+#include "platform/NearestWord.h"
 
 namespace platform {
 
@@ -29,40 +27,6 @@ constexpr AccessWord kAccessWords[] = {
     {"socket", kLandlockMakeSocket},
     {"execute", kLandlockExecute},
 };
-
-std::size_t editDistance(std::string_view a, std::string_view b) {
-  std::vector<std::size_t> row(b.size() + 1);
-  std::iota(row.begin(), row.end(), std::size_t{0});
-  for (std::size_t i = 0; i < a.size(); ++i) {
-    std::size_t diagonal = std::exchange(row[0], i + 1);
-    for (std::size_t j = 0; j < b.size(); ++j) {
-      const std::size_t replaced = diagonal + (a[i] == b[j] ? 0 : 1);
-      diagonal = row[j + 1];
-      row[j + 1] = std::min({replaced, row[j] + 1, diagonal + 1});
-    }
-  }
-  return row.back();
-}
-
-constexpr std::size_t kLongestWord = 64;  // longer ones resemble nothing
-
-std::string nearest(std::string_view word, std::span<const std::string_view> known) {
-  word = word.substr(0, kLongestWord);
-  return std::string(*std::min_element(known.begin(), known.end(), [&](std::string_view a, std::string_view b) {
-    return editDistance(word, a) < editDistance(word, b);
-  }));
-}
-
-// The failure for the first key that is not among `known`.
-std::optional<Failure> findUnknownKey(const Dictionary& dictionary, const std::string& place,
-                                      std::initializer_list<std::string_view> known) {
-  for (const auto& [key, value] : dictionary) {
-    if (std::find(known.begin(), known.end(), key) != known.end()) continue;
-    return Failure{fmt::format("{}: unknown key \"{}\", did you mean \"{}\"?", place, key,
-                               nearest(key, {known.begin(), known.size()}))};
-  }
-  return std::nullopt;
-}
 
 // Absolute, or beginning with a place; every place is closed.
 bool isWellFormedPath(std::string_view path) {
@@ -102,7 +66,8 @@ Result<std::uint64_t> readAccess(const Dictionary& entry, const std::string& pla
     if (found == std::end(kAccessWords)) {
       std::vector<std::string_view> words;
       for (const AccessWord& known : kAccessWords) words.push_back(known.word);
-      return Failure{fmt::format("{}: unknown access \"{}\", did you mean \"{}\"?", place, word, nearest(word, words))};
+      return Failure{
+          fmt::format("{}: unknown access \"{}\", did you mean \"{}\"?", place, word, nearestWord(word, words))};
     }
     rights |= found->rights;
   }
@@ -112,7 +77,10 @@ Result<std::uint64_t> readAccess(const Dictionary& entry, const std::string& pla
 Result<SandboxProfile::FileRule> readFileRule(const Value& value, const std::string& place) {
   const Dictionary* entry = value.dictionary();
   if (entry == nullptr) return Failure{place + " must be a dictionary"};
-  if (auto unknown = findUnknownKey(*entry, place, {"paths", "directoriesOf", "access", "optional"})) return *unknown;
+  static constexpr std::string_view kKeys[] = {"paths", "directoriesOf", "access", "optional"};
+  if (const std::string unknown = describeUnknownKey(*entry, kKeys); !unknown.empty()) {
+    return Failure{place + ": " + unknown};
+  }
   SandboxProfile::FileRule rule;
   auto paths = readPaths(*entry, place, "paths");
   if (!paths) return Failure{paths.error()};
@@ -138,7 +106,10 @@ Result<SandboxProfile::FileRule> readFileRule(const Value& value, const std::str
 Result<SandboxProfile> SandboxProfile::fromPropertyList(const Value& document) {
   const Dictionary* content = document.dictionary();
   if (content == nullptr) return Failure{"a profile must be a dictionary"};
-  if (auto unknown = findUnknownKey(*content, "the profile", {"version", "files"})) return *unknown;
+  static constexpr std::string_view kKeys[] = {"version", "files", "calls", "landlockABI"};
+  if (const std::string unknown = describeUnknownKey(*content, kKeys); !unknown.empty()) {
+    return Failure{"the profile: " + unknown};
+  }
   const Value* version = content->find("version");
   if (version == nullptr || !version->isInteger() || version->integerValue() != kFormatVersion) {
     return Failure{fmt::format("\"version\" must be {}", kFormatVersion)};
@@ -150,6 +121,17 @@ Result<SandboxProfile> SandboxProfile::fromPropertyList(const Value& document) {
     auto rule = readFileRule((*files->array())[index], fmt::format("files[{}]", index));
     if (!rule) return Failure{rule.error()};
     profile.files.push_back(std::move(*rule));
+  }
+  const Value* calls = content->find("calls");
+  if (calls == nullptr) return Failure{"\"calls\" is missing"};
+  auto read = SandboxCalls::fromPropertyList(*calls);
+  if (!read) return Failure{read.error()};
+  profile.calls = std::move(*read);
+  if (const Value* abi = content->find("landlockABI")) {
+    if (!abi->isInteger() || abi->integerValue() < 1 || abi->integerValue() > Landlock::kAnyAbi) {
+      return Failure{"\"landlockABI\" must be a number from 1"};
+    }
+    profile.landlockAbi = static_cast<int>(abi->integerValue());
   }
   return profile;
 }

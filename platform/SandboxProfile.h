@@ -7,7 +7,9 @@
 #include <string_view>
 #include <vector>
 
+#include "platform/Landlock.h"
 #include "platform/Result.h"
+#include "platform/SandboxCalls.h"
 #include "platform/Value.h"
 
 namespace platform {
@@ -22,6 +24,8 @@ struct SandboxProfile {
     bool optional = false;                   // a path that does not exist, or has an empty variable, is skipped
   };
   std::vector<FileRule> files;
+  SandboxCalls calls;
+  int landlockAbi = Landlock::kAnyAbi;  // the highest to make use of
 
   // Strict: a key or word that is not known is an error, which names the place and the nearest known one.
   static Result<SandboxProfile> fromPropertyList(const Value& document);

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "interface/OrvantaLogging.h"
+#include "platform/NearestWord.h"
 #include "platform/PropertyList.h"
 #include "platform/UniqueFd.h"
 
@@ -40,6 +41,10 @@ std::string readVersion(const std::string& frameworkDirectory) {
   if (content == nullptr) {
     ORVANTA_LOG(warning, "bundleVersion: {} is no dictionary; version {} is used", path, kVersionWithoutBundle);
     return kVersionWithoutBundle;
+  }
+  static constexpr std::string_view kKeys[] = {"version"};
+  if (const std::string unknown = platform::describeUnknownKey(*content, kKeys); !unknown.empty()) {
+    ORVANTA_LOG(warning, "bundleVersion: {} in {}", unknown, path);
   }
   const platform::Value* version = content->find("version");
   if (version == nullptr) return kVersionWithoutBundle;
@@ -71,16 +76,20 @@ Orvanta::Orvanta(platform::Platform& platform)
     : _platform(platform), _version(readVersion(platform.files().frameworkDirectory)) {}
 
 std::shared_ptr<const platform::RsaPublicKey> Orvanta::publicKey() {
+  const auto key = readPublicKey();
+  if (key) return *key;
+  ORVANTA_LOG(debug, "publicKey: {}", key.error());
+  return nullptr;
+}
+
+platform::Result<std::shared_ptr<const platform::RsaPublicKey>> Orvanta::readPublicKey() {
   const std::lock_guard lock(_mutex);
   if (_key) return _key;
   const std::string path = _platform.files().frameworkDirectory + "/publicKey.der";
   const auto bytes = readKeyFile(path);
-  if (!bytes) {
-    ORVANTA_LOG(debug, "publicKey: {}", bytes.error());
-    return nullptr;
-  }
+  if (!bytes) return platform::Failure{bytes.error()};
   _key = platform::RsaPublicKey::fromDer(*bytes);
-  if (!_key) ORVANTA_LOG(debug, "publicKey: {} holds no RSA public key", path);
+  if (!_key) return platform::Failure{path + " holds no RSA public key"};
   return _key;
 }
 

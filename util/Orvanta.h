@@ -5,6 +5,7 @@
 
 #include "platform/Digest.h"
 #include "platform/Platform.h"
+#include "platform/Result.h"
 
 namespace orvanta {
 
@@ -20,6 +21,8 @@ class Orvanta {
   const std::string& bundleVersion() const { return _version; }
   // The resource publicKey.der; null when it is missing or no RSA key.
   std::shared_ptr<const platform::RsaPublicKey> publicKey();
+  // The same, with the reason.
+  platform::Result<std::shared_ptr<const platform::RsaPublicKey>> readPublicKey();
   // A random UUID's text kept in the user defaults: one for devices whose consent is respected, another for reports
   // that override it, so that the two can never be joined.
   std::string getPersistentIdentifierForDNU(bool respectConsent);

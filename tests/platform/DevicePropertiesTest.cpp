@@ -189,7 +189,9 @@ TEST_F(DevicePropertiesTest, SaysWhatItDoesNotUnderstand) {
   const auto device = make();
   configure(plist("<key>ProductVersoin</key><string>1</string><key>SerialNumber</key><integer>7</integer>"));
   EXPECT_EQ(device.serialNumber(), std::nullopt);
-  EXPECT_EQ(_log.count("<4>DeviceProperties: unknown key ProductVersoin in " + (_configuration / "device.plist")), 1U);
+  EXPECT_EQ(_log.count("<4>DeviceProperties: unknown key ProductVersoin in " + (_configuration / "device.plist") +
+                       ", did you mean ProductVersion?"),
+            1U);
   EXPECT_EQ(_log.count("<4>DeviceProperties: SerialNumber is not a string"), 1U);
   configure("garbage");
   EXPECT_EQ(device.serialNumber(), std::nullopt);

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "platform/Json.h"
+#include "platform/LibraryPowerLog.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/TestClock.h"
@@ -120,6 +121,17 @@ TEST_F(JsonLinesPowerLogTest, recordsOfSeveralThreadsStayWhole) {
     events.insert(parsed->dictionary()->find("event")->integerValue());
   }
   EXPECT_EQ(events.size(), 400);
+}
+
+TEST(LibraryPowerLog, isNoneWhereTheLibraryIsMissingOrLacksTheFunction) {
+  const orvanta::test::LogCapture captured;
+  EXPECT_FALSE(LibraryPowerLog::load("libnowhere.so.1"));
+  EXPECT_FALSE(LibraryPowerLog::load("libm.so.6"));
+  EXPECT_THAT(
+      captured.lines(),
+      ElementsAre(testing::StartsWith("<6>PowerLog(load): No platform power log, records go to a file: libnowh"),
+                  testing::AllOf(testing::StartsWith("<4>PowerLog(load): libm.so.6 is of no use"),
+                                 testing::HasSubstr("undefined symbol: VMLogRegisteredEvent"))));
 }
 
 }  // namespace

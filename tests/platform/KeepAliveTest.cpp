@@ -1,54 +1,23 @@
 #include "platform/KeepAlive.h"
 
 #include <gtest/gtest.h>
-#include <sys/socket.h>
 
-#include <array>
-#include <cstdlib>
 #include <string>
 #include <thread>
 #include <vector>
 
-#include "platform/UniqueFd.h"
-#include "platform/UnixAddress.h"
-#include "tests/support/TemporaryDirectory.h"
+#include "tests/support/ServiceManager.h"
 
 namespace orvanta::test {
 namespace {
 
 using platform::KeepAlive;
 
-// What a service manager would hear.
-class ServiceManager {
- public:
-  ServiceManager() : _socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0)) {
-    const std::string path = _directory / "notify";
-    const auto address = platform::unixAddress(path);
-    EXPECT_EQ(::bind(_socket.get(), reinterpret_cast<const sockaddr*>(&*address), sizeof *address), 0);
-    ::setenv("NOTIFY_SOCKET", path.c_str(), 1);
-  }
-  ~ServiceManager() { ::unsetenv("NOTIFY_SOCKET"); }
-  ServiceManager(const ServiceManager&) = delete;
-  ServiceManager& operator=(const ServiceManager&) = delete;
-
-  std::vector<std::string> heard() const {
-    std::vector<std::string> messages;
-    std::array<char, 1024> buffer{};
-    for (ssize_t size = 0; (size = ::recv(_socket.get(), buffer.data(), buffer.size(), 0)) > 0;) {
-      messages.emplace_back(buffer.data(), static_cast<std::size_t>(size));
-    }
-    return messages;
-  }
-
- private:
-  TemporaryDirectory _directory;
-  platform::UniqueFd _socket;
-};
-
 using Messages = std::vector<std::string>;
 
 TEST(KeepAliveTest, TellsTheServiceManagerWhenItBecomesBusyAndIdle) {
   const ServiceManager manager;
+  manager.setEnvironment();
   KeepAlive keepAlive;
   KeepAlive::ready();
   EXPECT_EQ(manager.heard(), (Messages{"READY=1\nSTATUS=idle"}));
@@ -59,15 +28,15 @@ TEST(KeepAliveTest, TellsTheServiceManagerWhenItBecomesBusyAndIdle) {
   KeepAlive::status("2 sessions\nMAINPID=1");
   EXPECT_EQ(manager.heard(), (Messages{"STATUS=busy; 2 sessions MAINPID=1"}));
   keepAlive.end();
-  KeepAlive::status({});
   KeepAlive::stopping();
-  EXPECT_EQ(manager.heard(), (Messages{"STATUS=idle; 2 sessions MAINPID=1", "STATUS=idle", "STOPPING=1"}));
+  EXPECT_EQ(manager.heard(), (Messages{"STATUS=idle", "STOPPING=1"}));
   EXPECT_EQ(keepAlive.begun(), 2U);
   EXPECT_EQ(keepAlive.ended(), 2U);
 }
 
 TEST(KeepAliveTest, TheLastWordIsIdleHoweverThreadsMeet) {
   const ServiceManager manager;
+  manager.setEnvironment();
   KeepAlive keepAlive;
   Messages all;
   for (int round = 0; round < 20; ++round) {

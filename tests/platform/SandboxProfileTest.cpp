@@ -1,6 +1,8 @@
 #include "platform/SandboxProfile.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/syscall.h>
 
 #include "platform/Landlock.h"
 #include "platform/PropertyList.h"
@@ -8,8 +10,26 @@
 namespace platform {
 namespace {
 
+// The least that a profile may allow.
+Dictionary callsWith(const char* key = "refuse", Value value = Array{}) {
+  Dictionary calls{{"allow", Array{"brk", "exit", "exit_group", "futex", "madvise", "mmap", "mprotect", "munmap",
+                                   "read", "rt_sigreturn", "write"}}};
+  calls.set(key, std::move(value));
+  return calls;
+}
+
 Value profileWith(Value entry) {
-  return Dictionary{{"version", 1}, {"files", Array{std::move(entry)}}};
+  return Dictionary{{"version", 1}, {"files", Array{std::move(entry)}}, {"calls", callsWith()}};
+}
+
+Value profileWithCalls(Value calls) {
+  return Dictionary{{"version", 1}, {"files", Array{}}, {"calls", std::move(calls)}};
+}
+
+Value profileWithLimit(const char* key, Value value) {
+  Dictionary limit{{"call", "socket"}, {"argument", 0}, {"is", Array{"AF_UNIX"}}};
+  limit.set(key, std::move(value));
+  return profileWithCalls(callsWith("allowWith", Array{std::move(limit)}));
 }
 
 Dictionary entryWith(const char* key, Value value) {
@@ -24,7 +44,9 @@ TEST(SandboxProfile, readsItsRules) {
       {"files",
        Array{Dictionary{{"paths", Array{"${STATE_DIRECTORY}", "/a/${B}/c"}},
                         {"access", Array{"read", "write", "create", "remove", "socket", "execute"}}},
-             Dictionary{{"directoriesOf", Array{"/etc/resolv.conf"}}, {"access", Array{"read"}}, {"optional", true}}}}};
+             Dictionary{{"directoriesOf", Array{"/etc/resolv.conf"}}, {"access", Array{"read"}}, {"optional", true}}}},
+      {"landlockABI", 2},
+      {"calls", callsWith()}};
   const auto profile = SandboxProfile::fromPropertyList(document);
   ASSERT_TRUE(profile) << profile.error();
   ASSERT_EQ(profile->files.size(), 2);
@@ -38,10 +60,34 @@ TEST(SandboxProfile, readsItsRules) {
   EXPECT_EQ(profile->files[1].directoriesOf, std::vector<std::string>{"/etc/resolv.conf"});
   EXPECT_EQ(profile->files[1].rights, kLandlockReadFile | kLandlockReadDirectory);
   EXPECT_TRUE(profile->files[1].optional);
+  EXPECT_EQ(profile->landlockAbi, 2);
+}
+
+TEST(SandboxProfile, readsItsCalls) {
+  Dictionary section = callsWith("allowWith", Array{Dictionary{{"call", "openat"},
+                                                               {"argument", 2},
+                                                               {"bits", Array{"O_ACCMODE", "O_TRUNC"}},
+                                                               {"is", Array{"O_RDONLY", 1}}},
+                                                    Dictionary{{"call", "openat"}, {"argument", 0}, {"is", Array{7}}}});
+  section.set("untilStarted", Array{"listen", "s390_pci_mmio_read"});
+  section.set("refuse", Array{"clone3"});
+  section.set("end", Array{"ptrace", "mount"});
+  const auto calls = SandboxCalls::fromPropertyList(section);
+  ASSERT_TRUE(calls) << calls.error();
+  EXPECT_EQ(calls->allow.size(), 11);
+  EXPECT_EQ(calls->untilStarted, std::vector<int>{SYS_listen}) << "other machines' calls are left out";
+  EXPECT_EQ(calls->refuse, std::vector<int>{SYS_clone3});
+  EXPECT_EQ(calls->end, (std::vector<int>{SYS_ptrace, SYS_mount}));
+  ASSERT_EQ(calls->allowWith.size(), 2);
+  EXPECT_EQ(calls->allowWith[0].call, SYS_openat);
+  EXPECT_EQ(calls->allowWith[0].argument, 2);
+  EXPECT_EQ(calls->allowWith[0].bits, std::uint64_t{O_ACCMODE | O_TRUNC});
+  EXPECT_EQ(calls->allowWith[0].values, (std::vector<std::uint64_t>{0, 1}));
+  EXPECT_EQ(calls->allowWith[1].bits, ~std::uint64_t{0});
 }
 
 TEST(SandboxProfile, denyingEverythingIsAProfile) {
-  const auto profile = SandboxProfile::fromPropertyList(Dictionary{{"version", 1}, {"files", Array{}}});
+  const auto profile = SandboxProfile::fromPropertyList(profileWithCalls(callsWith()));
   ASSERT_TRUE(profile);
   EXPECT_TRUE(profile->files.empty());
 }
@@ -86,6 +132,29 @@ TEST(SandboxProfile, saysWhatIsWrong) {
        "files[0]: \"paths\" holds \"/a/${B\", which is no absolute path or ${NAME} path"},
       {profileWith(entryWith("directoriesOf", Array{"${}"})),
        "files[0]: \"directoriesOf\" holds \"${}\", which is no absolute path or ${NAME} path"},
+      {Dictionary{{"version", 1}, {"files", Array{}}}, "\"calls\" is missing"},
+      {Dictionary{{"version", 1}, {"files", Array{}}, {"calls", callsWith()}, {"landlockABI", 0}},
+       "\"landlockABI\" must be a number from 1"},
+      {profileWithCalls(Array{}), "\"calls\" must be a dictionary"},
+      {profileWithCalls(Dictionary{}), "calls: \"brk\" must be allowed: no program runs without it"},
+      {profileWithCalls(callsWith("alow")), "calls: unknown key \"alow\", did you mean \"allow\"?"},
+      {profileWithCalls(callsWith("end", "ptrace")), "calls: \"end\" must be a list of names"},
+      {profileWithCalls(callsWith("end", Array{101})), "calls: \"end\" holds 101, which is no name"},
+      {profileWithCalls(callsWith("end", Array{"ptrase"})),
+       "calls: \"end\": unknown system call \"ptrase\", did you mean \"ptrace\"?"},
+      {profileWithCalls(callsWith("end", Array{"mmap"})), "calls: \"end\": \"mmap\" is in \"allow\" already"},
+      {profileWithCalls(callsWith("end", Array{"mount", "mount"})), "calls: \"end\": \"mount\" is in \"end\" already"},
+      {profileWithCalls(callsWith("allowWith", Dictionary{})), "calls: \"allowWith\" must be a list"},
+      {profileWithCalls(callsWith("allowWith", Array{"socket"})), "calls: allowWith[0] must be a dictionary"},
+      {profileWithCalls(callsWith("allowWith", Array{Dictionary{}})), "calls: allowWith[0]: \"call\" is missing"},
+      {profileWithLimit("call", "soket"),
+       "calls: allowWith[0]: unknown system call \"soket\", did you mean \"socket\"?"},
+      {profileWithLimit("call", "read"), "calls: \"allow\": \"read\" is in \"allowWith\" already"},
+      {profileWithLimit("argument", 6), "calls: allowWith[0]: \"argument\" must be a number from 0 to 5"},
+      {profileWithLimit("is", Array{}), "calls: allowWith[0]: \"is\" must be a list of at least one value"},
+      {profileWithLimit("is", Array{"AF_INET7"}),
+       "calls: allowWith[0]: unknown value \"AF_INET7\", did you mean \"AF_INET\"?"},
+      {profileWithLimit("bit", Array{1}), "calls: allowWith[0]: unknown key \"bit\", did you mean \"bits\"?"},
   };
   for (const Row& row : rows) {
     const auto profile = SandboxProfile::fromPropertyList(row.document);

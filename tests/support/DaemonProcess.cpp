@@ -5,6 +5,8 @@
 #include <csignal>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
+#include <stdexcept>
 #include <thread>
 
 #include "platform/Connect.h"
@@ -15,14 +17,12 @@ namespace orvanta::test {
 namespace fs = std::filesystem;
 using platform::Dictionary;
 
-DaemonProcess::DaemonProcess(Options options) {
+DaemonProcess::DaemonProcess(Options options) : _wrapper(options.wrapper) {
   const auto plist = [this](const std::string& name, const Dictionary& content) {
     _directory.write(name, *platform::writeXmlPropertyList(content));
   };
   for (const char* name : {"run", "state", "etc", "framework", "plugins"}) fs::create_directories(_directory / name);
-  fs::create_directories(_directory / "framework/sandbox");
-  fs::copy_file(std::string(ORVANTA_SOURCE_DIR) + "/packaging/share/orvanta/sandbox/com.kovalt.orvantad.plist",
-                _directory / "framework/sandbox/com.kovalt.orvantad.plist");
+  writeSandboxProfile(options.landlockAbi);
   plist("framework/framework.plist", {{"version", options.version}});
   if (!options.publicKey.empty()) {
     _directory.write("framework/publicKey.der",
@@ -51,9 +51,23 @@ DaemonProcess::DaemonProcess(Options options) {
   for (const auto& [name, value] : options.environment) _environment[name] = value;
 }
 
+// The shipped profile, with what only this build of the daemon needs.
+void DaemonProcess::writeSandboxProfile(std::int64_t landlockAbi) {
+  const auto shipped = platform::readPropertyListFile(std::string(ORVANTA_SOURCE_DIR) +
+                                                      "/packaging/share/orvanta/sandbox/com.kovalt.orvantad.plist");
+  if (!shipped) throw std::runtime_error(shipped.error());
+  Dictionary profile = *shipped->dictionary();
+  profile.set("landlockABI", landlockAbi);
+  _directory.write("framework/sandbox/com.kovalt.orvantad.plist", *platform::writeXmlPropertyList(profile));
+}
+
 void DaemonProcess::launch() {
   ChildProcess::Options options;
   options.program = programPath("orvantad");
+  if (!_wrapper.empty()) {
+    options.arguments = {options.program};
+    options.program = _wrapper;
+  }
   options.environment = _environment;
   _process = std::make_unique<ChildProcess>(std::move(options));
 }
@@ -71,6 +85,11 @@ bool DaemonProcess::startQuietly() {
 int DaemonProcess::terminate() {
   _process->signal(SIGTERM);
   return _process->wait();
+}
+
+std::string DaemonProcess::stateFile(const std::string& name) const {
+  std::ifstream file(stateDirectory() + "/" + name);
+  return {std::istreambuf_iterator<char>(file), {}};
 }
 
 std::size_t DaemonProcess::descriptorCount() const {

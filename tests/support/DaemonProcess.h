@@ -28,6 +28,8 @@ class DaemonProcess {
     bool sandbox = true;
     std::string version = "8.0.0";
     std::string logLevel = "7";
+    std::int64_t landlockAbi = 1000;  // the highest that the sandbox makes use of
+    std::string wrapper;              // a program that runs the daemon; empty: none
     std::map<std::string, std::string> environment;
   };
 
@@ -48,6 +50,8 @@ class DaemonProcess {
   std::string runtimeDirectory() const { return _directory / "run"; }
   std::string stateDirectory() const { return _directory / "state"; }
   std::string configurationDirectory() const { return _directory / "etc"; }
+  // A file of the state directory; empty when there is none.
+  std::string stateFile(const std::string& name) const;
   std::string socketPath() const { return runtimeDirectory() + "/com.kovalt.orvantad"; }
   std::map<std::string, std::string> environment() const { return _environment; }
 
@@ -63,7 +67,9 @@ class DaemonProcess {
 
  private:
   void launch();
+  void writeSandboxProfile(std::int64_t landlockAbi);
 
+  std::string _wrapper;
   TemporaryDirectory _directory;
   std::map<std::string, std::string> _environment;
   std::unique_ptr<ChildProcess> _process;

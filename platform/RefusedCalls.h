@@ -1,0 +1,35 @@
+#pragma once
+
+#include <cstddef>
+#include <memory>
+#include <thread>
+#include <vector>
+
+#include "platform/Result.h"
+#include "platform/SandboxCalls.h"
+#include "platform/UniqueFd.h"
+
+namespace platform {
+
+// Answers the system calls that the sandbox does not allow, and logs each the first time. A thread of its own does so:
+// the kernel lets a refused call wait for it, whatever the calling thread holds or blocks, which no signal handler
+// could do. It sleeps until there is one, and is itself confined to what it needs.
+//
+// Owned by the Sandbox. With its end refused calls fail unlogged. Made and ended on the same thread.
+class RefusedCalls {
+ public:
+  // Starts the watcher, then confines the calling thread and those that it starts later by `calls`.
+  static Result<std::unique_ptr<RefusedCalls>> enter(const SandboxCalls& calls);
+  ~RefusedCalls();
+  RefusedCalls(const RefusedCalls&) = delete;
+  RefusedCalls& operator=(const RefusedCalls&) = delete;
+
+ private:
+  explicit RefusedCalls(const SandboxCalls& calls);
+
+  struct Watch;
+  std::unique_ptr<Watch> _watch;  // shared with the thread, which ends before it
+  std::thread _watcher;
+};
+
+}  // namespace platform

@@ -1,0 +1,50 @@
+// A diagnostics adaptor that tries what the daemon's sandbox forbids. An event's category is the number of the act; its
+// type is 0 for the session's own thread, 1 for a thread that the plug-in starts. What came of it is appended to
+// acts.log in the daemon's state directory.
+
+#include <cstdlib>
+#include <cstring>
+#include <fstream>
+#include <iterator>
+#include <string>
+#include <thread>
+
+#include "interface/PluginBundle.h"
+#include "tests/support/ForbiddenActs.h"
+
+namespace {
+
+using orvanta::test::kForbiddenActs;
+
+void sendMessage(void* /*instance*/, std::uint16_t method, std::uint16_t respCode, const std::uint8_t* /*payload*/,
+                 std::size_t payloadLength) {
+  if (payloadLength == 0 || method >= std::size(kForbiddenActs)) return;  // the session's own records
+  const std::string state = std::getenv("STATE_DIRECTORY");
+  const std::string readable = std::getenv("CONFIGURATION_DIRECTORY") + std::string("/device.plist");
+  std::string result;
+  const auto attempt = [&] { result = kForbiddenActs[method].attempt(readable, state + "/.."); };
+  if (respCode == 0) {
+    attempt();
+  } else {
+    std::thread(attempt).join();
+  }
+  std::ofstream(state + "/acts.log", std::ios::app) << kForbiddenActs[method].name << ": " << result << '\n';
+}
+
+void* create() {
+  static int instance;
+  return &instance;
+}
+
+OrvantaPluginOperation findOperation(const char* name) {
+  return std::strcmp(name, "sendMessageWithMethod:respCode:dict:") == 0 ? sendMessage : nullptr;
+}
+
+const OrvantaPluginClass* findClass(const char* name) {
+  static const OrvantaPluginClass adaptorClass{create, nullptr, findOperation};
+  return std::strcmp(name, "BriskAdaptor") == 0 ? &adaptorClass : nullptr;
+}
+
+}  // namespace
+
+const OrvantaPluginBundle orvantaPluginBundle{ORVANTA_PLUGIN_ABI_VERSION, findClass};

@@ -1,0 +1,106 @@
+#pragma once
+
+#include <fcntl.h>
+#include <netinet/in.h>
+#include <sys/inotify.h>
+#include <sys/mman.h>
+#include <sys/mount.h>
+#include <sys/ptrace.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdint>
+#include <cstring>
+#include <functional>
+#include <string>
+
+#include "platform/UniqueFd.h"
+#include "platform/UnixAddress.h"
+
+namespace orvanta::test {
+
+// What a system call's result comes to: "done" or errno's text.
+inline std::string outcome(bool succeeded) {
+  return succeeded ? "done" : std::string(::strerror(errno));
+}
+
+inline std::string opening(const std::string& path, int flags) {
+  const platform::UniqueFd file(::open(path.c_str(), flags | O_CLOEXEC, 0600));
+  return outcome(static_cast<bool>(file));
+}
+
+inline std::string binding(const std::string& path) {
+  const platform::UniqueFd socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  const auto address = platform::unixAddress(path);
+  return outcome(::bind(socket.get(), reinterpret_cast<const sockaddr*>(&*address), sizeof *address) == 0);
+}
+
+// What nothing in the daemon's process may do once it has started, and how that ends. Shared by the sandbox's own tests
+// and by the plug-in that tries it inside the real daemon.
+struct ForbiddenAct {
+  const char* name;
+  // `readable` is a file that may be read; `closed` a directory that may not be used at all.
+  std::string (*attempt)(const std::string& readable, const std::string& closed);
+  const char* result;  // null: the process ends
+};
+
+inline const ForbiddenAct kForbiddenActs[] = {
+    {"open a home directory", [](const auto&, const auto&) { return opening("/root", O_RDONLY | O_DIRECTORY); },
+     "Permission denied"},
+    {"write outside", [](const auto&, const auto& closed) { return opening(closed + "/new", O_WRONLY | O_CREAT); },
+     "Permission denied"},
+    {"overwrite what is for reading", [](const auto& readable, const auto&) { return opening(readable, O_WRONLY); },
+     "Permission denied"},
+    {"empty while reading", [](const auto& readable, const auto&) { return opening(readable, O_RDONLY | O_TRUNC); },
+     "Operation not permitted"},
+    {"empty by name", [](const auto& readable, const auto&) { return outcome(::truncate(readable.c_str(), 0) == 0); },
+     "Function not implemented"},
+    {"change permissions", [](const auto& readable, const auto&) { return outcome(::chmod(readable.c_str(), 0) == 0); },
+     "Operation not permitted"},
+    {"name a socket elsewhere", [](const auto&, const auto& closed) { return binding(closed + "/socket"); },
+     "Permission denied"},
+    {"listen on another socket",
+     [](const auto&, const auto&) {
+       const platform::UniqueFd socket(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+       return socket ? outcome(::listen(socket.get(), 1) == 0) : "no socket";
+     },
+     "Operation not permitted"},
+    {"open a packet socket",
+     [](const auto&, const auto&) {
+       const platform::UniqueFd socket(::socket(AF_PACKET, SOCK_RAW | SOCK_CLOEXEC, 0));
+       return outcome(static_cast<bool>(socket));
+     },
+     "Operation not permitted"},
+    {"start a process",
+     [](const auto&, const auto&) {
+       const pid_t child = ::fork();
+       if (child == 0) ::_exit(0);
+       if (child > 0) ::waitpid(child, nullptr, 0);
+       return outcome(child > 0);
+     },
+     "Operation not permitted"},
+    {"write code",
+     [](const auto&, const auto&) {
+       return outcome(::mmap(nullptr, 4096, PROT_WRITE | PROT_EXEC, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0) != MAP_FAILED);
+     },
+     "Operation not permitted"},
+    {"make a call of no use to it", [](const auto&, const auto&) { return outcome(::inotify_init1(0) >= 0); },
+     "Function not implemented"},
+    {"run a program",
+     [](const auto&, const auto&) {
+       ::execl("/bin/true", "/bin/true", nullptr);
+       return outcome(false);
+     },
+     nullptr},
+    {"trace", [](const auto&, const auto&) { return outcome(::ptrace(PTRACE_TRACEME, 0, nullptr, nullptr) == 0); },
+     nullptr},
+    {"mount",
+     [](const auto&, const auto& closed) { return outcome(::mount("none", closed.c_str(), "tmpfs", 0, nullptr) == 0); },
+     nullptr},
+};
+
+}  // namespace orvanta::test
