@@ -52,21 +52,31 @@ int add(const Filter& filter, std::span<const SandboxCalls::Limit> limits) {
   return 0;
 }
 
-}  // namespace
-
-Result<int> filterCalls(const SandboxCalls& calls) {
-  const Filter filter = makeFilter(SCMP_ACT_NOTIFY);
-  if (!filter) return failedStep("making a filter", -ENOMEM);
+// The profile's rules; those that say what `others` says anyhow are left out.
+int addRules(const Filter& filter, const SandboxCalls& calls, std::uint32_t others) {
+  constexpr std::uint32_t kRefuse = SCMP_ACT_ERRNO(ENOSYS);
   int error = add(filter, SCMP_ACT_ALLOW, calls.allow);
   if (error == 0) error = add(filter, SCMP_ACT_ALLOW, calls.untilStarted);
   if (error == 0) error = add(filter, calls.allowWith);
-  if (error == 0) error = add(filter, SCMP_ACT_ERRNO(ENOSYS), calls.refuse);
+  if (error == 0 && others != kRefuse) error = add(filter, kRefuse, calls.refuse);
   if (error == 0) error = add(filter, SCMP_ACT_KILL_PROCESS, calls.end);
-  if (error != 0) return failedStep("adding a rule", error);
-  if (error = ::seccomp_load(filter.get()); error != 0) {
-    return failedStep("the kernel does not take the filter (it needs CONFIG_SECCOMP_FILTER)", error);
+  return error;
+}
+
+}  // namespace
+
+Result<int> filterCalls(const SandboxCalls& calls) {
+  // Where somebody else watches already, as some containers do, the kernel does not take a second watcher. The library
+  // does not tell that from other failures, which the second attempt meets again.
+  int error = 0;
+  for (const std::uint32_t others : {SCMP_ACT_NOTIFY, SCMP_ACT_ERRNO(ENOSYS)}) {
+    const Filter filter = makeFilter(others);
+    if (!filter) return failedStep("making a filter", -ENOMEM);
+    if (error = addRules(filter, calls, others); error != 0) return failedStep("adding a rule", error);
+    if (error = ::seccomp_load(filter.get()); error != 0) continue;
+    return others == SCMP_ACT_NOTIFY ? ::seccomp_notify_fd(filter.get()) : -1;
   }
-  return ::seccomp_notify_fd(filter.get());
+  return failedStep("the kernel does not take the filter (it needs CONFIG_SECCOMP_FILTER)", error);
 }
 
 Result<bool> refuseStartCalls(const SandboxCalls& calls) {

@@ -11,7 +11,8 @@ namespace platform {
 // back, and needs no-new-privileges. What cannot be put in place says why.
 
 // Applies the profile's rules. Calls that are named nowhere, and limited calls with other arguments, wait for an answer
-// at the descriptor that is given back; once that is closed they fail with ENOSYS by themselves.
+// at the descriptor that is given back; once that is closed they fail with ENOSYS by themselves. -1: they do so from
+// the start, as somebody else watches this process's calls already.
 Result<int> filterCalls(const SandboxCalls& calls);
 
 // From now on the calls that were allowed until the start are not permitted (EPERM). Other threads stay as they are.

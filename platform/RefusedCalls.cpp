@@ -115,6 +115,7 @@ Result<std::unique_ptr<RefusedCalls>> RefusedCalls::enter(const SandboxCalls& ca
   const auto filtered = ready ? filterCalls(calls) : Result<int>(Failure{ready.error()});
   made->_watch->notifications.set_value(filtered ? *filtered : -1);
   if (!filtered) return Failure{filtered.error()};
+  if (*filtered < 0) PLATFORM_LOG(notice, "sandbox: Refused system calls are not logged: something else watches them");
   return made;
 }
 

@@ -23,7 +23,7 @@ class AdaptorTest : public IntegrationFixture {
     options.environment["ORVANTA_PLUGINS"] = SAMPLE_PLUGINS;
     setSection({{"brisk", Dictionary{}}, {"voltmark", Dictionary{}}});
   }
-  std::unique_ptr<OrvantaConnection> sessionOfType(std::uint32_t clientType) {
+  std::unique_ptr<OrvantaConnection> sessionOfType(std::int32_t clientType) {
     return openSession({.sessionID = 1, .clientType = clientType});
   }
   // An event with a payload, and one without.
@@ -37,7 +37,7 @@ class AdaptorTest : public IntegrationFixture {
 };
 
 TEST_F(AdaptorTest, EventsOfItsClientTypesReachTheAdaptorWithTheServerUpAndDown) {
-  for (const std::uint32_t clientType : {7, 11, 13}) {
+  for (const std::int32_t clientType : {7, 11, 13}) {
     for (const bool serverUp : {true, false}) {
       const auto url = options.storebagURL;
       if (!serverUp) options.storebagURL = "http://127.0.0.1:1/storebags";

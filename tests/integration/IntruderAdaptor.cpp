@@ -1,6 +1,6 @@
-// A diagnostics adaptor that tries what the daemon's sandbox forbids. An event's category is the number of the act; its
-// type is 0 for the session's own thread, 1 for a thread that the plug-in starts. What came of it is appended to
-// acts.log in the daemon's state directory.
+// A diagnostics adaptor that tries what the daemon's sandbox forbids. An event's category is the number of the act,
+// counted from 1; its type is 0 for the session's own thread, 1 for a thread that the plug-in starts. What came of it
+// is appended to acts.log in the daemon's state directory.
 
 #include <cstdlib>
 #include <cstring>
@@ -17,18 +17,19 @@ namespace {
 using orvanta::test::kForbiddenActs;
 
 void sendMessage(void* /*instance*/, std::uint16_t method, std::uint16_t respCode, const std::uint8_t* /*payload*/,
-                 std::size_t payloadLength) {
-  if (payloadLength == 0 || method >= std::size(kForbiddenActs)) return;  // the session's own records
+                 std::size_t /*payloadLength*/) {
+  if (method == 0 || method > std::size(kForbiddenActs)) return;  // 0: the session's own records
+  const auto& act = kForbiddenActs[method - 1];
   const std::string state = std::getenv("STATE_DIRECTORY");
   const std::string readable = std::getenv("CONFIGURATION_DIRECTORY") + std::string("/device.plist");
   std::string result;
-  const auto attempt = [&] { result = kForbiddenActs[method].attempt(readable, state + "/.."); };
+  const auto attempt = [&] { result = act.attempt(readable, state + "/.."); };
   if (respCode == 0) {
     attempt();
   } else {
     std::thread(attempt).join();
   }
-  std::ofstream(state + "/acts.log", std::ios::app) << kForbiddenActs[method].name << ": " << result << '\n';
+  std::ofstream(state + "/acts.log", std::ios::app) << act.name << ": " << result << '\n';
 }
 
 void* create() {

@@ -24,7 +24,7 @@ class SandboxTest : public IntegrationFixture {
     options.environment["ORVANTA_PLUGINS"] = INTRUDER_PLUGINS;
   }
   MessageParameters act(std::size_t number, std::uint16_t thread) {
-    return event(static_cast<std::uint16_t>(number), thread, {{"try", true}});
+    return event(static_cast<std::uint16_t>(number + 1), thread, {{"try", true}});
   }
 };
 
