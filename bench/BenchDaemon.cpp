@@ -30,4 +30,15 @@ BenchDaemon::BenchDaemon(platform::Dictionary section, bool consent, bool sandbo
   }
 }
 
+platform::Dictionary batchingSection(const PostSink& sink) {
+  using platform::Array;
+  using platform::Dictionary;
+  return {{"http_post", Dictionary{{"clients", Array{Dictionary{{"post_url", sink.url()},
+                                                                {"locale_whitelist", Array{"DE"}},
+                                                                {"filters", Array{}},
+                                                                {"sampling_threshold", 1.0},
+                                                                {"override_dnu", 1},
+                                                                {"event_threshold", 49}}}}}}};
+}
+
 }  // namespace orvanta::bench

@@ -2,6 +2,7 @@
 
 #include <memory>
 
+#include "bench/RawPeers.h"
 #include "platform/Value.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -22,5 +23,8 @@ class BenchDaemon {
   std::unique_ptr<collector::Collector> _collector;
   std::unique_ptr<test::DaemonProcess> _process;
 };
+
+// A section by which sessions post to `sink` whatever the user's consent, fifty events at a time where they ask for it.
+platform::Dictionary batchingSection(const PostSink& sink);
 
 }  // namespace orvanta::bench

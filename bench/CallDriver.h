@@ -23,6 +23,9 @@ class CallDriver {
   // Sends `burst`, which holds `window` requests, until `count` are sent, each answered by `answerSize` bytes.
   void pipeline(const std::vector<std::uint8_t>& burst, std::size_t answerSize, std::uint64_t count,
                 std::uint64_t window);
+  // The halves of it, for a driver of many connections: bursts whose answers are read later.
+  void send(const std::vector<std::uint8_t>& burst) { write(burst.data(), burst.size()); }
+  void receive(std::size_t length) { read(length); }
   // One at a time; the round trips in microseconds.
   std::vector<double> roundTrips(const std::vector<std::uint8_t>& request, std::size_t answerSize, std::uint64_t count);
 

@@ -72,13 +72,7 @@ void benchWholePath(const RawLimits& limits) {
   printHeading("Whole path: client, daemon, gzip JSON, post, local sink");
   const PostSink sink;
   // Without consent no answer carries the text of what was sent, so that every answer has one size.
-  const BenchDaemon daemon({{"http_post", Dictionary{{"clients", Array{Dictionary{{"post_url", sink.url()},
-                                                                                  {"locale_whitelist", Array{"DE"}},
-                                                                                  {"filters", Array{}},
-                                                                                  {"sampling_threshold", 1.0},
-                                                                                  {"override_dnu", 1},
-                                                                                  {"event_threshold", 49}}}}}}},
-                           false);
+  const BenchDaemon daemon(batchingSection(sink), false);
 
   for (const bool batched : {true, false}) {
     CallDriver driver(daemon.process().socketPath());

@@ -19,6 +19,8 @@ RawLimits benchStages();
 void benchCallPath();
 void benchDashboard();
 void benchWholePath(const RawLimits& limits);
+// How events per second grow with processors, and what a large group of related sessions costs each of them.
+void benchSessions();
 // CPU microseconds of the system calls that a message-log line takes at least: listing, statx, open, write, close.
 double benchMessageLog();
 

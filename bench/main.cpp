@@ -12,15 +12,17 @@
 int main(int argumentCount, char** arguments) {
   using namespace orvanta::bench;
   const std::string_view only = argumentCount > 1 ? arguments[1] : "";
-  if (!only.empty() && only != "calls" && only != "dashboard" && only != "stages" && only != "whole") {
-    fmt::print("usage: orvanta-bench [calls | dashboard | stages | whole]\n");
+  if (!only.empty() && only != "calls" && only != "dashboard" && only != "stages" && only != "whole" &&
+      only != "sessions") {
+    fmt::print("usage: orvanta-bench [calls | dashboard | sessions | stages | whole]\n");
     return 2;
   }
   std::setvbuf(stdout, nullptr, _IOLBF, 0);
   try {
     if (only.empty() || only == "calls") benchCallPath();
     if (only.empty() || only == "dashboard") benchDashboard();
-    if (only == "calls" || only == "dashboard") return 0;
+    if (only.empty() || only == "sessions") benchSessions();
+    if (only == "calls" || only == "dashboard" || only == "sessions") return 0;
     const RawLimits limits = benchStages();
     if (only != "stages") benchWholePath(limits);
   } catch (const std::exception& error) {

@@ -139,7 +139,8 @@ TEST_F(ConnectionTest, AfterAHalfCloseAnswersStillComeAndTheSessionStays) {
 }
 
 TEST_F(ConnectionTest, SIGTERMLeavesNoRequestThatWasReadWithoutAnAnswer) {
-  constexpr std::uint32_t kCalls = 200;  // more than a connection carries out in one turn
+  constexpr std::uint32_t kCalls =
+      2 * platform::Connection::kFramesPerTurn;  // more than a connection carries out in one turn
   server->setFault("/storebags/*", collector::ConnectionFault::silent);
   auto client = rawClient();
   Bytes calls =

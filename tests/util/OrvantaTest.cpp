@@ -23,7 +23,7 @@ TEST(Orvanta, readsTheBundlesVersion) {
       {"a text", plist("<dict><key>version</key><string>8.1.2</string></dict>"), "8.1.2", false},
       {"a number", plist("<dict><key>version</key><integer>9</integer></dict>"), "9", false},
       {"no file", std::nullopt, "8.0", false},
-      {"no version", plist("<dict><key>Version</key><string>9</string></dict>"), "8.0", false},
+      {"no version", plist("<dict><key>Version</key><string>9</string></dict>"), "8.0", true},
       {"another type", plist("<dict><key>version</key><array/></dict>"), "8.0", true},
       {"no dictionary", plist("<string>8.1</string>"), "8.0", true},
       {"malformed", "<plist><dict><key>version", "8.0", true},
