@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <atomic>
+#include <future>
 #include <thread>
 
 #include "platform/Connection.h"
@@ -105,7 +106,9 @@ TEST_F(OutboxTest, DropsOnlyDroppableMessagesWhole) {
   EXPECT_FALSE(made.peer.hasBytes());
   made.peer.close();
   ASSERT_TRUE(made.delegate->waitForInvalidation());
-  EXPECT_TRUE(outbox.isClosed());
+  std::promise<bool> behind;  // the job that tells the delegate closes the outbox at its end
+  made.connection->queue()->post([&] { behind.set_value(outbox.isClosed()); });
+  EXPECT_TRUE(behind.get_future().get());
 }
 
 TEST_F(OutboxTest, MessagesOfManyThreadsStayWholeAndInOrder) {
