@@ -37,9 +37,10 @@ int main() {
   }
   const auto device = makeDaemonPlatform(files);
   OrvantadAgent agent(*device);
-  auto listener = platform::Listener::create(device->pool(), std::move(*socket), [&agent](auto&& offered) {
-    return agent.listenerShouldAcceptNewConnection(std::move(offered));
-  });
+  auto listener =
+      platform::Listener::create(device->pool(), std::move(*socket), [&agent](platform::OfferedConnection&& offered) {
+        return agent.listenerShouldAcceptNewConnection(std::move(offered));
+      });
   warnOfUselessConfiguration(*device);
   device->pool().start();
   listener->resume();
