@@ -44,6 +44,7 @@ OrvantaPluginOperation findForwardingOperation(const OrvantaPluginClass& adaptor
 }  // namespace
 
 std::unique_ptr<BriskAdaptor> BriskAdaptor::create(platform::Platform& platform) {
+  const platform::BlockingScope blocking;  // what a plug-in does takes as long as it likes, here and below
   const OrvantaPluginClass* adaptorClass = findAdaptorClass(platform);
   if (adaptorClass == nullptr) return nullptr;
   void* const instance = adaptorClass->create();
@@ -62,10 +63,12 @@ BriskAdaptor::BriskAdaptor(const OrvantaPluginClass& adaptorClass, void* instanc
     : _briskAdaptorClass(adaptorClass), _briskAdaptor(instance), _forward(findForwardingOperation(adaptorClass)) {}
 
 BriskAdaptor::~BriskAdaptor() {
+  const platform::BlockingScope blocking;
   if (_briskAdaptorClass.destroy != nullptr) _briskAdaptorClass.destroy(_briskAdaptor);
 }
 
 void BriskAdaptor::sendMessage(std::uint16_t method, std::uint16_t respCode, const platform::Dictionary* payload) {
+  const platform::BlockingScope blocking;
   if (payload == nullptr) {
     _forward(_briskAdaptor, method, respCode, nullptr, 0);
     return;

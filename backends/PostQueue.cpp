@@ -2,6 +2,8 @@
 
 #include <fmt/format.h>
 
+#include <utility>
+
 #include "interface/OrvantaLogging.h"
 #include "platform/Platform.h"
 #include "util/Compression.h"
@@ -108,45 +110,75 @@ PostQueue::PostQueue(platform::Platform& platform, std::weak_ptr<OrvantaBackend>
       _pendingPosts(PendingPosts::of(platform)),
       _backend(std::move(backend)),
       _backendName(std::move(backendName)),
-      _queue(platform.pool().makeQueue()),
+      _queue(platform.pool().makeComputeQueue()),
       _lane(_http.makeLane()) {}
+
+// A post's share of what may wait, from the hand-in to its compression or until the pool drops it.
+class PostQueue::Room {
+ public:
+  Room(PostQueue& queue, std::size_t bytes) : _queue(queue.shared_from_this()), _bytes(bytes) {
+    if (takeIfFree()) return;
+    const platform::BlockingScope blocking;
+    std::unique_lock lock(_queue->_mutex);
+    _queue->_roomMade.wait(lock, [this] { return isFree(); });
+    _queue->_waitingBytes += _bytes;
+  }
+  Room(Room&& other) noexcept = default;
+  Room& operator=(Room&&) = delete;
+  ~Room() {
+    if (_queue == nullptr) return;
+    const std::lock_guard lock(_queue->_mutex);
+    _queue->_waitingBytes -= _bytes;
+    _queue->_roomMade.notify_all();
+  }
+
+ private:
+  bool takeIfFree() {
+    const std::lock_guard lock(_queue->_mutex);
+    if (!isFree()) return false;
+    _queue->_waitingBytes += _bytes;
+    return true;
+  }
+  bool isFree() const {
+    return _queue->_waitingBytes == 0 || _queue->_waitingBytes + _bytes <= kMaximumWaitingBytes;
+  }
+
+  std::shared_ptr<PostQueue> _queue;  // null once moved from
+  const std::size_t _bytes;
+};
 
 // A post that waits to be compressed.
 struct PostQueue::Job {
   std::shared_ptr<PostQueue> queue;
+  std::optional<Room> room;
   Post post;
   std::shared_ptr<Outcome> outcome;
   PendingPost pending;
 };
 
 void PostQueue::post(Post post) {
-  const std::size_t charge = post.json.size();
-  const std::size_t before = _waitingBytes.fetch_add(charge);
   auto outcome = std::make_shared<Outcome>(_backend, _backendName, std::move(post.completion));
-  if (before != 0 && before + charge > kMaximumWaitingBytes) {
-    _waitingBytes -= charge;
-    outcome->finish({std::nullopt, fmt::format("{} bytes wait to be posted already", before)});
-    return;
-  }
-  auto job =
-      std::make_unique<Job>(Job{shared_from_this(), std::move(post), std::move(outcome), PendingPost(_pendingPosts)});
+  PendingPost pending(_pendingPosts);
+  Room room(*this, post.json.size());
+  auto job = std::make_unique<Job>(
+      Job{shared_from_this(), std::move(room), std::move(post), std::move(outcome), std::move(pending)});
   _queue->post([job = std::move(job)] { job->queue->compressAndStart(*job); });
 }
 
 void PostQueue::compressAndStart(Job& job) {
-  const std::size_t charge = job.post.json.size();
+  const std::size_t size = job.post.json.size();
   platform::HttpRequest request;
   request.method = "POST";
   request.url = std::move(job.post.url);
   request.headers = std::move(job.post.headers);
   request.discardResponseBody = true;
   auto compressed = gzipDeflate(job.post.json);
-  const bool smaller = compressed && !compressed->empty() && compressed->size() < charge;
+  const bool smaller = compressed && !compressed->empty() && compressed->size() < size;
   request.body = smaller ? std::move(*compressed) : std::move(job.post.json);
   request.headers.push_back({"Content-Length", std::to_string(request.body.size())});
   if (smaller) request.headers.push_back({"Content-Encoding", "gzip"});
   std::string().swap(job.post.json);
-  _waitingBytes -= charge;
+  job.room.reset();
   _http.start(
       _lane, std::move(request),
       [outcome = job.outcome](const platform::HttpResult& result) { return outcome->observe(result); },

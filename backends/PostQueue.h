@@ -1,6 +1,5 @@
 #pragma once
 
-#include <atomic>
 #include <chrono>
 #include <condition_variable>
 #include <cstddef>
@@ -49,19 +48,21 @@ struct Post {
 // since compressing takes most of what an event costs.
 //
 // Owned by its backend and by the posts on their way, which do not need the backend: it is held weakly, to be disabled
-// when the server answers 5xx. At most 16 MiB wait to be compressed; a post beyond that fails like one that the network
-// lost. A message of any size may wait alone.
+// when the server answers 5xx. At most 16 MiB wait to be compressed: a caller with more waits in a BlockingScope until
+// there is room, so that a program that reports faster than this device compresses is slowed down and loses nothing. A
+// message of any size may wait alone.
 class PostQueue : public std::enable_shared_from_this<PostQueue> {
  public:
   PostQueue(platform::Platform& platform, std::weak_ptr<OrvantaBackend> backend, std::string backendName);
 
-  // Any thread, without locks: the completion may run at once.
+  // Any thread, without locks: it may wait, and the completion may run at once.
   void post(Post post);
 
   static constexpr std::size_t kMaximumWaitingBytes = 16U << 20U;
 
  private:
   class Outcome;
+  class Room;
   struct Job;
   void compressAndStart(Job& job);
 
@@ -70,10 +71,12 @@ class PostQueue : public std::enable_shared_from_this<PostQueue> {
   const std::shared_ptr<PendingPosts> _pendingPosts;
   const std::weak_ptr<OrvantaBackend> _backend;
   const std::string _backendName;
-  const std::shared_ptr<platform::WorkQueue> _queue;
+  const std::shared_ptr<platform::ComputeQueue> _queue;
   const std::shared_ptr<platform::HttpLane> _lane;
 
-  std::atomic<std::size_t> _waitingBytes{0};
+  std::mutex _mutex;
+  std::condition_variable _roomMade;
+  std::size_t _waitingBytes = 0;  // guarded by _mutex
 };
 
 }  // namespace orvanta

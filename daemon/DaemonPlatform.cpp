@@ -3,7 +3,6 @@
 #include <cstdlib>
 #include <filesystem>
 #include <string_view>
-#include <thread>
 
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
@@ -13,11 +12,9 @@
 namespace orvanta {
 
 namespace {
-// Jobs are short; blocked ones get a stand-in. Two threads keep one long job from holding up everybody on a small
-// device.
-std::size_t poolThreads() {
-  return std::max(2U, std::min(4U, std::thread::hardware_concurrency()));
-}
+// Jobs are short, blocked ones get a stand-in, and what computes for long has threads of its own: waking a second thread
+// would cost more than it takes off the first.
+constexpr std::size_t kPoolThreads = 1;
 }  // namespace
 
 std::unique_ptr<platform::Platform> makeDaemonPlatform(platform::FileLocations files) {
@@ -27,7 +24,7 @@ std::unique_ptr<platform::Platform> makeDaemonPlatform(platform::FileLocations f
       std::make_unique<platform::LinuxDeviceProperties>(files.configurationDirectory, std::string(kOrvantaServiceName));
   parts.defaults =
       std::make_unique<platform::UserDefaults>(files.stateDirectory, std::string(kOrvantaUserDefaultsDomain));
-  parts.pool = std::make_unique<platform::WorkPool>(poolThreads());
+  parts.pool = std::make_unique<platform::WorkPool>(kPoolThreads);
   platform::HttpClientOptions options;
   options.caFile = files.caFile;
   parts.http = platform::makeCurlHttpClient(*parts.pool, options);

@@ -87,7 +87,10 @@ void OrvantadAgent::releaseMemoryWhenIdle() {
   const auto now = std::chrono::steady_clock::now();
   if (now - _memoryReleased < kBetweenReleases) return;
   _memoryReleased = now;
-  _platform.pool().post([] { platform::releaseUnusedMemory(); });
+  _platform.pool().post([] {
+    const platform::BlockingScope blocking;
+    platform::releaseUnusedMemory();
+  });
 }
 
 void OrvantadAgent::endAllSessions() {

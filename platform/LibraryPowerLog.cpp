@@ -7,6 +7,7 @@
 
 #include "platform/Log.h"
 #include "platform/MessagePack.h"
+#include "platform/WorkQueue.h"
 
 namespace platform {
 
@@ -40,6 +41,7 @@ void LibraryPowerLog::registeredEvent(std::int32_t event, std::string_view sende
   std::vector<std::uint8_t> bytes;
   MessagePackWriter(bytes).dictionary(record);
   const VMPowerLogRecord packed{bytes.data(), bytes.size()};
+  const BlockingScope blocking;  // the library may talk to another process
   _logRegisteredEvent(event, std::string(sender).c_str(), &packed, nullptr);
 }
 

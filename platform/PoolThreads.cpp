@@ -34,8 +34,8 @@ class AllSignalsBlocked {
 
 }  // namespace
 
-PoolThreads::PoolThreads(Loop& loop, std::size_t threads, std::size_t extraThreads)
-    : _loop(loop), _wanted(std::max<std::size_t>(threads, 1)), _maximum(_wanted + extraThreads) {}
+PoolThreads::PoolThreads(Loop& loop, const char* name, std::size_t threads, std::size_t extraThreads)
+    : _loop(loop), _name(name), _wanted(std::max<std::size_t>(threads, 1)), _maximum(_wanted + extraThreads) {}
 
 PoolThreads* PoolThreads::current() {
   return tCurrent;
@@ -51,7 +51,7 @@ void PoolThreads::start() {
 void PoolThreads::launch(bool extra) {
   const AllSignalsBlocked blocked;
   _threads.emplace_back([this, extra] {
-    ::pthread_setname_np(::pthread_self(), extra ? "pool-extra" : "pool");
+    ::pthread_setname_np(::pthread_self(), _name);
     tCurrent = this;
     if (extra) {
       serveAsExtra();
@@ -63,38 +63,43 @@ void PoolThreads::launch(bool extra) {
 }
 
 void PoolThreads::serveAsExtra() {
-  auto look = std::chrono::steady_clock::now() + kLinger;
-  for (;;) {
-    // Also while there is work: more threads than processors only stand in each other's way.
-    if (_loop.runOne(kLinger) && std::chrono::steady_clock::now() < look) continue;
-    if (retireIfSuperfluous()) return;
-    look = std::chrono::steady_clock::now() + kLinger;
-  }
+  do {
+    _loop.runOne(kLinger);
+  } while (stayAside());
 }
 
 bool PoolThreads::superfluous() const {
   return _running - _blocked > _wanted;
 }
 
-bool PoolThreads::retireIfSuperfluous() {
-  std::thread earlier;
-  {
-    const std::lock_guard lock(_mutex);
-    if (_closed) return true;  // join() takes it from here
-    if (!superfluous()) return false;
-    --_running;
-    const auto self = std::find_if(_threads.begin(), _threads.end(),
-                                   [](const std::thread& t) { return t.get_id() == std::this_thread::get_id(); });
-    earlier = std::exchange(_retired, std::move(*self));
-    _threads.erase(self);
+bool PoolThreads::stayAside() {
+  std::unique_lock lock(_mutex);
+  if (_closed) return false;  // join() takes it from here
+  if (!superfluous()) return true;
+  --_running;
+  ++_aside;
+  _needed.wait_for(lock, kLinger, [this] { return _closed || _calledBack > 0; });
+  if (_calledBack > 0) {
+    --_calledBack;
+    return !_closed;
   }
-  if (earlier.joinable()) earlier.join();
-  return true;
+  --_aside;
+  if (!_closed) retire();
+  return false;
+}
+
+void PoolThreads::retire() {
+  const auto self = std::find_if(_threads.begin(), _threads.end(),
+                                 [](const std::thread& t) { return t.get_id() == std::this_thread::get_id(); });
+  std::thread earlier = std::exchange(_retired, std::move(*self));
+  _threads.erase(self);
+  if (earlier.joinable()) earlier.join();  // has nothing left to do
 }
 
 void PoolThreads::closeDown() {
   const std::lock_guard lock(_mutex);
   _closed = true;
+  _needed.notify_all();
 }
 
 void PoolThreads::join() {
@@ -118,6 +123,13 @@ void PoolThreads::blockingBegins() {
   const std::lock_guard lock(_mutex);
   ++_blocked;
   if (_closed || _running - _blocked >= _wanted || _running >= _maximum) return;
+  if (_aside > 0) {
+    --_aside;
+    ++_calledBack;
+    ++_running;
+    _needed.notify_one();
+    return;
+  }
   try {
     launch(true);
   } catch (const std::system_error& error) {

@@ -13,6 +13,8 @@ namespace {
 constexpr std::size_t kReadSize = 64U << 10U;
 // A frame that arrives over many reads must not hold a thread for all of them.
 constexpr int kReadsPerTurn = 16;
+// With so much to carry out the thread is away for milliseconds.
+constexpr std::size_t kLargeFrame = 256U << 10U;
 // A peer that broke the protocol still gets the replies to what came before.
 constexpr std::chrono::milliseconds kDrainAfterProtocolError{1000};
 
@@ -131,6 +133,8 @@ std::optional<SocketConnection::Pause> SocketConnection::carryOutFrames(int& car
   for (;;) {
     if (carriedOut == kFramesPerTurn) return Pause::turnUsedUp;
     if (_outbox->pending() > _limits.maximumUnreadReplies) return Pause::repliesUnread;
+    std::optional<BlockingScope> large;
+    if (_decoder.pending() > kLargeFrame) large.emplace();
     FrameDecoder::Outcome outcome = _decoder.next();
     if (std::holds_alternative<FrameDecoder::NeedMore>(outcome)) return std::nullopt;
     if (auto* const error = std::get_if<FrameDecoder::ProtocolError>(&outcome)) {

@@ -7,49 +7,21 @@
 #include <asio/post.hpp>
 #include <asio/steady_timer.hpp>
 #include <asio/strand.hpp>
-#include <atomic>
-#include <condition_variable>
 #include <cstdint>
 #include <mutex>
 #include <utility>
 
+#include "platform/JobCount.h"
 #include "platform/Log.h"
 #include "platform/PoolThreads.h"
 
 namespace platform {
 
-namespace {
-
-// Counts posted jobs until they have run, for drain().
-class JobCount {
- public:
-  void posted() { _jobs.fetch_add(1, std::memory_order_relaxed); }
-  void ran() {
-    if (_jobs.fetch_sub(1) != 1) return;
-    if (_waiting.load() == 0) return;
-    const std::lock_guard lock(_mutex);
-    _none.notify_all();
-  }
-  bool waitForNone(std::chrono::milliseconds patience) {
-    std::unique_lock lock(_mutex);
-    ++_waiting;
-    const bool none = _none.wait_for(lock, patience, [this] { return _jobs.load() == 0; });
-    --_waiting;
-    return none;
-  }
-
- private:
-  std::atomic<std::size_t> _jobs{0};
-  std::atomic<std::size_t> _waiting{0};
-  std::mutex _mutex;
-  std::condition_variable _none;
-};
-
-}  // namespace
-
 struct WorkPool::Implementation final : PoolThreads::Loop {
   Implementation(std::size_t threadCount, std::size_t extraThreads)
-      : work(io.get_executor()), threads(*this, threadCount, extraThreads) {}
+      : work(io.get_executor()),
+        threads(*this, "pool", threadCount, extraThreads),
+        compute(std::make_shared<ComputeThreads>(jobs, threadCount, extraThreads)) {}
 
   void runUntilStopped() override { io.run(); }
   bool runOne(std::chrono::milliseconds patience) override { return io.run_one_for(patience) > 0; }
@@ -59,6 +31,7 @@ struct WorkPool::Implementation final : PoolThreads::Loop {
   asio::io_context io;   // goes after `threads`, with the jobs that never ran
   asio::executor_work_guard<asio::io_context::executor_type> work;
   PoolThreads threads;
+  const std::shared_ptr<ComputeThreads> compute;
 };
 
 namespace {
@@ -207,6 +180,7 @@ WorkPool::~WorkPool() {
 
 void WorkPool::start() {
   _implementation->threads.start();
+  _implementation->compute->start();
 }
 
 void WorkPool::stop() {
@@ -214,10 +188,15 @@ void WorkPool::stop() {
   _implementation->threads.closeDown();
   _implementation->io.stop();
   _implementation->threads.join();
+  _implementation->compute->stop();
 }
 
 std::shared_ptr<WorkQueue> WorkPool::makeQueue() {
   return std::make_shared<StrandQueue>(_implementation->io, _implementation->jobs);
+}
+
+std::shared_ptr<ComputeQueue> WorkPool::makeComputeQueue() {
+  return std::make_shared<ComputeQueue>(_implementation->compute);
 }
 
 void WorkPool::post(Job job) {

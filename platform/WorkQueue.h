@@ -4,17 +4,17 @@
 #include <cstddef>
 #include <memory>
 
+#include "platform/ComputeQueue.h"
 #include "platform/UniqueFunction.h"
 
 namespace platform {
-
-using Job = UniqueFunction<void()>;
 
 class WorkQueue;
 class Timer;
 class DescriptorWatch;
 
-// The threads that carry out everybody's jobs: one event loop served by a small pool.
+// The threads that carry out everybody's jobs: one event loop served by a small pool, and as many more for compute queues
+// once there is such a job. The fewer serve the loop, the fewer are woken for jobs that take less than waking does.
 //
 // Owned by main (or by a client library instance, or a test) and outlives every queue, timer and watch made from it.
 // All operations may be called from any thread unless they say otherwise. Jobs must not throw.
@@ -36,10 +36,11 @@ class WorkPool {
   bool drain(std::chrono::milliseconds patience);
 
   std::shared_ptr<WorkQueue> makeQueue();
+  std::shared_ptr<ComputeQueue> makeComputeQueue();
   // Runs `job` on some thread of the pool, unordered.
   void post(Job job);
 
-  // Threads that run jobs now, those added for blocked ones included.
+  // Threads that run the loop's jobs now, those added for blocked ones included.
   std::size_t threadCount() const;
 
   struct Implementation;
@@ -88,7 +89,7 @@ class DescriptorWatch {
   virtual void cancel() = 0;
 };
 
-// Held around a call that blocks a thread of the pool: meanwhile the pool runs one more thread, so that blocked jobs
+// Held around what blocks a thread of the pool, or keeps it busy for long: meanwhile the pool runs one more thread, so that blocked jobs
 // never starve others. On threads that belong to no pool it does nothing.
 class BlockingScope {
  public:

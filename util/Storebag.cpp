@@ -75,6 +75,7 @@ std::optional<std::vector<std::uint8_t>> decodedMember(const Dictionary& documen
 
 // The inner bag of a downloaded document, once its signature has been verified; null for anything else.
 SharedDictionary openDocument(platform::Platform& platform, std::string_view body) {
+  const platform::BlockingScope blocking;  // a document of megabytes takes a while
   const auto document = platform::parsePropertyList(bytesOf(body));
   if (!document) ORVANTA_LOG(error, "fetchStorebagWithName: propertyListWithData error {}", document.error());
   const Dictionary* content = document ? document->dictionary() : nullptr;

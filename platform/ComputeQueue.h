@@ -1,0 +1,75 @@
+#pragma once
+
+#include <chrono>
+#include <condition_variable>
+#include <cstddef>
+#include <deque>
+#include <memory>
+#include <mutex>
+
+#include "platform/JobCount.h"
+#include "platform/PoolThreads.h"
+#include "platform/UniqueFunction.h"
+
+namespace platform {
+
+using Job = UniqueFunction<void()>;
+
+class ComputeThreads;
+
+// A serial queue beside the event loop, for jobs that compute for long, such as compressing: they hold up nobody who
+// waits for the loop. Its jobs run one at a time, in the order in which they were posted, on a thread of their own kind.
+//
+// Shared: each pending job keeps it alive. Any thread may call it. Jobs must not throw.
+class ComputeQueue final : public std::enable_shared_from_this<ComputeQueue> {
+ public:
+  // Use WorkPool::makeComputeQueue().
+  explicit ComputeQueue(std::shared_ptr<ComputeThreads> threads) : _threads(std::move(threads)) {}
+
+  // Once the pool has stopped, `job` is destroyed uncalled.
+  void post(Job job);
+
+ private:
+  friend class ComputeThreads;
+
+  const std::shared_ptr<ComputeThreads> _threads;
+
+  // Guarded by the threads' mutex.
+  std::deque<Job> _jobs;
+  bool _inLine = false;  // in the line, or served by a thread
+};
+
+// The threads that serve compute queues. None runs before there is a job. Shared by the pool, which stops them, and the
+// queues, which may outlive it.
+class ComputeThreads final : PoolThreads::Loop {
+ public:
+  // `count` is the pool's, which outlives stop().
+  ComputeThreads(JobCount& count, std::size_t threads, std::size_t extraThreads);
+
+  // Until now jobs only wait.
+  void start();
+  // Lets running jobs end, joins the threads and destroys the jobs that did not begin. Idempotent; not from a job.
+  void stop();
+
+ private:
+  friend class ComputeQueue;
+
+  void post(ComputeQueue& queue, Job job);
+  void runUntilStopped() override;
+  bool runOne(std::chrono::milliseconds patience) override;
+  void serveFirst(std::unique_lock<std::mutex>& lock);
+
+  JobCount& _count;
+
+  std::mutex _mutex;
+  std::condition_variable _changed;
+  // Guarded by _mutex.
+  std::deque<std::shared_ptr<ComputeQueue>> _line;  // with jobs and not being served, the longest waiting first
+  bool _started = false;
+  bool _running = false;  // the threads have been started
+  bool _stopped = false;
+
+  PoolThreads _threads;
+};
+
+}  // namespace platform
