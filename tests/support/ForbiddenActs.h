@@ -39,6 +39,10 @@ inline std::string binding(const std::string& path) {
   return outcome(::bind(socket.get(), reinterpret_cast<const sockaddr*>(&*address), sizeof *address) == 0);
 }
 
+inline constexpr const char* kDenied = "Permission denied";
+inline constexpr const char* kNotPermitted = "Operation not permitted";
+inline constexpr const char* kNotImplemented = "Function not implemented";
+
 // What nothing in the daemon's process may do once it has started, and how that ends. Shared by the sandbox's own tests
 // and by the plug-in that tries it inside the real daemon.
 struct ForbiddenAct {
@@ -49,58 +53,42 @@ struct ForbiddenAct {
 };
 
 inline const ForbiddenAct kForbiddenActs[] = {
-    {"open a home directory", [](const auto&, const auto&) { return opening("/root", O_RDONLY | O_DIRECTORY); },
-     "Permission denied"},
-    {"write outside", [](const auto&, const auto& closed) { return opening(closed + "/new", O_WRONLY | O_CREAT); },
-     "Permission denied"},
-    {"overwrite what is for reading", [](const auto& readable, const auto&) { return opening(readable, O_WRONLY); },
-     "Permission denied"},
-    {"empty while reading", [](const auto& readable, const auto&) { return opening(readable, O_RDONLY | O_TRUNC); },
-     "Operation not permitted"},
-    {"empty by name", [](const auto& readable, const auto&) { return outcome(::truncate(readable.c_str(), 0) == 0); },
-     "Function not implemented"},
-    {"change permissions", [](const auto& readable, const auto&) { return outcome(::chmod(readable.c_str(), 0) == 0); },
-     "Operation not permitted"},
-    {"name a socket elsewhere", [](const auto&, const auto& closed) { return binding(closed + "/socket"); },
-     "Permission denied"},
+    {"open a home directory", [](auto&, auto&) { return opening("/root", O_RDONLY | O_DIRECTORY); }, kDenied},
+    {"write outside", [](auto&, auto& closed) { return opening(closed + "/new", O_WRONLY | O_CREAT); }, kDenied},
+    {"overwrite what is for reading", [](auto& readable, auto&) { return opening(readable, O_WRONLY); }, kDenied},
+    {"empty while reading", [](auto& file, auto&) { return opening(file, O_RDONLY | O_TRUNC); }, kNotPermitted},
+    {"empty by name", [](auto& file, auto&) { return outcome(::truncate(file.c_str(), 0) == 0); }, kNotImplemented},
+    {"change permissions", [](auto& file, auto&) { return outcome(::chmod(file.c_str(), 0) == 0); }, kNotPermitted},
+    {"name a socket elsewhere", [](auto&, auto& closed) { return binding(closed + "/socket"); }, kDenied},
     {"listen on another socket",
-     [](const auto&, const auto&) {
+     [](auto&, auto&) {
        const platform::UniqueFd socket(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
        return socket ? outcome(::listen(socket.get(), 1) == 0) : "no socket";
      },
-     "Operation not permitted"},
+     kNotPermitted},
     {"open a packet socket",
-     [](const auto&, const auto&) {
+     [](auto&, auto&) {
        const platform::UniqueFd socket(::socket(AF_PACKET, SOCK_RAW | SOCK_CLOEXEC, 0));
        return outcome(static_cast<bool>(socket));
      },
-     "Operation not permitted"},
+     kNotPermitted},
     {"start a process",
-     [](const auto&, const auto&) {
+     [](auto&, auto&) {
        const pid_t child = ::fork();
        if (child == 0) ::_exit(0);
        if (child > 0) ::waitpid(child, nullptr, 0);
        return outcome(child > 0);
      },
-     "Operation not permitted"},
+     kNotPermitted},
     {"write code",
-     [](const auto&, const auto&) {
+     [](auto&, auto&) {
        return outcome(::mmap(nullptr, 4096, PROT_WRITE | PROT_EXEC, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0) != MAP_FAILED);
      },
-     "Operation not permitted"},
-    {"make a call of no use to it", [](const auto&, const auto&) { return outcome(::inotify_init1(0) >= 0); },
-     "Function not implemented"},
-    {"run a program",
-     [](const auto&, const auto&) {
-       ::execl("/bin/true", "/bin/true", nullptr);
-       return outcome(false);
-     },
-     nullptr},
-    {"trace", [](const auto&, const auto&) { return outcome(::ptrace(PTRACE_TRACEME, 0, nullptr, nullptr) == 0); },
-     nullptr},
-    {"mount",
-     [](const auto&, const auto& closed) { return outcome(::mount("none", closed.c_str(), "tmpfs", 0, nullptr) == 0); },
-     nullptr},
+     kNotPermitted},
+    {"make a call of no use to it", [](auto&, auto&) { return outcome(::inotify_init1(0) >= 0); }, kNotImplemented},
+    {"run a program", [](auto&, auto&) { return outcome(::execl("/bin/true", "/bin/true", nullptr) == 0); }, nullptr},
+    {"trace", [](auto&, auto&) { return outcome(::ptrace(PTRACE_TRACEME, 0, nullptr, nullptr) == 0); }, nullptr},
+    {"mount", [](auto&, auto& at) { return outcome(::mount("none", at.c_str(), "tmpfs", 0, nullptr) == 0); }, nullptr},
 };
 
 }  // namespace orvanta::test

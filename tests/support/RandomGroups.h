@@ -8,14 +8,49 @@
 #include <functional>
 #include <memory>
 #include <mutex>
+#include <random>
 #include <string>
 #include <thread>
 #include <vector>
 
 #include "client/OrvantaClient.h"
-#include "tests/support/GroupOperations.h"
 
 namespace orvanta::test {
+
+// One thing that one of many related sessions does.
+struct GroupOperation {
+  enum class Kind : std::uint8_t { join, regroup, leave, vanish, send, userInfo, flush, storebag };
+  Kind kind = Kind::join;
+  std::uint32_t member = 0;
+  // Which of these count follows from the kind.
+  std::uint32_t group = 0, level = 0;
+  bool aggregates = false, batches = false;
+  std::uint32_t variant = 0;          // of the user info or the storebag; of user info 0 is none
+  std::uint32_t count = 0, flag = 0;  // events
+};
+
+// What the members do, in order: the same for the same seed, whatever the daemon's timing. Used by one thread.
+class GroupOperations {
+ public:
+  static constexpr std::uint32_t kMembers = 200, kGroups = 20, kLevels = 5, kVariants = 4;
+
+  explicit GroupOperations(std::uint64_t seed) : _random(seed) {}
+
+  GroupOperation next();
+  void everyoneHasLeft() { _here.fill(false); }
+  // Of all operations so far: what shows that two runs did the same.
+  std::uint64_t digest() const { return _digest; }
+
+ private:
+  // The engine's values are the same everywhere; the library's distributions are not.
+  std::uint32_t below(std::uint32_t limit) { return static_cast<std::uint32_t>(_random() % limit); }
+  GroupOperation::Kind kindFor(std::uint32_t member);
+  void digest(std::uint32_t value) { _digest = (_digest ^ value) * 1'099'511'628'211U; }
+
+  std::mt19937_64 _random;
+  std::array<bool, kMembers> _here{};
+  std::uint64_t _digest = 14'695'981'039'346'656'037U;
+};
 
 // Two hundred clients of one daemon, in twenty groups, that join, leave, send, flush and change their user info at
 // random, and what must hold all the while: every call is answered, no event reaches two aggregators, whoever receives
@@ -83,11 +118,7 @@ class RandomGroups {
   std::array<Member, GroupOperations::kMembers> _members;
 
   // Any thread.
-  std::atomic<std::uint64_t> _operations{0};
-  std::atomic<std::uint64_t> _progress{0};
-  std::atomic<std::uint64_t> _unanswered{0};
-  std::atomic<std::uint64_t> _eventsAggregated{0};
-  std::atomic<std::uint64_t> _calls{0};
+  std::atomic<std::uint64_t> _operations{0}, _progress{0}, _unanswered{0}, _eventsAggregated{0}, _calls{0};
 
   std::mutex _mutex;
   std::condition_variable _changed, _ended;

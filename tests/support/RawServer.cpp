@@ -96,10 +96,9 @@ void RawServer::acceptAll() {
     const std::lock_guard lock(_mutex);
     if (_stopping) return;
     const auto entry = _open.insert(_open.end(), fd.get());
-    const std::size_t number = _accepted++;
-    _changed.notify_all();
-    _scripts.emplace_back([this, entry, number, fd = std::move(fd)]() mutable {
-      RawConnection connection(*this, fd.get(), number);
+    ++_accepted;
+    _scripts.emplace_back([this, entry, fd = std::move(fd)]() mutable {
+      RawConnection connection(*this, fd.get());
       _script(connection);
       const std::lock_guard scriptEnd(_mutex);
       _open.erase(entry);
@@ -131,11 +130,6 @@ std::size_t RawServer::connectionCount() const {
 bool RawServer::waitForRequests(std::size_t count) const {
   std::unique_lock lock(_mutex);
   return _changed.wait_for(lock, std::chrono::seconds(30), [&] { return _requests.size() >= count; });
-}
-
-bool RawServer::waitForConnections(std::size_t count) const {
-  std::unique_lock lock(_mutex);
-  return _changed.wait_for(lock, std::chrono::seconds(30), [&] { return _accepted >= count; });
 }
 
 RawServer::Script RawServer::answering(std::string answer) {

@@ -21,7 +21,7 @@ class RawServer;
 // One accepted connection of a RawServer, in the hands of the script that runs for it.
 class RawConnection {
  public:
-  RawConnection(RawServer& server, int fd, std::size_t number) : _server(server), _fd(fd), _number(number) {}
+  RawConnection(RawServer& server, int fd) : _server(server), _fd(fd) {}
 
   // The next whole request, headers and the body of their Content-Length, as it came; none when the client closed
   // before. The server remembers it.
@@ -32,15 +32,12 @@ class RawConnection {
   void reset();
   // Until the client closes, or the server stops. What comes meanwhile is thrown away.
   void waitForClose();
-  // Counted from 0 in the order of acceptance.
-  std::size_t number() const { return _number; }
 
  private:
   bool readMore();
 
   RawServer& _server;
   const int _fd;
-  const std::size_t _number;
   std::string _pending;
 };
 
@@ -62,7 +59,6 @@ class RawServer {
   std::size_t connectionCount() const;
   // False when they have not come within half a minute.
   bool waitForRequests(std::size_t count) const;
-  bool waitForConnections(std::size_t count) const;
 
   // A script that answers every request of a connection alike.
   static Script answering(std::string answer);

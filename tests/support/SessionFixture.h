@@ -42,6 +42,8 @@ struct Kept {
   }
   std::string error() const { return outcome->has_value() ? (*outcome)->error.text : std::string("no answer"); }
 };
+using KeptText = Kept<std::optional<std::string>>;
+using KeptFlush = Kept<std::optional<std::string>, std::optional<OrvantaError>>;
 
 // The real agent and real sessions on a test device; the storebag comes from the test.
 class SessionFixture : public ::testing::Test {
@@ -76,7 +78,7 @@ class SessionFixture : public ::testing::Test {
     return kept.given() ? kept.get() : std::nullopt;
   }
   std::optional<std::string> send(OrvantadSession& session, Dictionary parameters) {
-    Kept<std::optional<std::string>> kept;
+    KeptText kept;
     session.sendMessageWithDictionary(shared(std::move(parameters)), kept.reply());
     EXPECT_TRUE(kept.given());
     return kept.get();
