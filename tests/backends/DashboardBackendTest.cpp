@@ -3,13 +3,11 @@
 #include <gtest/gtest.h>
 #include <sys/resource.h>
 
-#include <algorithm>
 #include <filesystem>
 #include <map>
 #include <random>
 
 #include "backends/DashboardDatagram.h"
-#include "platform/PropertyList.h"
 #include "tests/platform/Waiting.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
@@ -26,26 +24,23 @@ class DashboardBackendTest : public ::testing::Test {
  protected:
   using Backend = std::shared_ptr<DashboardBackend>;
 
-  Dictionary profile(Dictionary more = {}) const {
+  Dictionary profile(const Dictionary& more = {}) const {
     Dictionary all{{"ip", "127.0.0.1"}, {"port", static_cast<int>(server.port())}};
     all.merge(more);
     return all;
   }
-  Backend make(const Dictionary& content) {
-    auto backend =
-        DashboardBackend::create(platform, "dashboard", std::make_shared<const Dictionary>(content), "Parva");
-    if (backend) identify(*backend);
-    return backend;
-  }
-  static void identify(DashboardBackend& backend) {
+  Backend make(const std::optional<Dictionary>& content) {
+    const auto shared = content ? std::make_shared<const Dictionary>(*content) : nullptr;
+    auto backend = DashboardBackend::create(platform, "dashboard", shared, "Parva");
     BackendIdentity identity;
     identity.sessionID = 1;
     identity.compType = 7;
     identity.udid = "D";
     identity.selfVersion = "8.0";
-    backend.setIdentity(std::move(identity));
+    if (backend) backend->setIdentity(std::move(identity));
+    return backend;
   }
-  static std::optional<std::string> send(DashboardBackend& backend, SharedDictionary payload = nullptr) {
+  static std::optional<std::string> send(DashboardBackend& backend, const SharedDictionary& payload = nullptr) {
     return backend.sendMessage(payload, {123, 0}, 5, 6, 0);
   }
   // The next datagram taken apart.
@@ -55,8 +50,8 @@ class DashboardBackendTest : public ::testing::Test {
     const auto packet = decodeDashboardDatagram(datagram.value_or(std::vector<std::uint8_t>()));
     return packet ? *packet : tagReportingPacket{};
   }
-  static std::array<std::uint8_t, 64> acknowledgement(std::uint16_t number) {
-    std::array<std::uint8_t, 64> datagram{};
+  static std::vector<std::uint8_t> acknowledgement(std::uint16_t number, std::size_t size = 64) {
+    std::vector<std::uint8_t> datagram(size);
     datagram[60] = static_cast<std::uint8_t>(number >> 8U);
     datagram[61] = static_cast<std::uint8_t>(number);
     return datagram;
@@ -84,51 +79,40 @@ class DashboardBackendTest : public ::testing::Test {
 
 TEST_F(DashboardBackendTest, SetUpFailuresLeaveOneLineAndNoSocket) {
   const std::size_t before = openSockets();
-  const std::pair<Dictionary, std::string> rows[] = {
-      {{}, "can't resolve server IP"},
-      {{{"port", 1}}, "can't resolve server IP"},
-      {{{"ip", nullptr}, {"port", 1}}, "can't resolve server IP"},
-      {{{"ip", "127.0.0.1"}}, "can't resolve server port"},
-      {{{"ip", "localhost"}, {"port", 1}}, "socket connect() failed."},
-      {{{"ip", "127.0.0.1 and more"}, {"port", 1}, {"reliable", 5}}, "socket connect() failed."},
-      {{{"ip", Array{}}, {"port", 1}}, "socket connect() failed."},
-  };
-  for (const auto& [content, line] : rows) {
+  const auto refuses = [&](const std::optional<Dictionary>& content, const std::string& line) {
     log.clear();
     EXPECT_EQ(make(content), nullptr) << line;
     EXPECT_EQ(log.lines(), std::vector<std::string>{"<3>DashboardBackend(initWithName): " + line});
-  }
-  log.clear();
-  EXPECT_EQ(DashboardBackend::create(platform, "dashboard", nullptr, "Parva"), nullptr);
-  EXPECT_EQ(log.lines(),
-            std::vector<std::string>{"<3>DashboardBackend(initWithName): initWitName with all null params."});
-  log.clear();
+  };
+  refuses(std::nullopt, "initWitName with all null params.");
+  refuses(Dictionary{}, "can't resolve server IP");
+  refuses(Dictionary{{"ip", nullptr}, {"port", 1}}, "can't resolve server IP");
+  refuses(Dictionary{{"ip", "127.0.0.1"}}, "can't resolve server port");
+  refuses(Dictionary{{"ip", "localhost"}, {"port", 1}}, "socket connect() failed.");
+  refuses(Dictionary{{"ip", "127.0.0.1 and more"}, {"port", 1}, {"reliable", 5}}, "socket connect() failed.");
+  refuses(Dictionary{{"ip", Array{}}, {"port", 1}}, "socket connect() failed.");
   EXPECT_EQ(DashboardBackend::create(platform, "dashboard", std::nullopt, 1, "Parva"), nullptr);
-  EXPECT_TRUE(log.lines().empty());
   EXPECT_EQ(openSockets(), before);
 
   rlimit limit{};
   ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &limit), 0);
   const rlimit none{0, limit.rlim_max};
   ::setrlimit(RLIMIT_NOFILE, &none);
-  EXPECT_EQ(make(profile()), nullptr);
+  refuses(profile(), "socket() failed (24)");
   ::setrlimit(RLIMIT_NOFILE, &limit);
-  EXPECT_EQ(log.lines(), std::vector<std::string>{"<3>DashboardBackend(initWithName): socket() failed (24)"});
 }
 
 TEST_F(DashboardBackendTest, SettingsFromTheProfile) {
-  const struct {
-    platform::Value reliable;
-    int period;
-    bool warns;
-  } rows[] = {{250, 250, false}, {"20", 20, false},         {0, 500, true},      {-3, 500, true},
-              {true, 500, true}, {1e300, 86'400'000, true}, {Array{}, 500, true}};
-  for (const auto& row : rows) {
+  const std::tuple<platform::Value, int, std::size_t> rows[] = {
+      // the period in milliseconds, warnings
+      {250, 250, 0},  {"20", 20, 0},          {0, 500, 1},      {-3, 500, 1},
+      {true, 500, 1}, {1e300, 86'400'000, 1}, {Array{}, 500, 1}};
+  for (const auto& [reliable, period, warnings] : rows) {
     log.clear();
-    auto backend = make(profile({{"reliable", row.reliable}}));
-    EXPECT_EQ(backend->period().count(), row.period) << row.reliable.description();
+    auto backend = make(profile({{"reliable", reliable}}));
+    EXPECT_EQ(backend->period().count(), period) << reliable.description();
     EXPECT_TRUE(backend->reliableUDP());
-    EXPECT_EQ(log.count("<4>"), row.warns ? 1U : 0U);
+    EXPECT_EQ(log.count("<4>"), warnings);
     EXPECT_TRUE(goes(backend));
   }
   const auto plain = make(profile({{"display_url", "http://show"}}));
@@ -221,9 +205,7 @@ TEST_F(DashboardBackendTest, OnlyTheServersAcknowledgementOfThatNumberCounts) {
   // The flood leaves other queues their turn, and the datagram its schedule.
   EXPECT_TRUE(DashboardBackend::waitUntilSent(platform, test::kHangGuard));
   EXPECT_EQ(server.receive(), datagram);
-  std::vector<std::uint8_t> shortest(62, 0);
-  shortest[61] = 1;
-  server.send(shortest);
+  server.send(acknowledgement(1, 62));
   EXPECT_TRUE(goes(backend));
 }
 
@@ -249,64 +231,14 @@ TEST_F(DashboardBackendTest, TheLastResortClosesWhatASilentServerKeepsOpen) {
   EXPECT_TRUE(goes(backend));
   EXPECT_GE(std::chrono::steady_clock::now() - begin, DashboardBackend::kLastResortDelay);
   EXPECT_EQ(openSockets(), before);
-  EXPECT_EQ(log.count("<7>DashboardBackend(myPeriodicTask): scheduled last resort clean-up in 9500 ms."), 1U);
   EXPECT_EQ(log.count("clean up at myPeriodicTask"), 0U);
-}
-
-TEST_F(DashboardBackendTest, AThousandBackendsLeaveNothingBehind) {
-  const std::size_t before = openSockets();
-  const std::size_t threads = platform.get().pool().threadCount();
-  for (int round = 0; round < 10; ++round) {  // a hundred at a time, below any limit on descriptors
-    std::vector<std::weak_ptr<DashboardBackend>> weak;
-    for (int i = 0; i < 100; ++i) {
-      const auto backend = make(i % 3 == 0 ? profile() : profile({{"reliable", 2}}));
-      ASSERT_NE(backend, nullptr);
-      send(*backend);
-      weak.emplace_back(backend);
-      backend->cleanup();
-    }
-    const auto gone = [&] { return std::all_of(weak.begin(), weak.end(), [](auto& w) { return w.expired(); }); };
-    ASSERT_TRUE(eventually(gone));
-  }
-  EXPECT_EQ(openSockets(), before);
-  EXPECT_EQ(platform.get().pool().threadCount(), threads);
-}
-
-TEST_F(DashboardBackendTest, UploadsLogDataAndAnnouncesWhere) {
-  using test::ScriptedHttpClient;
-  const auto logData = std::make_shared<const Array>(Array{1, "text", Dictionary{{"k", 2.5}}});
-  const auto backend = make(profile({{"post_url", "http://logs.example/post"}}));
-  platform.http.answer = [](const auto&) { return ScriptedHttpClient::status(200, "http://logs.example/42"); };
-  platform.clock.set(77);
-  EXPECT_TRUE(backend->uploadLogData(logData));
-  const auto request = platform.http.requests().at(0);
-  EXPECT_EQ(request.method + " " + request.url, "POST http://logs.example/post");
-  ASSERT_EQ(request.headers.size(), 1U);
-  EXPECT_EQ(request.headers[0].name + ": " + request.headers[0].value, "Content-Type: application/octet-stream");
-  const auto archive = platform::parseBinaryPropertyList(
-      {reinterpret_cast<const std::uint8_t*>(request.body.data()), request.body.size()});
-  ASSERT_TRUE(archive) << archive.error();
-  EXPECT_EQ(*archive, Dictionary({{"archiver", "OrvantaArchiver"}, {"version", 1}, {"root", *logData}}));
-  const auto packet = received();
-  EXPECT_EQ(packet.text, " LogDataUploadLocation=http://logs.example/42");
-  EXPECT_EQ(packet.header.eventNumber, 1);
-  EXPECT_EQ(packet.header.method, 0);
-  EXPECT_EQ(packet.header.respCode, 2);
-  EXPECT_EQ(packet.header.timeSeconds, 77U);
-  EXPECT_EQ(log.lines(), std::vector<std::string>{
-                             "<7>DashboardBackend(uploadLogData): Log data uploaded to http://logs.example/42"});
 }
 
 TEST_F(DashboardBackendTest, LogDataThatDoesNotArrive) {
   using test::ScriptedHttpClient;
   const auto good = std::make_shared<const Array>(Array{1});
   const auto backend = make(profile({{"post_url", "http://logs.example/post"}}));
-  const struct {
-    Backend backend;
-    SharedArray logData;
-    platform::HttpResult answer;
-    std::string line;
-  } rows[] = {
+  const std::tuple<Backend, SharedArray, platform::HttpResult, std::string> rows[] = {
       {make(profile()), good, {}, "Post URL for log data array is nil"},
       {backend, std::make_shared<const Array>(Array{nullptr}), {}, "Failed to serialize log data array for upload"},
       {backend, good, {std::nullopt, "no route"}, "Error uploading log data array (no route)"},
@@ -314,10 +246,11 @@ TEST_F(DashboardBackendTest, LogDataThatDoesNotArrive) {
       {backend, good, ScriptedHttpClient::status(200, "\xff"), "Error uploading log data array ((null))"},
   };
   for (const auto& row : rows) {
+    const auto& [uploader, logData, answer, line] = row;
     log.clear();
-    platform.http.answer = [&row](const auto&) { return row.answer; };
-    EXPECT_FALSE(row.backend->uploadLogData(row.logData)) << row.line;
-    EXPECT_EQ(log.lines().at(0), "<3>DashboardBackend(uploadLogData): " + row.line);
+    platform.http.answer = [&row](const auto&) { return std::get<2>(row); };
+    EXPECT_FALSE(uploader->uploadLogData(logData)) << line;
+    EXPECT_EQ(log.lines().at(0), "<3>DashboardBackend(uploadLogData): " + line);
   }
   EXPECT_TRUE(DashboardBackend::waitUntilSent(platform, test::kHangGuard));
   EXPECT_EQ(server.receive(0), std::nullopt);

@@ -11,8 +11,7 @@ namespace orvanta::test {
 std::string gunzip(const std::string& bytes) {
   z_stream stream{};
   if (::inflateInit2(&stream, 15 + 16) != Z_OK) throw std::runtime_error("inflateInit2 failed");
-  std::string out;
-  std::string chunk(65536, '\0');
+  std::string out, chunk(65536, '\0');
   stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes.data()));
   stream.avail_in = static_cast<uInt>(bytes.size());
   int result = Z_OK;
@@ -38,24 +37,46 @@ std::string plainBody(const platform::HttpRequest& request) {
   return headerOf(request, "Content-Encoding") == "gzip" ? gunzip(request.body) : request.body;
 }
 
-Array postedEvents(const platform::HttpRequest& request) {
-  const auto body = platform::parseJson(plainBody(request));
-  if (!body) {
-    ADD_FAILURE() << body.error();
-    return {};
-  }
-  const Value* events = body->dictionary()->find("events");
-  return *events->array();
+Dictionary envelopeOf(const platform::HttpRequest& request) {
+  auto body = platform::parseJson(plainBody(request));
+  if (body && body->dictionary() != nullptr) return std::move(*body->dictionary());
+  ADD_FAILURE() << (body ? "no dictionary" : body.error());
+  return {};
 }
 
-Dictionary HTTPSFixture::openSection() {
-  return {{"locale_whitelist", Array{"DE"}},
-          {"filters", Array{Value(Dictionary{{"key", "nothingOfThatName"}, {"action", "remove"}})}},
-          {"override_dnu", 1},
-          {"sampling_threshold", 1},
-          {"event_threshold", 49},
-          {"post_url", "https://events.example/batch"},
-          {"realtime_post_url", "https://events.example/realtime"}};
+std::vector<Dictionary> postedEvents(const platform::HttpRequest& request) {
+  std::vector<Dictionary> events;
+  const Dictionary envelope = envelopeOf(request);
+  const Value* list = envelope.find("events");
+  if (list == nullptr || list->array() == nullptr) {
+    ADD_FAILURE() << "no events";
+    return events;
+  }
+  for (const Value& event : *list->array()) events.push_back(*event.dictionary());
+  return events;
+}
+
+Dictionary HTTPSFixture::openSection(const Dictionary& more) {
+  Dictionary section{{"locale_whitelist", Array{"DE"}},
+                     {"filters", Array{Dictionary{{"key", "nothingOfThatName"}, {"action", "remove"}}}},
+                     {"override_dnu", 1},
+                     {"sampling_threshold", 1},
+                     {"event_threshold", 49},
+                     {"post_url", "https://events.example/batch"},
+                     {"realtime_post_url", "https://events.example/realtime"}};
+  section.merge(more);
+  for (const auto& [key, value] : more) {
+    if (value.isNull()) section.erase(key);
+  }
+  return section;
+}
+
+HTTPSFixture::Setup HTTPSFixture::requiring(const Dictionary& more, bool batches) {
+  Setup setup = batching(more);
+  setup.batchEvents = batches;
+  setup.identity.requireUserInfo = true;
+  setup.userInfo = shared({{"clientName", "Mail"}, {"serviceName", "imap"}});
+  return setup;
 }
 
 BackendIdentity HTTPSFixture::defaultIdentity() {
@@ -72,8 +93,8 @@ BackendIdentity HTTPSFixture::defaultIdentity() {
   return identity;
 }
 
-std::shared_ptr<HTTPSPostBackend> HTTPSFixture::makeBackend(const Setup& setup) {
-  auto backend = HTTPSPostBackend::create(platform, setup.name, shared(setup.profile), "Parva");
+std::shared_ptr<HTTPSPostBackend> HTTPSFixture::makeBackend(const Setup& setup, TestPlatform& on) {
+  auto backend = HTTPSPostBackend::create(on, setup.name, shared(setup.profile), "Parva");
   if (!backend) return nullptr;
   backend->setIdentity(setup.identity);
   backend->setBatchEvents(setup.batchEvents);
@@ -85,7 +106,7 @@ std::shared_ptr<HTTPSPostBackend> HTTPSFixture::makeBackend(const Setup& setup) 
 }
 
 std::optional<std::string> HTTPSFixture::send(OrvantaBackend& backend, std::uint16_t method, std::int32_t flag,
-                                              SharedDictionary payload, std::uint16_t respCode) {
+                                              const SharedDictionary& payload, std::uint16_t respCode) {
   return backend.sendMessage(payload, platform.clock.timeOfDay(), method, respCode, flag);
 }
 
@@ -104,13 +125,13 @@ void HTTPSFixture::settle() {
   ASSERT_TRUE(PendingPosts::of(platform)->waitUntilHandedIn(kHangGuard));
 }
 
-HTTPSFixture::Posts HTTPSFixture::categories() {
+HTTPSFixture::Posts HTTPSFixture::fields(std::string_view key) {
   Posts all;
   for (const auto& request : requests()) {
     std::string text;
-    for (const Value& event : postedEvents(request)) {
-      const Value* method = event.dictionary()->find("_method");
-      text += (text.empty() ? "" : " ") + (method == nullptr ? "none" : method->description());
+    for (const Dictionary& event : postedEvents(request)) {
+      const Value* value = event.find(key);
+      text += (text.empty() ? "" : " ") + (value == nullptr ? "none" : value->description());
     }
     all.push_back(std::move(text));
   }

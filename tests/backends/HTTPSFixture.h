@@ -27,8 +27,9 @@ inline SharedDictionary shared(Dictionary dictionary) {
 std::string gunzip(const std::string& bytes);
 // The body as it was before compression.
 std::string plainBody(const platform::HttpRequest& request);
-// The events of a posted envelope; fails the test when the body is none.
-Array postedEvents(const platform::HttpRequest& request);
+// The posted envelope, and its events; empty, with a failure, when the body is none.
+Dictionary envelopeOf(const platform::HttpRequest& request);
+std::vector<Dictionary> postedEvents(const platform::HttpRequest& request);
 std::string headerOf(const platform::HttpRequest& request, std::string_view name);
 
 // What a flush told its caller.
@@ -43,12 +44,13 @@ class HTTPSFixture : public ::testing::Test {
  protected:
   static constexpr std::chrono::seconds kHangGuard{30};
 
-  // A section under which everything reports: any client, any country known, no filters that match.
-  static Dictionary openSection();
+  // A section under which everything reports: any client, any country known, no filters that match. With other keys, or
+  // without those given as null.
+  static Dictionary openSection(const Dictionary& more = {});
   static Dictionary profileOf(Array sections) { return {{"clients", std::move(sections)}}; }
 
   struct Setup {
-    Dictionary profile = profileOf({Value(openSection())});
+    Dictionary profile = profileOf({openSection()});
     BackendIdentity identity = defaultIdentity();
     bool batchEvents = false;
     SharedDictionary userInfo;
@@ -56,26 +58,31 @@ class HTTPSFixture : public ::testing::Test {
     double samplingFactor = 0.0;
     bool evaluate = true;
   };
-  // One that batches.
-  static Setup batching() {
+  // One that batches, under the open section with these changes.
+  static Setup batching(const Dictionary& more = {}) {
     Setup setup;
+    setup.profile = profileOf({openSection(more)});
     setup.batchEvents = true;
     return setup;
   }
+  // One that requires user info and has it, under the open section with these changes.
+  static Setup requiring(const Dictionary& more = {}, bool batches = false);
   static BackendIdentity defaultIdentity();
-  std::shared_ptr<HTTPSPostBackend> makeBackend(const Setup& setup);
+  std::shared_ptr<HTTPSPostBackend> makeBackend(const Setup& setup) { return makeBackend(setup, platform); }
+  static std::shared_ptr<HTTPSPostBackend> makeBackend(const Setup& setup, TestPlatform& on);
 
   // One event at the clock's time.
   std::optional<std::string> send(OrvantaBackend& backend, std::uint16_t method, std::int32_t flag = 0,
-                                  SharedDictionary payload = nullptr, std::uint16_t respCode = 1);
+                                  const SharedDictionary& payload = nullptr, std::uint16_t respCode = 1);
   // Flushes and, once every post has ended, gives what the completion got.
   FlushAnswer flush(HTTPSPostBackend& backend);
   // Waits until every post has been handed to the HTTP client (which answers at once unless it holds).
   void settle();
   std::vector<platform::HttpRequest> requests();
-  // The categories of each post so far, as "1 2 3".
+  // A field of the events of each post so far, as "1 2 none".
   using Posts = std::vector<std::string>;
-  Posts categories();
+  Posts fields(std::string_view key);
+  Posts categories() { return fields("_method"); }
 
   TestPlatform platform;
 };

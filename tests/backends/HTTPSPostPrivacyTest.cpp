@@ -9,14 +9,9 @@ const std::string kSecret = "s3cr3t-value-of-a-person";
 
 class HTTPSPostPrivacyTest : public HTTPSFixture {
  protected:
-  static Setup filtering(const char* action) {
-    Dictionary section = openSection();
-    section.set("filters", Array{Value(Dictionary{{"key", "PersonName"}, {"action", action}})});
-    section.set("event_threshold", 2);
-    Setup setup;
-    setup.profile = profileOf({Value(section)});
-    setup.identity.requireUserInfo = true;
-    setup.batchEvents = true;
+  static Setup filtering(const char* action, const Value& method = -1) {
+    const Dictionary rule{{"key", "PersonName"}, {"method", method}, {"action", action}};
+    Setup setup = requiring({{"filters", Array{rule}}, {"event_threshold", 2}}, true);
     setup.userInfo = shared({{"clientName", "Mail"}, {"personName", kSecret}});
     return setup;
   }
@@ -73,11 +68,7 @@ TEST_F(HTTPSPostPrivacyTest, WhatEventsBeforeUserInfoAndOtherSessionsKeep) {
 }
 
 TEST_F(HTTPSPostPrivacyTest, FiltersForOneCategory) {
-  Dictionary section = openSection();
-  section.set("filters", Array{Value(Dictionary{{"key", "personName"}, {"method", 3}, {"action", "remove"}})});
-  Setup setup = filtering("remove");
-  setup.profile = profileOf({Value(section)});
-  const auto backend = makeBackend(setup);
+  const auto backend = makeBackend(filtering("remove", 3));
   send(*backend, 3, 1);
   EXPECT_EQ(postsWith(kSecret), 0U);
   send(*backend, 3);

@@ -12,30 +12,23 @@ namespace {
 using platform::Array;
 using platform::Dictionary;
 using platform::Value;
-using Why = ReportingTest;
+using Change = std::function<void(ReportingFacts&)>;
+using enum ReportingTest;
 
-const Array kFilters{Value(Dictionary{{"key", "userName"}, {"action", "remove"}})};
-
-// A section that refuses nothing by itself.
-Dictionary open(Dictionary more = {}) {
-  Dictionary section{{"locale_whitelist", Array{"DE"}}, {"filters", kFilters}, {"sampling_threshold", 0.25}};
+// A section that refuses nothing by itself, with other keys, or without those given as null.
+Dictionary open(const Dictionary& more = {}) {
+  Dictionary section{{"locale_whitelist", Array{"DE"}},
+                     {"filters", Array{Dictionary{{"key", "userName"}, {"action", "remove"}}}},
+                     {"sampling_threshold", 0.25}};
   section.merge(more);
+  for (const auto& [key, value] : more) {
+    if (value.isNull()) section.erase(key);
+  }
   return section;
-}
-
-Dictionary without(Dictionary section, std::string_view key) {
-  section.erase(key);
-  return section;
-}
-
-Array list(std::initializer_list<Dictionary> sections) {
-  Array all;
-  for (const auto& section : sections) all.emplace_back(section);
-  return all;
 }
 
 // The session of Mail's imap service, user info and consent given, on a device whose draw is 0.2.
-ReportingFacts facts() {
+ReportingDecision decide(Array clients, const Change& change = {}) {
   ReportingFacts facts;
   facts.clientName = "Mail";
   facts.serviceName = "imap.service";
@@ -47,217 +40,171 @@ ReportingFacts facts() {
   facts.productFamily = "Parva";
   facts.productModel = "xABCy";
   facts.samplingFactor = 0.2;
-  return facts;
+  if (change) change(facts);
+  return evaluate({{"clients", std::move(clients)}}, facts);
 }
 
+std::int32_t stateOf(ReportingTest test) {
+  if (test == waitingForUserInfo) return 0;
+  if (test == userInfoNotRequired || test == sampledIn) return 2;
+  return test == held ? 3 : 1;
+}
+
+void check(const char* what, const ReportingDecision& decision, ReportingTest test) {
+  const std::string reason = describe(decision.reason);
+  EXPECT_EQ(decision.reason.test, test) << what << ": " << reason;
+  EXPECT_EQ(decision.state, stateOf(test)) << what << ": " << reason;
+  EXPECT_FALSE(reason.empty()) << what;
+}
+
+// What becomes of one section.
 struct Row {
   const char* what;
-  Array clients;
-  std::int32_t state;
-  Why test;
-  std::function<void(ReportingFacts&)> change;
+  Dictionary more;  // on top of open()
+  ReportingTest test;
+  Change change = {};
 };
-
-void check(const std::vector<Row>& rows) {
-  for (const auto& row : rows) {
-    ReportingFacts given = facts();
-    if (row.change) row.change(given);
-    const ReportingDecision decision = evaluate({{"clients", row.clients}}, given);
-    EXPECT_EQ(decision.state, row.state) << row.what << ": " << describe(decision.reason);
-    EXPECT_EQ(decision.reason.test, row.test) << row.what << ": " << describe(decision.reason);
-    EXPECT_FALSE(describe(decision.reason).empty()) << row.what;
-  }
+void check(std::initializer_list<Row> rows) {
+  for (const auto& row : rows) check(row.what, decide({open(row.more)}, row.change), row.test);
 }
 
-const auto noClient = [](ReportingFacts& f) { f.clientName.reset(); };
-const auto noService = [](ReportingFacts& f) { f.serviceName.reset(); };
-const auto noConsent = [](ReportingFacts& f) { f.consent = false; };
-const auto noCountry = [](ReportingFacts& f) { f.countryCode.reset(); };
-const auto noModel = [](ReportingFacts& f) { f.productModel.reset(); };
-
-std::function<void(ReportingFacts&)> draw(double factor) {
-  return [factor](ReportingFacts& f) { f.samplingFactor = factor; };
+const Change noClient = [](auto& facts) { facts.clientName.reset(); };
+const Change noService = [](auto& facts) { facts.serviceName.reset(); };
+const Change noConsent = [](auto& facts) { facts.consent = false; };
+const Change noCountry = [](auto& facts) { facts.countryCode.reset(); };
+const Change noModel = [](auto& facts) { facts.productModel.reset(); };
+const Change notRequired = [](auto& facts) { facts.requireUserInfo = facts.consent = false; };
+const Change noUserInfo = [](auto& facts) { facts.hasUserInfo = false; };
+Change draw(double factor) {
+  return [factor](auto& facts) { facts.samplingFactor = factor; };
 }
 
-TEST(ReportingDecision, BeforeASection) {
-  check({
-      {"no sections", {}, 1, Why::noSectionMatches, {}},
-      {"user info not required", {}, 2, Why::userInfoNotRequired, [](auto& f) { f.requireUserInfo = false; }},
-      {"user info not required, no consent, no match", list({{{"client", "Other"}}}), 2, Why::userInfoNotRequired,
-       [](auto& f) {
-         f.requireUserInfo = false;
-         f.consent = false;
-       }},
-      {"user info missing", list({open()}), 0, Why::waitingForUserInfo, [](auto& f) { f.hasUserInfo = false; }},
-      {"elements that are no sections", {"text", 5}, 1, Why::noSectionMatches, {}},
-      {"an element that is no section, then one", {"text", Value(open())}, 2, Why::sampledIn, {}},
-  });
+TEST(ReportingDecision, Sections) {
+  const struct {
+    const char* what;
+    Array clients;
+    ReportingTest test;
+    Change change = {};
+  } rows[] = {
+      {"no sections", {}, noSectionMatches},
+      {"user info not required, no consent, no match", {Dictionary{{"client", "x"}}}, userInfoNotRequired, notRequired},
+      {"user info missing", {open()}, waitingForUserInfo, noUserInfo},
+      {"elements that are no sections", {"text", 5}, noSectionMatches},
+      {"one of them a section", {"text", open()}, sampledIn},
+      {"the first that matches decides",
+       {open({{"client", "News"}}), open({{"sampling_threshold", 0.1}}), open()},
+       held},
+      {"one that is too new is passed over", {open({{"enabledSince", "3"}}), open()}, sampledIn},
+  };
+  for (const auto& row : rows) check(row.what, decide(row.clients, row.change), row.test);
   for (const Dictionary& profile : {Dictionary{}, Dictionary{{"clients", "Mail"}}}) {
-    const ReportingDecision decision = evaluate(profile, facts());
-    EXPECT_EQ(decision.state, 1);
-    EXPECT_EQ(decision.reason.test, Why::noClientList);
+    check("no list", evaluate(profile, {}), noClientList);
   }
+  const auto reason =
+      decide({Dictionary{{"client", "x"}}, open({{"enabledSince", "3.1"}}), open({{"enabledSince", "4"}})}).reason;
+  EXPECT_EQ(reason.section, 1U);
+  EXPECT_EQ(reason.subject, "3.1");
+  EXPECT_EQ(decide({open({{"enabledSince", "3"}}), open()}).reason.section, 1U);
 }
 
 TEST(ReportingDecision, SectionForTheClient) {
+  const Change emptyClient = [](auto& facts) { facts.clientName = ""; };
+  const Change blankClient = [](auto& facts) { facts.clientName = " mail"; };
   check({
-      {"any client", list({open()}), 2, Why::sampledIn, {}},
-      {"any client, client unknown", list({open()}), 2, Why::sampledIn, noClient},
-      {"client without case", list({open({{"client", "News,mAIL"}})}), 2, Why::sampledIn, {}},
-      {"client as a whole", list({open({{"client", "Mai"}})}), 1, Why::noSectionMatches, {}},
-      {"blank before the name", list({open({{"client", "News, Mail"}})}), 1, Why::noSectionMatches, {}},
-      {"blank before the client's own name", list({open({{"client", "News, Mail"}})}), 2, Why::sampledIn,
-       [](auto& f) { f.clientName = " mail"; }},
-      {"client unknown", list({open({{"client", "Mail"}})}), 1, Why::noSectionMatches, noClient},
-      {"empty client list", list({open({{"client", ""}})}), 1, Why::noSectionMatches, {}},
-      {"empty client list, empty client", list({open({{"client", ""}})}), 2, Why::sampledIn,
-       [](auto& f) { f.clientName = ""; }},
-      {"empty client list, client unknown", list({open({{"client", ""}})}), 1, Why::noSectionMatches, noClient},
-      {"client of a wrong type", list({open({{"client", Array{"Mail"}}})}), 1, Why::noSectionMatches, {}},
-      {"fragment of the service", list({open({{"service", "x,IMAP"}})}), 2, Why::sampledIn, {}},
-      {"fragment too long", list({open({{"service", "imap.service2"}})}), 1, Why::noSectionMatches, {}},
-      {"blank in the fragment", list({open({{"service", "x, imap"}})}), 1, Why::noSectionMatches, {}},
-      {"service unknown", list({open({{"service", "imap"}})}), 1, Why::noSectionMatches, noService},
-      {"any service, service unknown", list({open()}), 2, Why::sampledIn, noService},
-      {"empty fragment, service unknown", list({open({{"service", ""}})}), 1, Why::noSectionMatches, noService},
-      {"service of a wrong type", list({open({{"service", 1}})}), 1, Why::noSectionMatches, {}},
-      {"client fits, service does not",
-       list({open({{"client", "Mail"}, {"service", "pop"}})}),
-       1,
-       Why::noSectionMatches,
-       {}},
-      {"the first that matches decides",
-       list({open({{"client", "News"}}), open({{"sampling_threshold", 0.1}}), open()}),
-       3,
-       Why::held,
-       {}},
+      {"any client, client unknown", {}, sampledIn, noClient},
+      {"client without case", {{"client", "News,mAIL"}}, sampledIn},
+      {"client as a whole", {{"client", "Mai"}}, noSectionMatches},
+      {"blank before the name", {{"client", "News, Mail"}}, noSectionMatches},
+      {"blank before the client's own name", {{"client", "News, Mail"}}, sampledIn, blankClient},
+      {"client unknown", {{"client", "Mail"}}, noSectionMatches, noClient},
+      {"empty client list", {{"client", ""}}, noSectionMatches},
+      {"empty client list, empty client", {{"client", ""}}, sampledIn, emptyClient},
+      {"client of a wrong type", {{"client", Array{"Mail"}}}, noSectionMatches},
+      {"fragment of the service", {{"service", "x,IMAP"}}, sampledIn},
+      {"fragment too long", {{"service", "imap.service2"}}, noSectionMatches},
+      {"empty fragment, service unknown", {{"service", ""}}, noSectionMatches, noService},
+      {"service of a wrong type", {{"service", 1}}, noSectionMatches},
+      {"client fits, service does not", {{"client", "Mail"}, {"service", "pop"}}, noSectionMatches},
+      {"version equal", {{"enabledSince", "2.1.5"}}, sampledIn},
+      {"version a number", {{"enabledSince", 2.1}}, sampledIn},
+      {"last part of the version too high", {{"enabledSince", "2.1.6"}}, versionTooLow},
+      {"middle part decides", {{"enabledSince", "2.2.0"}}, versionTooLow},
+      {"eight bits each", {{"enabledSince", "258"}}, sampledIn},
+      {"version of a wrong type", {{"enabledSince", Array{"1"}}}, versionTooLow},
   });
 }
 
-TEST(ReportingDecision, VersionGate) {
+TEST(ReportingDecision, ConsentCountryDeviceAndFilters) {
   check({
-      {"equal", list({open({{"enabledSince", "2.1.5"}})}), 2, Why::sampledIn, {}},
-      {"lower", list({open({{"enabledSince", "2.0.9"}})}), 2, Why::sampledIn, {}},
-      {"two parts", list({open({{"enabledSince", "2.1"}})}), 2, Why::sampledIn, {}},
-      {"a number", list({open({{"enabledSince", 2.1}})}), 2, Why::sampledIn, {}},
-      {"last part too high", list({open({{"enabledSince", "2.1.6"}})}), 1, Why::versionTooLow, {}},
-      {"middle part decides", list({open({{"enabledSince", "2.2.0"}})}), 1, Why::versionTooLow, {}},
-      {"first part decides", list({open({{"enabledSince", "3"}})}), 1, Why::versionTooLow, {}},
-      {"eight bits each", list({open({{"enabledSince", "258"}})}), 2, Why::sampledIn, {}},
-      {"a wrong type", list({open({{"enabledSince", Array{"1"}}})}), 1, Why::versionTooLow, {}},
-      {"the next section", list({open({{"enabledSince", "3"}}), open()}), 2, Why::sampledIn, {}},
+      {"consent missing", {}, consentMissing, noConsent},
+      {"missing, override 0", {{"override_dnu", 0}}, consentMissing, noConsent},
+      {"missing, nearly overridden", {{"override_dnu", 1.5}}, consentMissing, noConsent},
+      {"missing, overridden", {{"override_dnu", 1}}, sampledIn, noConsent},
+      {"missing, overridden by true", {{"override_dnu", true}}, sampledIn, noConsent},
+      {"missing, override of a wrong type", {{"override_dnu", "1"}}, consentMissing, noConsent},
+      {"country fragment without case", {{"locale_whitelist", Array{"x", "d"}}}, sampledIn},
+      {"country not listed", {{"locale_whitelist", Array{"FR"}}}, countryNotListed},
+      {"no country list", {{"locale_whitelist", nullptr}}, countryNotListed},
+      {"empty country list", {{"locale_whitelist", Array{}}}, countryNotListed},
+      {"country unknown", {{"locale_whitelist", Array{"FR"}}}, sampledIn, noCountry},
+      {"country unknown, empty list", {{"locale_whitelist", Array{}}}, countryNotListed, noCountry},
+      {"family listed", {{"device_whitelist", Array{"arv"}}}, sampledIn},
+      {"family not listed", {{"device_whitelist", Array{"Magna"}}}, familyNotListed},
+      {"empty family list", {{"device_whitelist", Array{}}}, sampledIn},
+      {"model blacklisted", {{"device_blacklist", Array{"abc"}}}, modelBlacklisted},
+      {"model not blacklisted", {{"device_blacklist", Array{"abd"}}}, sampledIn},
+      {"empty blacklist", {{"device_blacklist", Array{}}}, sampledIn},
+      {"model unknown", {{"device_blacklist", Array{"abd"}}}, modelBlacklisted, noModel},
+      {"model unknown, empty blacklist", {{"device_blacklist", Array{}}}, sampledIn, noModel},
+      {"no filters", {{"filters", nullptr}}, filtersMissing},
+      {"empty filters", {{"filters", Array{}}}, sampledIn},
+      // Which test comes before which.
+      {"consent, country", {{"locale_whitelist", Array{}}}, consentMissing, noConsent},
+      {"country, family", {{"locale_whitelist", Array{}}, {"device_whitelist", Array{"Magna"}}}, countryNotListed},
+      {"family, model", {{"device_whitelist", Array{"x"}}, {"device_blacklist", Array{"abc"}}}, familyNotListed},
+      {"model, filters", {{"device_blacklist", Array{"abc"}}, {"filters", nullptr}}, modelBlacklisted},
+      {"filters, sampling", {{"filters", nullptr}, {"sampling_threshold", nullptr}}, filtersMissing},
   });
-  const auto decision = evaluate({{"clients", list({{{"client", "x"}}, open({{"enabledSince", "3.1"}})})}}, facts());
-  EXPECT_EQ(decision.reason.section, 1U);
-  EXPECT_EQ(decision.reason.subject, "3.1");
-  const auto later = evaluate({{"clients", list({open({{"enabledSince", "3"}}), open()})}}, facts());
-  EXPECT_EQ(later.reason.section, 1U);
-}
-
-TEST(ReportingDecision, Consent) {
-  check({
-      {"given", list({open({{"override_dnu", 0}})}), 2, Why::sampledIn, {}},
-      {"missing", list({open()}), 1, Why::consentMissing, noConsent},
-      {"missing, override 0", list({open({{"override_dnu", 0}})}), 1, Why::consentMissing, noConsent},
-      {"missing, override 2", list({open({{"override_dnu", 2}})}), 1, Why::consentMissing, noConsent},
-      {"missing, overridden", list({open({{"override_dnu", 1}})}), 2, Why::sampledIn, noConsent},
-      {"missing, overridden by true", list({open({{"override_dnu", true}})}), 2, Why::sampledIn, noConsent},
-      {"missing, override of a wrong type", list({open({{"override_dnu", "1"}})}), 1, Why::consentMissing, noConsent},
-  });
-  const auto type = [](Dictionary section, bool consent) {
-    ReportingFacts given = facts();
-    given.consent = consent;
-    return evaluate({{"clients", list({open(std::move(section))})}}, given).settings.dnuType;
+  const auto typeOf = [](const Dictionary& more, const Change& change) {
+    return decide({open(more)}, change).settings.dnuType;
   };
-  EXPECT_EQ(type({{"override_dnu", 1}}, true), 2);
-  EXPECT_EQ(type({{"override_dnu", 1}}, false), 1);
-  EXPECT_EQ(type({{"override_dnu", 1}, {"locale_whitelist", Array{"FR"}}}, false), 1);
-  EXPECT_EQ(type({}, true), 0);
-  EXPECT_EQ(type({}, false), 0);
-}
-
-TEST(ReportingDecision, CountryAndDevice) {
-  check({
-      {"country fragment without case", list({open({{"locale_whitelist", Array{"x", "d"}}})}), 2, Why::sampledIn, {}},
-      {"country not listed", list({open({{"locale_whitelist", Array{"FR"}}})}), 1, Why::countryNotListed, {}},
-      {"no country list", list({without(open(), "locale_whitelist")}), 1, Why::countryNotListed, {}},
-      {"empty country list", list({open({{"locale_whitelist", Array{}}})}), 1, Why::countryNotListed, {}},
-      {"country unknown", list({open({{"locale_whitelist", Array{"FR"}}})}), 2, Why::sampledIn, noCountry},
-      {"country unknown, empty list", list({open({{"locale_whitelist", Array{}}})}), 1, Why::countryNotListed,
-       noCountry},
-      {"family listed", list({open({{"device_whitelist", Array{"arv"}}})}), 2, Why::sampledIn, {}},
-      {"family not listed", list({open({{"device_whitelist", Array{"Magna"}}})}), 1, Why::familyNotListed, {}},
-      {"empty family list", list({open({{"device_whitelist", Array{}}})}), 2, Why::sampledIn, {}},
-      {"model blacklisted", list({open({{"device_blacklist", Array{"abc"}}})}), 1, Why::modelBlacklisted, {}},
-      {"model not blacklisted", list({open({{"device_blacklist", Array{"abd"}}})}), 2, Why::sampledIn, {}},
-      {"empty blacklist", list({open({{"device_blacklist", Array{}}})}), 2, Why::sampledIn, {}},
-      {"model unknown", list({open({{"device_blacklist", Array{"abd"}}})}), 1, Why::modelBlacklisted, noModel},
-      {"model unknown, empty blacklist", list({open({{"device_blacklist", Array{}}})}), 2, Why::sampledIn, noModel},
-      {"model unknown, no blacklist", list({open()}), 2, Why::sampledIn, noModel},
-      {"no filters", list({without(open(), "filters")}), 1, Why::filtersMissing, {}},
-      {"empty filters", list({open({{"filters", Array{}}})}), 2, Why::sampledIn, {}},
-      {"consent is asked before the country", list({open({{"locale_whitelist", Array{}}})}), 1, Why::consentMissing,
-       noConsent},
-      {"the country before the family",
-       list({open({{"locale_whitelist", Array{}}, {"device_whitelist", Array{"Magna"}}})}),
-       1,
-       Why::countryNotListed,
-       {}},
-      {"the family before the model",
-       list({open({{"device_whitelist", Array{"Magna"}}, {"device_blacklist", Array{"abc"}}})}),
-       1,
-       Why::familyNotListed,
-       {}},
-      {"the model before the filters",
-       list({without(open({{"device_blacklist", Array{"abc"}}}), "filters")}),
-       1,
-       Why::modelBlacklisted,
-       {}},
-  });
+  EXPECT_EQ(typeOf({{"override_dnu", 1}}, {}), 2);
+  EXPECT_EQ(typeOf({{"override_dnu", 1}, {"locale_whitelist", Array{"FR"}}}, noConsent), 1);
+  EXPECT_EQ(typeOf({}, {}), 0);
+  EXPECT_EQ(typeOf({}, noConsent), 0);
 }
 
 TEST(ReportingDecision, Sampling) {
-  const Dictionary country{{"country", Array{"DE", "AT"}}, {"threshold", 0.5}};
-  const Array byCountry{Value(Dictionary{{"country", Array{"FR"}}, {"threshold", 0}}), Value(country),
-                        Value(Dictionary{{"country", Array{"DE"}}, {"threshold", 0}})};
+  const Array byCountry{Dictionary{{"country", Array{"FR"}}, {"threshold", 0}},
+                        Dictionary{{"country", Array{"DE", "AT"}}, {"threshold", 0.5}},
+                        Dictionary{{"country", Array{"DE"}}, {"threshold", 0}}};
+  const Dictionary perCountry{{"per_country_sampling_thresholds", byCountry}};
+  const Dictionary noCountrysThreshold{
+      {"per_country_sampling_thresholds", Array{Dictionary{{"country", Array{"DE"}}}}}};
+  const Dictionary noThresholdsCountry{{"per_country_sampling_thresholds", Array{Dictionary{{"threshold", 0}}}}};
+  const Change smallLetters = [](auto& facts) {
+    facts.samplingFactor = 0.4;
+    facts.countryCode = "de";
+  };
+  const Change nowhere = [](auto& facts) {
+    facts.samplingFactor = 0.4;
+    facts.countryCode.reset();
+  };
   check({
-      {"no threshold", list({without(open(), "sampling_threshold")}), 1, Why::noSamplingThreshold, {}},
-      {"NaN",
-       list({open({{"sampling_threshold", std::numeric_limits<double>::quiet_NaN()}})}),
-       1,
-       Why::noSamplingThreshold,
-       {}},
-      {"below", list({open()}), 2, Why::sampledIn, draw(0.2)},
-      {"exactly", list({open()}), 2, Why::sampledIn, draw(0.25)},
-      {"just above", list({open()}), 3, Why::held, draw(std::nextafter(0.25, 1.0))},
-      {"above, no override", list({open()}), 3, Why::held, draw(0.3)},
-      {"within the override", list({open({{"override_sampling", 0.4}})}), 3, Why::held, draw(0.3)},
-      {"exactly the override", list({open({{"override_sampling", 0.3}})}), 3, Why::held, draw(0.3)},
-      {"above the override", list({open({{"override_sampling", 0.2}})}), 1, Why::sampledOut, draw(0.3)},
-      {"threshold 0, draw 0", list({open({{"sampling_threshold", 0}})}), 2, Why::sampledIn, draw(0)},
-      {"threshold as text", list({open({{"sampling_threshold", "0.25"}})}), 2, Why::sampledIn, {}},
-      {"the first entry for the country", list({open({{"per_country_sampling_thresholds", byCountry}})}), 2,
-       Why::sampledIn, draw(0.4)},
-      {"country codes are exact", list({open({{"per_country_sampling_thresholds", byCountry}})}), 3, Why::held,
-       [](auto& f) {
-         f.samplingFactor = 0.4;
-         f.countryCode = "de";
-       }},
-      {"country unknown", list({open({{"per_country_sampling_thresholds", byCountry}})}), 3, Why::held,
-       [](auto& f) {
-         f.samplingFactor = 0.4;
-         f.countryCode.reset();
-       }},
-      {"a country without a threshold",
-       list({open({{"per_country_sampling_thresholds", Array{Value(Dictionary{{"country", Array{"DE"}}})}}})}),
-       1,
-       Why::noSamplingThreshold,
-       {}},
-      {"an entry for no country",
-       list({open({{"per_country_sampling_thresholds", Array{Value(Dictionary{{"threshold", 0}})}}})}),
-       2,
-       Why::sampledIn,
-       {}},
+      {"no threshold", {{"sampling_threshold", nullptr}}, noSamplingThreshold},
+      {"NaN", {{"sampling_threshold", std::numeric_limits<double>::quiet_NaN()}}, noSamplingThreshold},
+      {"exactly", {}, sampledIn, draw(0.25)},
+      {"just above", {}, held, draw(std::nextafter(0.25, 1.0))},
+      {"within the override", {{"override_sampling", 0.4}}, held, draw(0.3)},
+      {"exactly the override", {{"override_sampling", 0.3}}, held, draw(0.3)},
+      {"above the override", {{"override_sampling", 0.2}}, sampledOut, draw(0.3)},
+      {"threshold 0, draw 0", {{"sampling_threshold", 0}}, sampledIn, draw(0)},
+      {"threshold as text", {{"sampling_threshold", "0.25"}}, sampledIn},
+      {"the first entry for the country", perCountry, sampledIn, draw(0.4)},
+      {"country codes are exact", perCountry, held, smallLetters},
+      {"country unknown", perCountry, held, nowhere},
+      {"a country without a threshold", noCountrysThreshold, noSamplingThreshold},
+      {"an entry for no country", noThresholdsCountry, sampledIn},
   });
 }
 
@@ -270,109 +217,104 @@ TEST(ReportingDecision, MalformedSectionsReportNothing) {
       {"device_blacklist", Array{nullptr}},
       {"filters", "remove everything"},
       {"filters", Array{"userName"}},
-      {"filters", Array{Value(Dictionary{{"key", 7}})}},
+      {"filters", Array{Dictionary{{"key", 7}}}},
       {"sampling_threshold", Array{1}},
       {"override_sampling", Dictionary{}},
       {"per_country_sampling_thresholds", 0.5},
       {"per_country_sampling_thresholds", Array{0.5}},
-      {"per_country_sampling_thresholds", Array{Value(Dictionary{{"country", "DE"}})}},
-      {"per_country_sampling_thresholds", Array{Value(Dictionary{{"threshold", Array{}}})}},
+      {"per_country_sampling_thresholds", Array{Dictionary{{"country", "DE"}}}},
+      {"per_country_sampling_thresholds", Array{Dictionary{{"threshold", Array{}}}}},
       {"event_whitelist", 3},
       {"event_blacklist", Array{Value(Array{})}},
   };
   for (const auto& [key, value] : rows) {
-    const ReportingDecision decision = evaluate({{"clients", list({open({{key, value}})})}}, facts());
-    EXPECT_EQ(decision.state, 1) << key;
-    EXPECT_EQ(decision.reason.test, Why::malformedSection) << key << ": " << describe(decision.reason);
+    const auto decision = decide({open({{key, value}})});
+    check(key, decision, malformedSection);
     EXPECT_EQ(decision.reason.subject, key);
-    EXPECT_NE(describe(decision.reason).find(key), std::string::npos);
   }
 }
 
-TEST(ReportingDecision, ReasonsCarryTheirOperands) {
-  const auto reasonOf = [](Dictionary section, const std::function<void(ReportingFacts&)>& change) {
-    ReportingFacts given = facts();
-    if (change) change(given);
-    return describe(evaluate({{"clients", list({{{"client", "x"}}, std::move(section)})}}, given).reason);
+TEST(ReportingDecision, RefusalsSayWhatTheyLookedAt) {
+  const Array two{"FR", "AT"};
+  const std::string list = Value(two).description();
+  const struct {
+    Dictionary more;
+    std::string reason;
+    Change change = {};
+  } rows[] = {
+      {{{"client", "y"}}, "no client section matches."},
+      {{}, "waiting for user info.", noUserInfo},
+      {{{"enabledSince", "9.9"}}, "client section 1 is enabled since version 9.9."},
+      {{{"device_whitelist", 5}}, "client section 1 is malformed: \"device_whitelist\" is no list."},
+      {{{"override_dnu", 3}}, "reporting disabled by DNU: 3.", noConsent},
+      {{{"locale_whitelist", two}}, "(DE) isn't in country code list " + list},
+      {{{"locale_whitelist", nullptr}}, "((null)) isn't in country code list (null)", noCountry},
+      {{{"device_whitelist", two}}, "(Parva) isn't in device whitelist " + list},
+      {{{"device_blacklist", two}}, "((null)) is in device blacklist " + list, noModel},
+      {{{"filters", nullptr}}, "filters are required."},
+      {{{"sampling_threshold", nullptr}}, "there is no sampling threshold."},
+      {{}, "sampling factor 0.500000 is above the threshold 0.250000; events are held.", draw(0.5)},
+      {{{"override_sampling", 0.3}},
+       "sampling factor 0.500000 is above the thresholds 0.250000 and 0.300000.",
+       draw(0.5)},
   };
-  const std::string list = Value(Array{"FR", "AT"}).description();
-  EXPECT_EQ(reasonOf(open({{"locale_whitelist", Array{"FR", "AT"}}}), {}), "(DE) isn't in country code list " + list);
-  EXPECT_EQ(reasonOf(without(open(), "locale_whitelist"), noCountry), "((null)) isn't in country code list (null)");
-  EXPECT_EQ(reasonOf(open({{"device_whitelist", Array{"FR", "AT"}}}), {}), "(Parva) isn't in device whitelist " + list);
-  EXPECT_EQ(reasonOf(open({{"device_blacklist", Array{"FR", "AT"}}}), noModel),
-            "((null)) is in device blacklist " + list);
-  EXPECT_EQ(reasonOf(open({{"override_dnu", 3}}), noConsent), "reporting disabled by DNU: 3.");
-  EXPECT_EQ(reasonOf(without(open(), "filters"), {}), "filters are required.");
-  EXPECT_EQ(reasonOf(open({{"override_sampling", 0.3}}), draw(0.5)),
-            "sampling factor 0.500000 is above the thresholds 0.250000 and 0.300000.");
-  EXPECT_EQ(reasonOf(open({{"enabledSince", "9.9"}}), {}), "client section 1 is enabled since version 9.9.");
-  EXPECT_EQ(reasonOf(open({{"device_whitelist", 5}}), {}),
-            "client section 1 is malformed: \"device_whitelist\" is no list.");
+  for (const auto& row : rows) {
+    EXPECT_EQ(describe(decide({Dictionary{{"client", "x"}}, open(row.more)}, row.change).reason), row.reason);
+  }
 }
 
 TEST(ReportingDecision, Expedite) {
-  const auto batch = [](Array clients, const std::function<void(ReportingFacts&)>& change = {}) {
-    ReportingFacts given = facts();
-    if (change) change(given);
-    return evaluate({{"clients", std::move(clients)}}, given).settings.batchEvents;
+  const struct {
+    Array clients;
+    std::optional<bool> batches;
+    Change change = {};
+  } rows[] = {
+      {{open({{"expedite", 1}})}, false},
+      {{open({{"expedite", 0}})}, true},
+      {{open({{"expedite", "0"}})}, true},
+      {{open({{"expedite", Array{}}})}, std::nullopt},
+      {{open(), open({{"expedite", 1}})}, std::nullopt},  // the first match decides
+      {{open({{"client", "x"}, {"expedite", 1}}), open({{"expedite", 0}})}, true},
+      // It is taken by sections too new for this version, by refused ones, and before user info is there.
+      {{open({{"enabledSince", "9"}, {"expedite", 1}})}, false},
+      {{open({{"expedite", 1}})}, false, noConsent},
+      {{open({{"expedite", 1}})}, false, noUserInfo},
+      {{open({{"expedite", 1}})}, false, notRequired},
   };
-  EXPECT_EQ(batch(list({open({{"expedite", 1}})})), false);
-  EXPECT_EQ(batch(list({open({{"expedite", 0}})})), true);
-  EXPECT_EQ(batch(list({open({{"expedite", "0"}})})), true);
-  EXPECT_EQ(batch(list({open({{"expedite", Array{}}})})), std::nullopt);
-  EXPECT_EQ(batch(list({open(), open({{"expedite", 1}})})), std::nullopt) << "the first match decides";
-  EXPECT_EQ(batch(list({open({{"client", "x"}, {"expedite", 1}}), open({{"expedite", 0}})})), true);
-  // It is taken by sections too new for this version, by refused ones, and before user info is there.
-  EXPECT_EQ(batch(list({open({{"enabledSince", "9"}, {"expedite", 1}})})), false);
-  EXPECT_EQ(batch(list({open({{"expedite", 1}})}), noConsent), false);
-  EXPECT_EQ(batch(list({open({{"expedite", 1}})}), [](auto& f) { f.hasUserInfo = false; }), false);
-  EXPECT_EQ(batch(list({open({{"expedite", 1}})}), [](auto& f) { f.requireUserInfo = false; }), false);
+  for (const auto& row : rows) {
+    EXPECT_EQ(decide(row.clients, row.change).settings.batchEvents, row.batches) << Value(row.clients).description();
+  }
 }
 
 TEST(ReportingDecision, SettingsWithoutRequiredUserInfo) {
-  ReportingFacts given = facts();
-  given.requireUserInfo = false;
-  const Array clients = list({{{"realtime_post_url", "r0"}},
-                              {{"post_url", "p1"}, {"event_threshold", 7}, {"extras_on_internal", 1}},
-                              {{"post_url", "p2"}}});
-  const Dictionary profile{{"clients", clients}};
-  const auto first = evaluate(profile, given).settings;
+  const Array clients{Dictionary{{"realtime_post_url", "r0"}},
+                      Dictionary{{"post_url", "p1"}, {"event_threshold", 7}, {"extras_on_internal", 1}},
+                      Dictionary{{"post_url", "p2"}}};
+  const auto first = decide(clients, notRequired).settings;
   EXPECT_EQ(first.linkSections.size(), 2U);
   EXPECT_EQ(first.counters->eventThreshold, 7);
   EXPECT_EQ(first.counters->extrasOnInternal, 1);
   EXPECT_FALSE(first.dnuType || first.filters || first.sampling || first.eventWhitelist);
-
-  given.postURLFixed = true;
-  const auto fixed = evaluate(profile, given).settings;
+  const Change fixedURL = [](auto& facts) {
+    notRequired(facts);
+    facts.postURLFixed = true;
+  };
+  const auto fixed = decide(clients, fixedURL).settings;
   EXPECT_EQ(fixed.linkSections.size(), 3U);
   EXPECT_EQ(fixed.counters->eventThreshold, 0);
 }
 
-TEST(ReportingDecision, SettingsOfARefusedSection) {
-  ReportingFacts given = facts();
-  given.countryCode = "FR";
-  const auto settings =
-      evaluate({{"clients", list({open({{"post_url", "p"}, {"event_blacklist", Array{1}}})})}}, given).settings;
-  EXPECT_EQ(settings.dnuType, 0);
-  EXPECT_TRUE(settings.linkSections.empty());
-  EXPECT_FALSE(settings.filters || settings.sampling || settings.counters || settings.eventBlacklist ||
-               settings.customClientID);
-}
-
 TEST(ReportingDecision, SettingsOfAChosenSection) {
-  ReportingFacts given = facts();
-  given.samplingFactor = 0.9;
-  const Array byCountry{Value(Dictionary{{"country", Array{"DE"}}, {"threshold", 0.5}})};
-  const Dictionary section = open({{"event_threshold", "12"},
-                                   {"extras_on_internal", 2.9},
-                                   {"custom_clientId", ""},
-                                   {"override_sampling", 0.7},
-                                   {"per_country_sampling_thresholds", byCountry},
-                                   {"event_whitelist", Array{3, "12"}},
-                                   {"event_blacklist", Array{}}});
-  const auto decision = evaluate({{"clients", list({section})}}, given);
-  // Sampled out, and yet everything is taken.
-  EXPECT_EQ(decision.state, 1);
+  const Dictionary section =
+      open({{"event_threshold", "12"},
+            {"extras_on_internal", 2.9},
+            {"custom_clientId", ""},
+            {"override_sampling", 0.7},
+            {"per_country_sampling_thresholds", Array{Dictionary{{"country", Array{"DE"}}, {"threshold", 0.5}}}},
+            {"event_whitelist", Array{3, "12"}},
+            {"event_blacklist", Array{}}});
+  const auto decision = decide({section}, draw(0.9));
+  EXPECT_EQ(decision.state, 1) << "sampled out, and yet everything is taken";
   const auto& settings = decision.settings;
   EXPECT_EQ(settings.filters->table().size(), 1U);
   EXPECT_EQ(settings.sampling->threshold, 0.5);
@@ -385,11 +327,14 @@ TEST(ReportingDecision, SettingsOfAChosenSection) {
   EXPECT_EQ(settings.linkSections.size(), 1U);
   EXPECT_EQ(settings.eventWhitelist->categories, (std::vector<std::int32_t>{3, 12}));
   EXPECT_TRUE(settings.eventBlacklist->categories.empty());
+  EXPECT_FALSE(decide({section}, draw(0.1)).settings.overrideSampling) << "left as it was";
+  EXPECT_FALSE(decide({open({{"filters", Array{}}})}).settings.filters) << "an empty list keeps the earlier filters";
 
-  given.samplingFactor = 0.1;
-  EXPECT_FALSE(evaluate({{"clients", list({section})}}, given).settings.overrideSampling) << "left as it was";
-  EXPECT_FALSE(evaluate({{"clients", list({open({{"filters", Array{}}})})}}, given).settings.filters)
-      << "an empty list keeps the earlier filters";
+  const auto refused = decide({section}, [](auto& facts) { facts.countryCode = "FR"; }).settings;
+  EXPECT_EQ(refused.dnuType, 0);
+  EXPECT_TRUE(refused.linkSections.empty());
+  EXPECT_FALSE(refused.filters || refused.sampling || refused.counters || refused.eventBlacklist ||
+               refused.customClientID);
 }
 
 }  // namespace
