@@ -2,7 +2,6 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <filesystem>
 #include <future>
 #include <random>
 #include <thread>
@@ -16,27 +15,34 @@
 namespace orvanta::test {
 namespace {
 
-SharedDictionary httpsStorebag() {
-  return shared(Dictionary{{"http_post", Dictionary{{"clients", Array{Dictionary{{"post_url", "http://127.0.0.1/post"},
-                                                                                 {"event_threshold", 5}}}}}}});
-}
+class ConcurrentSessionsTest : public SessionFixture {
+ protected:
+  ConcurrentSessionsTest() {
+    const Dictionary client{{"post_url", "http://127.0.0.1/post"}, {"event_threshold", 5}};
+    storebag = shared({{"http_post", Dictionary{{"clients", Array{client}}}}});
+    platform::setLogLevel(platform::LogLevel::error);
+  }
+};
 
 // The agent's storebag server keeps silent until the test has had enough.
-class SilentServerTest : public ::testing::Test {
- protected:
+class SilentServerTest : public ConcurrentSessionsTest {
+ public:
   ~SilentServerTest() override {
     release();
     _waiting.wait();
     device.get().pool().drain(kHangGuard);
   }
+
+ protected:
   // A session that holds the agent's lock from now on, waiting for its storebag.
   void beginFetch() {
-    _fetching = OrvantadSession::create(device, agent, nullptr);
-    _fetching->setSessionInfo(shared(Dictionary{{"sessionID", 1}, {"clientType", 5}}), nullptr, nullptr, false, {});
-    _waiting = std::async(std::launch::async, [this] {
-      _fetching->startConfigWithCompletionHandler({});
-      _fetching->end();
-    });
+    whileFetching = [this] {
+      _asked.add();
+      _release.waitFor(1);
+    };
+    const auto fetching = makeSession();
+    configure(*fetching, 1);
+    _waiting = std::async(std::launch::async, [this, fetching] { start(*fetching); });
     ASSERT_TRUE(_asked.waitFor(1));
   }
   // Whether the step comes to its end though the fetch does not.
@@ -49,58 +55,56 @@ class SilentServerTest : public ::testing::Test {
   }
   void release() { _release.add(); }
 
-  LogCapture log{platform::LogLevel::error};
-  TestPlatform device;
-  OrvantadAgent agent{device, [this](std::int32_t, StorebagFetch&) {
-                        _asked.add();
-                        _release.waitFor(1);
-                        return httpsStorebag();
-                      }};
-
  private:
-  Counter _asked;
-  Counter _release;
-  std::shared_ptr<OrvantadSession> _fetching;
+  Counter _asked, _release;
   std::future<void> _waiting;
 };
 
-TEST_F(SilentServerTest, AdmissionAndSessionsOutsideGroupsDoNotWaitForIt) {
-  std::filesystem::create_directory(device.directory / "etc/entitlements.d");
+// Remembers whom it was given, and plays the peer that comes and goes.
+struct Peer final : public RecordingConnection {
+  using RecordingConnection::RecordingConnection;
+  void resume(std::shared_ptr<platform::ConnectionDelegate> given) override { delegate = std::move(given); }
+  void call(const char* method, Array params) const {
+    platform::Frame frame;
+    frame.kind = platform::Frame::Kind::request;
+    frame.method = method;
+    frame.params = std::move(params);
+    delegate->received(std::move(frame));
+  }
+  std::shared_ptr<platform::ConnectionDelegate> delegate;
+};
+
+TEST_F(SilentServerTest, OnlySessionsWithSomebodyAboveWaitForIt) {
+  maxAge = 0;
   device.directory.write("etc/entitlements.d/all.plist",
                          *platform::writeXmlPropertyList(
                              Dictionary{{"user", std::to_string(::getuid())},
                                         {"entitlements", Dictionary{{std::string(kOrvantaEntitlement), true}}}}));
-  const auto related = OrvantadSession::create(device, agent, nullptr);
-  related->setSessionInfo(
-      shared(Dictionary{{"sessionID", 4}, {"hierarchyToken", Dictionary{{"tokenID", "t"}, {"level", 0}}}}), nullptr,
-      nullptr, false, {});
+  const auto related = makeSession();
+  configure(*related, 4, hierarchy("t", 0));
+  // An aggregating root, a session below it without user info, and one outside all groups.
+  std::vector<std::shared_ptr<OrvantadSession>> free;
+  for (std::uint32_t i = 0; i < 3; ++i) {
+    free.push_back(makeSession());
+    configure(*free[i], 5 + i, i < 2 ? hierarchy("u", i) : Dictionary(),
+              i == 0 ? shared({{"clientName", "c"}, {"serviceName", "s"}}) : nullptr, i == 0);
+    start(*free[i]);
+  }
+  const auto rootClient = connections[connections.size() - 3];
   beginFetch();
-  // One that is in a group waits for the agent, but with no other lock in its hands.
-  const auto leaving = std::async(std::launch::async, [&] {
-    agent.invalidated(related);
-    related->end();
-  });
-  // Remembers whom it was given, and plays the peer that comes and goes.
-  struct Peer final : public RecordingConnection {
-    using RecordingConnection::RecordingConnection;
-    void resume(std::shared_ptr<platform::ConnectionDelegate> given) override { delegate = std::move(given); }
-    std::shared_ptr<platform::ConnectionDelegate> delegate;
-  };
+  // One that leaves a group waits for the agent, but with no other lock in its hands.
+  const auto leaving = std::async(std::launch::async, [&] { leave(related); });
+  EXPECT_TRUE(passes([&] {
+    for (const auto& session : free) send(*session, {{"category", 5}, {"type", 9}});
+  }));
+  EXPECT_EQ(rootClient->aggregated().back().type, 9);
   EXPECT_TRUE(passes([this] {
     const auto peer = std::make_shared<Peer>(device.get().pool());
     platform::PeerIdentity identity;
     identity.uid = ::getuid();
     EXPECT_TRUE(agent.listenerShouldAcceptNewConnection({peer, identity}));
-    platform::Frame call;
-    call.kind = platform::Frame::Kind::request;
-    call.method = "setSessionInfo";
-    call.params = Array{Dictionary{{"sessionID", 2}, {"clientType", 7}}, nullptr, nullptr, true};
-    peer->delegate->received(std::move(call));
-    call = {};
-    call.kind = platform::Frame::Kind::request;
-    call.method = "sendMessageWithDictionary";
-    call.params = Array{Dictionary{{"category", 1}, {"type", 2}}};
-    peer->delegate->received(std::move(call));
+    peer->call("setSessionInfo", {Dictionary{{"sessionID", 2}, {"clientType", 7}}, nullptr, nullptr, true});
+    peer->call("sendMessageWithDictionary", {Dictionary{{"category", 1}, {"type", 2}}});
     std::exchange(peer->delegate, nullptr)->invalidated(std::nullopt);
   }));
   EXPECT_TRUE(passes([this] { EXPECT_EQ(agent.sessionCount(), 0U); }));
@@ -110,16 +114,11 @@ TEST_F(SilentServerTest, AdmissionAndSessionsOutsideGroupsDoNotWaitForIt) {
 TEST_F(SilentServerTest, SessionsThatWaitForTheAgentLeaveTheThreadsOfThePoolToOthers) {
   beginFetch();
   Counter waiting;
-  std::vector<std::shared_ptr<OrvantadSession>> sessions;
   for (std::uint32_t i = 0; i < 8; ++i) {
-    sessions.push_back(OrvantadSession::create(device, agent, nullptr));
-    device.get().pool().post([&, session = sessions.back()] {
+    device.get().pool().post([&, session = makeSession()] {
       waiting.add();
-      session->setSessionInfo(
-          shared(Dictionary{{"sessionID", 3}, {"hierarchyToken", Dictionary{{"tokenID", "t"}, {"level", 0}}}}), nullptr,
-          nullptr, false, {});
-      agent.invalidated(session);
-      session->end();
+      configure(*session, 3, hierarchy("t", 0));
+      leave(session);
     });
   }
   EXPECT_TRUE(passes([&] {
@@ -130,14 +129,14 @@ TEST_F(SilentServerTest, SessionsThatWaitForTheAgentLeaveTheThreadsOfThePoolToOt
   }));
 }
 
-// Sessions of one group, each on a thread of its own: they change places, configure, send, aggregate and leave.
-class RelatedSessionsStressTest : public SessionFixture {};
+std::ptrdiff_t endNotices(const std::vector<AggregatedEvent>& events) {
+  return std::count_if(events.begin(), events.end(), [](const auto& event) { return event.isEndNotice(); });
+}
 
-TEST_F(RelatedSessionsStressTest, EverythingAtOnce) {
-  storebag = httpsStorebag();
-  platform::setLogLevel(platform::LogLevel::error);
-  const SharedDictionary users[] = {shared(Dictionary{{"clientName", "a"}, {"serviceName", "s"}}),
-                                    shared(Dictionary{{"clientName", "b"}, {"serviceName", "s"}})};
+// Sessions of one group, each on a thread of its own: they change places, configure, send, aggregate and leave.
+TEST_F(ConcurrentSessionsTest, EverythingAtOnce) {
+  const SharedDictionary users[] = {shared({{"clientName", "a"}, {"serviceName", "s"}}),
+                                    shared({{"clientName", "b"}, {"serviceName", "s"}})};
   constexpr std::uint32_t kAggregating = 2;
   for (int round = 0; round < 5; ++round) {
     std::vector<std::shared_ptr<OrvantadSession>> sessions;
@@ -164,16 +163,14 @@ TEST_F(RelatedSessionsStressTest, EverythingAtOnce) {
     for (auto& thread : threads) thread.join();
     for (std::size_t i = first; i < connections.size(); ++i) {
       const auto events = connections[i]->aggregated();
-      const auto notices = std::count_if(events.begin(), events.end(), [](auto& e) { return e.isEndNotice(); });
-      EXPECT_EQ(notices, i - first < kAggregating ? 1 : 0);
+      EXPECT_EQ(endNotices(events), i - first < kAggregating ? 1 : 0);
       EXPECT_TRUE(events.empty() || events.back().isEndNotice()) << "an event followed the end notice";
     }
   }
 }
 
 // The test's own threads meet in the leaf lock only: an event and the end of aggregation.
-TEST_F(RelatedSessionsStressTest, NoEventFollowsTheEndOfAggregationAndItIsToldOnce) {
-  platform::setLogLevel(platform::LogLevel::error);
+TEST_F(ConcurrentSessionsTest, NoEventFollowsTheEndOfAggregationAndItIsToldOnce) {
   for (int round = 0; round < 200; ++round) {
     const auto session = makeSession();
     configure(*session, 1, {}, nullptr, true);
@@ -191,21 +188,19 @@ TEST_F(RelatedSessionsStressTest, NoEventFollowsTheEndOfAggregationAndItIsToldOn
     }
     for (auto& thread : threads) thread.join();
     const auto events = connections.back()->aggregated();
-    ASSERT_FALSE(events.empty());
+    ASSERT_EQ(endNotices(events), 1) << round;
     ASSERT_TRUE(events.back().isEndNotice()) << round;
-    ASSERT_EQ(std::count_if(events.begin(), events.end(), [](auto& e) { return e.isEndNotice(); }), 1) << round;
     leave(session);
   }
 }
 
-TEST_F(RelatedSessionsStressTest, AFlushOnItsWayKeepsNoSessionAliveAndIsStillAnswered) {
-  storebag = httpsStorebag();
+TEST_F(ConcurrentSessionsTest, AFlushOnItsWayKeepsNoSessionAliveAndIsStillAnswered) {
   device.http.hold = true;
   auto session = OrvantadSession::create(device, agent, nullptr);
   const std::weak_ptr<OrvantadSession> watch = session;
   configure(*session, 1, {{"batchEvent", true}});
   start(*session);
-  Kept<std::optional<std::string>, std::optional<OrvantaError>> kept;
+  KeptFlush kept;
   session->flushMessagesWithCompletion(kept.reply());
   leave(session);
   session.reset();

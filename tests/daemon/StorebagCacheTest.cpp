@@ -12,9 +12,6 @@ using platform::Dictionary;
 
 class StorebagCacheTest : public ::testing::Test {
  protected:
-  static platform::SharedDictionary bag(const char* name) {
-    return std::make_shared<const Dictionary>(Dictionary{{name, Dictionary{}}});
-  }
   std::string ask(std::int32_t clientType = 5) {
     const auto found = cache.storebag(clientType);
     return found ? found->begin()->first : "none";
@@ -24,15 +21,18 @@ class StorebagCacheTest : public ::testing::Test {
   TestClock clock;
   int fetches = 0;
   std::optional<std::string> sentStamp;
-  std::function<platform::SharedDictionary(StorebagFetch&)> server = [](StorebagFetch& fetch) {
-    fetch.maxAge = 100;
-    fetch.version = "v1";
-    return bag("first");
-  };
-  StorebagCache cache{clock, [this](std::int32_t, StorebagFetch& fetch) {
+  // What the server gives: a bag called "first", no news, or nothing.
+  enum { good, notModified, failure } answer = good;
+  int maxAge = 100;
+  StorebagCache cache{clock, [this](std::int32_t, StorebagFetch& fetch) -> platform::SharedDictionary {
                         ++fetches;
                         sentStamp = fetch.lastModified;
-                        return server(fetch);
+                        fetch.maxAge = maxAge;
+                        fetch.notModified = answer == notModified;
+                        if (answer != good) return nullptr;
+                        fetch.version = "v1";
+                        fetch.lastModified = "Monday";
+                        return std::make_shared<const Dictionary>(Dictionary{{"first", Dictionary{}}});
                       }};
 };
 
@@ -40,30 +40,24 @@ TEST(StorebagFreshnessTest, FollowsTheTimingRules) {
   using enum StorebagFreshness;
   constexpr auto kGood = StorebagFetchState::successful;
   constexpr auto kBad = StorebagFetchState::failure;
-  const struct {
-    StorebagFetchState state;
-    double age;
-    int maxAge;
-    StorebagFreshness expected;
-  } rows[] = {
+  const std::tuple<StorebagFetchState, double, int, StorebagFreshness> rows[] = {
+      // state, age, maximum, result
       {kGood, 0, 100, fresh},      {kGood, 99.9, 100, fresh}, {kGood, 100, 100, expired}, {kGood, -99, 100, fresh},
       {kGood, -100, 100, expired}, {kGood, 0, 0, expired},    {kGood, 0, -5, expired},    {kGood, 5000, 100, expired},
       {kBad, 0, 100000, waiting},  {kBad, 899.9, 0, waiting}, {kBad, 900, 0, expired},    {kBad, 900, 100000, expired},
       {kBad, -899, 0, waiting},    {kBad, -901, 0, expired},
   };
-  for (const auto& row : rows) {
+  for (const auto& [state, age, maxAge, expected] : rows) {
     StorebagCacheEntry entry;
     entry.storebagFetchTime = 1000;
-    entry.storebagFetchState = row.state;
-    entry.storebagMaxAge = row.maxAge;
-    EXPECT_EQ(freshnessOf(entry, 1000 + row.age), row.expected) << row.age << " of " << row.maxAge;
+    entry.storebagFetchState = state;
+    entry.storebagMaxAge = maxAge;
+    EXPECT_EQ(freshnessOf(entry, 1000 + age), expected) << age << " of " << maxAge;
   }
 }
 
 TEST_F(StorebagCacheTest, ClientTypesOfOneStorebagShareOneFetchUntilItExpires) {
-  EXPECT_EQ(ask(7), "first");
-  EXPECT_EQ(ask(11), "first");
-  EXPECT_EQ(ask(13), "first");
+  for (const int clientType : {7, 11, 13}) EXPECT_EQ(ask(clientType), "first");
   EXPECT_EQ(fetches, 1);
   EXPECT_TRUE(log.contains("storebagForSession: Cached storebag found for client type 11"));
   EXPECT_EQ(ask(5), "first");
@@ -74,10 +68,7 @@ TEST_F(StorebagCacheTest, ClientTypesOfOneStorebagShareOneFetchUntilItExpires) {
 }
 
 TEST_F(StorebagCacheTest, WithoutAMaxAgeEveryRequestFetches) {
-  server = [](StorebagFetch& fetch) {
-    fetch.maxAge = 0;
-    return bag("b");
-  };
+  maxAge = 0;
   for (int i = 1; i <= 3; ++i) {
     ask();
     EXPECT_EQ(fetches, i);
@@ -87,10 +78,8 @@ TEST_F(StorebagCacheTest, WithoutAMaxAgeEveryRequestFetches) {
 TEST_F(StorebagCacheTest, AFailureKeepsTheLastGoodBagAndWaits900Seconds) {
   ask();
   clock.advance(100);
-  server = [](StorebagFetch& fetch) -> platform::SharedDictionary {
-    fetch.maxAge = 86400;
-    return nullptr;
-  };
+  answer = failure;
+  maxAge = 86400;
   EXPECT_EQ(ask(), "first");
   EXPECT_EQ(fetches, 2);
   EXPECT_TRUE(log.contains("<3>fetchAndCacheStorebag: Unable to fetch storebag for client type 5"));
@@ -107,7 +96,9 @@ TEST_F(StorebagCacheTest, AFailureKeepsTheLastGoodBagAndWaits900Seconds) {
 }
 
 TEST_F(StorebagCacheTest, AFirstFailureServesNothingFor900Seconds) {
-  server = [](StorebagFetch&) -> platform::SharedDictionary { return nullptr; };
+  EXPECT_EQ(cache.version(5), std::nullopt);
+  EXPECT_EQ(fetches, 0) << "a version is never fetched";
+  answer = failure;
   EXPECT_EQ(ask(), "none");
   clock.advance(450);
   EXPECT_EQ(ask(), "none");
@@ -116,31 +107,17 @@ TEST_F(StorebagCacheTest, AFirstFailureServesNothingFor900Seconds) {
 }
 
 TEST_F(StorebagCacheTest, UnchangedRenewsTheTimeAndKeepsTheBag) {
-  server = [](StorebagFetch& fetch) {
-    fetch.maxAge = 100;
-    fetch.version = "v1";
-    fetch.lastModified = "Monday";
-    return bag("first");
-  };
   ask();
   EXPECT_EQ(sentStamp, std::nullopt);
   clock.advance(200);
-  server = [](StorebagFetch& fetch) -> platform::SharedDictionary {
-    fetch.maxAge = 500;
-    fetch.notModified = true;
-    return nullptr;
-  };
+  answer = notModified;
+  maxAge = 5000;
   EXPECT_EQ(ask(), "first");
   EXPECT_EQ(sentStamp, "Monday");
   EXPECT_FALSE(log.contains("Unable to fetch"));
-  clock.advance(499);
+  clock.advance(4999);  // longer than a failure would wait
   EXPECT_EQ(ask(), "first");
   EXPECT_EQ(fetches, 2);
-}
-
-TEST_F(StorebagCacheTest, AVersionIsNeverFetched) {
-  EXPECT_EQ(cache.version(5), std::nullopt);
-  EXPECT_EQ(fetches, 0);
 }
 
 }  // namespace
