@@ -19,9 +19,8 @@ using platform::Value;
 class NotedSession final : public ClientSessionInterface {
  public:
   std::string called;
+  enum { given, dropped, kept } fate = given;  // of replies with a text
   StringReply keptReply;
-  bool dropReplies = false;
-  bool keepReplies = false;
 
   void setSessionInfo(SharedDictionary info, SharedDictionary user, SharedArray frameworks, bool aggregates,
                       DoneReply done) override {
@@ -70,30 +69,26 @@ class NotedSession final : public ClientSessionInterface {
  private:
   void answer(std::string text, StringReply reply) {
     called = text;
-    if (dropReplies) return;
-    if (keepReplies) {
-      keptReply = std::move(reply);
-      return;
-    }
-    reply(std::move(text));
+    if (fate == given) reply(std::move(text));
+    if (fate == kept) keptReply = std::move(reply);
   }
 };
 
 class RemoteCallsTest : public ::testing::Test {
  protected:
-  Frame frame(const char* method, Array params, Frame::Kind kind = Frame::Kind::request) {
+  bool dispatch(const char* method, Array params, Frame::Kind kind = Frame::Kind::request) {
+    outbox->frames.clear();
     Frame made;
     made.kind = kind;
     made.messageID = 7;
     made.method = method;
     made.params = std::move(params);
-    return made;
+    return dispatchCall(std::move(made), session, outbox);
   }
-  // The one answer, or none.
-  std::optional<Frame> answer() {
-    auto& frames = outbox->frames;
-    if (frames.size() != 1) return std::nullopt;
-    return frames.front();
+  // The one answer; none, with a failure, when it is not one.
+  Frame answer() {
+    EXPECT_EQ(outbox->frames.size(), 1U);
+    return outbox->frames.empty() ? Frame() : outbox->frames.front();
   }
 
   std::shared_ptr<RecordingConnection::Received> outbox = std::make_shared<RecordingConnection::Received>();
@@ -102,11 +97,7 @@ class RemoteCallsTest : public ::testing::Test {
 
 TEST_F(RemoteCallsTest, EveryOperationArrivesWithItsArgumentsAndAnswersInItsShape) {
   const Dictionary info{{"sessionID", 1}};
-  const struct {
-    const char* method;
-    Array params;
-    const char* called;
-  } rows[] = {
+  const std::tuple<const char*, Array, const char*> rows[] = {
       {"setSessionInfo", {info, nullptr, nullptr, false}, "setSessionInfo {sessionID = 1}"},
       {"setSessionInfo", {info, info, Array{"f"}, true}, "setSessionInfo {sessionID = 1} user frameworks aggregates"},
       {"startConfigWithCompletionHandler", {}, "start"},
@@ -120,29 +111,23 @@ TEST_F(RemoteCallsTest, EveryOperationArrivesWithItsArgumentsAndAnswersInItsShap
       {"finishSessionWithReply", {}, "finish"},
       {"uploadFileAtPath", {"file:///a", nullptr}, "upload file:///a -"},
       {"uploadFileAtPath", {"file:///a", "t"}, "upload file:///a t"},
-      {"uploadLogData", {Array{1, 2}}, "log data 2"},
+      {"uploadLogData", {Value(Array{1, 2})}, "log data 2"},
       {"sendMessageWithSessionInfo", {info, nullptr, 3, 4, nullptr}, "one-off 3"},
   };
-  for (const auto& row : rows) {
-    outbox->frames.clear();
-    EXPECT_TRUE(dispatchCall(frame(row.method, row.params), session, outbox)) << row.method;
-    EXPECT_EQ(session.called, row.called);
+  for (const auto& [method, params, called] : rows) {
+    EXPECT_TRUE(dispatch(method, params)) << method;
+    EXPECT_EQ(session.called, called);
     const auto response = answer();
-    ASSERT_TRUE(response) << row.method;
-    EXPECT_EQ(response->kind, Frame::Kind::response);
-    EXPECT_EQ(response->messageID, 7U);
-    EXPECT_TRUE(response->error.isNull());
-    ASSERT_NE(response->result.array(), nullptr) << row.method;
+    EXPECT_EQ(response.kind, Frame::Kind::response);
+    EXPECT_EQ(response.messageID, 7U);
+    EXPECT_TRUE(response.error.isNull());
+    EXPECT_NE(response.result.array(), nullptr) << method;
   }
 }
 
 TEST_F(RemoteCallsTest, WhatDoesNotFitIsAnsweredAndNotCarriedOut) {
   const Dictionary info{{"sessionID", 1}};
-  const struct {
-    const char* method;
-    Array params;
-    const char* error;
-  } rows[] = {
+  const std::tuple<const char*, Array, std::string> rows[] = {
       {"noSuchOperation", {}, "unknown method 'noSuchOperation'"},
       {"", {}, "unknown method ''"},
       {"setSessionInfo", {info, nullptr, nullptr}, "setSessionInfo takes 4 arguments, 3 were given"},
@@ -164,100 +149,34 @@ TEST_F(RemoteCallsTest, WhatDoesNotFitIsAnsweredAndNotCarriedOut) {
       {"uploadLogData", {nullptr}, "'logData' must be an array"},
       {"sendMessageWithSessionInfo", {nullptr, nullptr, 0, 0, nullptr}, "'sessionInfo' must be a map"},
   };
-  for (const auto& row : rows) {
-    outbox->frames.clear();
-    session.called.clear();
-    EXPECT_FALSE(dispatchCall(frame(row.method, row.params), session, outbox));
-    EXPECT_EQ(session.called, "") << row.method;
-    const auto response = answer();
-    ASSERT_TRUE(response) << row.error;
-    ASSERT_NE(response->error.string(), nullptr);
-    const std::string expected = row.error[0] == '\'' ? std::string(row.method) + ": argument " + row.error : row.error;
-    EXPECT_EQ(*response->error.string(), expected);
+  for (const auto& [method, params, error] : rows) {
+    EXPECT_FALSE(dispatch(method, params));
+    EXPECT_EQ(session.called, "") << method;
+    EXPECT_EQ(answer().error, Value(error.starts_with("'") ? std::string(method) + ": argument " + error : error));
   }
 }
 
 TEST_F(RemoteCallsTest, NotificationsGetNoAnswerAndRefusedOnesALogLine) {
   LogCapture log;
-  EXPECT_TRUE(dispatchCall(frame("fetchDisplayURL", {}, Frame::Kind::notification), session, outbox));
-  EXPECT_FALSE(dispatchCall(frame("fetchDisplayURL", {1}, Frame::Kind::notification), session, outbox));
+  EXPECT_TRUE(dispatch("fetchDisplayURL", {}, Frame::Kind::notification));
+  EXPECT_TRUE(outbox->frames.empty());
+  EXPECT_FALSE(dispatch("fetchDisplayURL", {1}, Frame::Kind::notification));
   EXPECT_TRUE(outbox->frames.empty());
   EXPECT_EQ(log.count("Refused a call of 'fetchDisplayURL'"), 1U);
 }
 
 TEST_F(RemoteCallsTest, ADroppedReplyReachesTheCallerAsAnError) {
-  session.dropReplies = true;
-  dispatchCall(frame("fetchDisplayURL", {}), session, outbox);
-  const auto response = answer();
-  ASSERT_TRUE(response);
-  EXPECT_EQ(*response->error.string(), "the reply was dropped without being given");
+  session.fate = NotedSession::dropped;
+  dispatch("fetchDisplayURL", {});
+  EXPECT_EQ(answer().error, Value("the reply was dropped without being given"));
 }
 
 TEST_F(RemoteCallsTest, RepliesOutliveTheirConnection) {
-  std::weak_ptr<platform::Outbox> gone;
-  {
-    const auto shortLived = std::make_shared<RecordingConnection::Received>();
-    gone = shortLived;
-    session.keepReplies = true;
-    dispatchCall(frame("fetchDisplayURL", {}), session, shortLived);
-  }
+  session.fate = NotedSession::kept;
+  dispatch("fetchDisplayURL", {});
+  const std::weak_ptr<platform::Outbox> gone = std::exchange(outbox, nullptr);
   EXPECT_TRUE(gone.expired()) << "a reply keeps its connection's outbox alive";
   session.keptReply("late");
-}
-
-TEST_F(RemoteCallsTest, ResponsesReadBackAsTheValuesThatWereGiven) {
-  dispatchCall(frame("flushMessagesWithCompletion", {}), session, outbox);
-  std::optional<FlushReply::Outcome> flushed;
-  deliverResponse(std::move(outbox->frames.front()), FlushReply([&](auto outcome) { flushed = std::move(outcome); }));
-  ASSERT_TRUE(flushed && flushed->values);
-  EXPECT_EQ(std::get<0>(*flushed->values), "text");
-  EXPECT_EQ(std::get<1>(*flushed->values), makeOrvantaError("went wrong", 503));
-
-  outbox->frames.clear();
-  dispatchCall(frame("startConfigWithCompletionHandler", {}), session, outbox);
-  std::optional<BackendNamesReply::Outcome> names;
-  deliverResponse(std::move(outbox->frames.front()),
-                  BackendNamesReply([&](auto outcome) { names = std::move(outcome); }));
-  ASSERT_TRUE(names && names->values);
-  EXPECT_EQ(std::get<0>(*names->values), (std::vector<std::string>{"a", "b"}));
-}
-
-TEST_F(RemoteCallsTest, MalformedResponsesFailTheReply) {
-  const Value results[] = {nullptr,
-                           5,
-                           Array{},
-                           Array{"x", "y", "z"},
-                           Array{1, nullptr},
-                           Array{"x", "no error map"},
-                           Array{"x", Dictionary{{"code", 1}}}};
-  for (const auto& result : results) {
-    Frame response;
-    response.kind = Frame::Kind::response;
-    response.result = result;
-    std::optional<FlushReply::Outcome> outcome;
-    deliverResponse(std::move(response), FlushReply([&](auto given) { outcome = std::move(given); }));
-    ASSERT_TRUE(outcome);
-    EXPECT_FALSE(outcome->values) << result.description();
-    EXPECT_FALSE(outcome->error.text.empty());
-  }
-}
-
-TEST_F(RemoteCallsTest, AggregatedEventsAndTheEndNoticeSurviveTheWire) {
-  const auto info = std::make_shared<const Dictionary>(Dictionary{{"sessionID", 4}});
-  outbox->send(encodeSendMessageToClient(info, 12.25, 9, 8, nullptr), platform::Outbox::Urgency::reply);
-  outbox->send(encodeSendMessageToClient(nullptr, 0, 0, 0, nullptr), platform::Outbox::Urgency::reply);
-  ASSERT_EQ(outbox->frames.size(), 2U);
-  const auto event = decodeSendMessageToClient(outbox->frames[0]);
-  ASSERT_TRUE(event);
-  EXPECT_EQ(*event->sessionInfo, *info);
-  EXPECT_EQ(event->timestamp, 12.25);
-  EXPECT_EQ(event->category, 9);
-  EXPECT_EQ(event->type, 8);
-  EXPECT_FALSE(event->payload);
-  EXPECT_FALSE(event->isEndNotice());
-  const auto notice = decodeSendMessageToClient(outbox->frames[1]);
-  ASSERT_TRUE(notice);
-  EXPECT_TRUE(notice->isEndNotice());
 }
 
 }  // namespace
