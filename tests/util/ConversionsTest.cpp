@@ -4,70 +4,78 @@
 #include <gtest/gtest.h>
 
 #include <limits>
+#include <tuple>
+
+#include "util/ClientTypes.h"
 
 namespace orvanta {
 namespace {
 
 TEST(Conversions, timevalToSeconds) {
-  struct Row {
-    platform::TimeValue time;
-    double expected;
-  };
-  const Row rows[] = {
+  const std::pair<platform::TimeValue, double> rows[] = {
       {{1, 500000}, 1.5}, {{0, 0}, 0}, {{-1, 250000}, -0.75}, {{2147483647, 999999}, 2147483647.999999}};
-  for (const Row& row : rows) EXPECT_DOUBLE_EQ(timevalToSeconds(row.time), row.expected);
+  for (const auto& [time, expected] : rows) EXPECT_DOUBLE_EQ(timevalToSeconds(time), expected);
 }
 
 TEST(Conversions, sanitizeDouble) {
   using Limits = std::numeric_limits<double>;
-  struct Row {
-    double given, expected;
-  };
-  const Row rows[] = {{Limits::quiet_NaN(), -1},
-                      {Limits::infinity(), -1},
-                      {-Limits::infinity(), -1},
-                      {-1, -1},
-                      {0, 0},
-                      {Limits::max(), Limits::max()},
-                      {Limits::denorm_min(), Limits::denorm_min()}};
-  for (const Row& row : rows) EXPECT_EQ(sanitizeDouble(row.given), row.expected) << row.given;
+  for (const double finite : {-2.0, 0.0, Limits::max(), Limits::denorm_min()})
+    EXPECT_EQ(sanitizeDouble(finite), finite);
+  for (const double other : {Limits::quiet_NaN(), Limits::infinity(), -Limits::infinity()}) {
+    EXPECT_EQ(sanitizeDouble(other), -1) << other;
+  }
 }
 
 TEST(Conversions, roundDownToMinuteTruncatesTowardZero) {
-  struct Row {
-    std::int32_t given, expected;
-  };
-  const Row rows[] = {
+  const std::pair<std::int32_t, std::int32_t> rows[] = {
       {119, 60}, {60, 60}, {59, 0}, {-59, 0}, {-61, -60}, {2147483647, 2147483640}, {-2147483648, -2147483640}};
-  for (const Row& row : rows) EXPECT_EQ(roundDownToMinute(row.given), row.expected) << row.given;
+  for (const auto& [given, expected] : rows) EXPECT_EQ(roundDownToMinute(given), expected) << given;
 }
 
 TEST(Conversions, makeIPv4SocketAddress) {
-  struct Row {
-    std::string_view text;
-    std::uint32_t expected;  // in network order when read from high to low
+  const auto check = [](const char* text, std::uint32_t expected) {
+    const sockaddr_in address = makeIPv4SocketAddress(text, 5000);
+    EXPECT_EQ(address.sin_family, AF_INET);
+    EXPECT_EQ(ntohl(address.sin_addr.s_addr), expected) << text;
+    EXPECT_EQ(ntohs(address.sin_port), 5000);
   };
-  const Row rows[] = {
-      {"10.0.0.1", 0x0a000001},
-      {"255.255.255.254", 0xfffffffe},
-      {"0.0.0.0", 0},
-      {"", 0xffffffff},
-      {"10.0.0", 0xffffffff},
-      {"10.0.0.256", 0xffffffff},
-      {"10.0.0.1 ", 0xffffffff},
-      {"::1", 0xffffffff},
-      {"host.kovalt", 0xffffffff},
-      {"10.0.0.1/nothing", 0xffffffff},
-      {"100.100.100.1000", 0xffffffff},
-      {"127.0.0.1.127.0.0.1", 0xffffffff},
-  };
-  for (const Row& row : rows) {
-    const sockaddr_in address = makeIPv4SocketAddress(row.text, 5000);
-    EXPECT_EQ(address.sin_family, 2);
-    EXPECT_EQ(ntohl(address.sin_addr.s_addr), row.expected) << row.text;
-    const auto* port = reinterpret_cast<const unsigned char*>(&address.sin_port);
-    EXPECT_EQ(port[0], 0x13);
-    EXPECT_EQ(port[1], 0x88);
+  check("10.0.0.1", 0x0a000001);
+  check("255.255.255.254", 0xfffffffe);
+  check("0.0.0.0", 0);
+  for (const char* none : {"", "10.0.0", "10.0.0.256", "10.0.0.1 ", "::1", "host.kovalt", "10.0.0.1/nothing",
+                           "100.100.100.1000", "127.0.0.1.127.0.0.1"}) {
+    check(none, 0xffffffff);
+  }
+}
+
+TEST(ClientTypes, namesEveryTypesSenderAndStorebag) {
+  const std::tuple<std::int32_t, const char*, const char*> rows[] = {
+      {0, "QZ", ""},
+      {1, "XJ", ""},
+      {2, "ZUV", ""},
+      {3, "JQ", ""},
+      {4, "VX", ""},
+      {5, "ZK", "quillon"},
+      {6, "QB", "brindle"},
+      {7, "XF", "confluo"},
+      {8, "JZ", "skylume"},
+      {9, "QW", "ostrel"},
+      {10, "XQ", "pondera"},
+      {11, "ZJ", "confluo"},
+      {12, "QUBZ", "graphelle"},
+      {13, "ZEPHQ", "confluo"},
+      {14, "QB-ZIRL", "brindle"},
+      {15, "QB-JOVEX", "brindle"},
+      {16, "ZORNEPS", "scribehall"},
+      {17, "JAXTRO", "halvora"},
+      {18, "QUARNEX", "parrowick"},
+      {19, "", ""},
+      {-1, "", ""},
+      {std::numeric_limits<std::int32_t>::min(), "", ""},
+      {std::numeric_limits<std::int32_t>::max(), "", ""}};
+  for (const auto& [clientType, sender, storebag] : rows) {
+    EXPECT_EQ(senderCodeForClientType(clientType), sender) << clientType;
+    EXPECT_EQ(storebagNameForClientType(clientType).value_or(""), storebag) << clientType;
   }
 }
 

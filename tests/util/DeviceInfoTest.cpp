@@ -3,87 +3,113 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <set>
+
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
+#include "util/Environment.h"
 
 namespace orvanta {
 namespace {
 
 using platform::UserDefaults;
+using platform::Value;
 
 constexpr const char* kUuidPattern = "[0-9A-F]{8}-[0-9A-F]{4}-4[0-9A-F]{3}-[89AB][0-9A-F]{3}-[0-9A-F]{12}";
 
 TEST(DeviceInfo, copiesTheDeviceIdentifierIntoItsBuffer) {
-  const std::string forty(40, 'f');
-  const std::string twoBytes = "\xc3\xa9";
-  struct Row {
-    std::optional<std::string> given;
-    std::string expected;
-  };
-  const Row rows[] = {
-      {"0123456789abcdef0123456789abcdef01234567", "0123456789abcdef0123456789abcdef01234567"},
+  const std::string forty(40, 'f'), umlaut = "é";
+  const std::pair<std::optional<std::string>, std::string> rows[] = {
+      {forty, forty},
       {"short", "short"},
       {"", ""},
       {forty + "g", forty},
-      {std::string(38, 'f') + twoBytes, std::string(38, 'f') + twoBytes},
-      {std::string(39, 'f') + twoBytes, std::string(39, 'f')},
+      {forty.substr(2) + umlaut, forty.substr(2) + umlaut},
+      {forty.substr(1) + umlaut, forty.substr(1)},
       {std::nullopt, "left as it was"},
   };
-  for (const Row& row : rows) {
+  for (const auto& [given, expected] : rows) {
     test::TestPlatform platform;
-    platform.device.udid = row.given;
+    platform.device.udid = given;
     DeviceIDBuffer buffer{"left as it was"};
     copyUniqueDeviceID(platform, buffer);
-    EXPECT_EQ(deviceIDText(buffer), row.expected);
+    EXPECT_EQ(deviceIDText(buffer), expected);
     EXPECT_EQ(buffer.back(), '\0');
   }
 }
 
 TEST(DeviceInfo, internalBuildIsDecidedOnce) {
-  struct Row {
-    std::optional<std::string> releaseType;
-    bool expected;
-  };
-  const Row rows[] = {{"Internal", true}, {"internal", false}, {"Internal ", false},
-                      {"Beta", false},    {"", false},         {std::nullopt, false}};
-  for (const Row& row : rows) {
+  const std::pair<std::optional<std::string>, bool> rows[] = {
+      {"Internal", true}, {"internal", false}, {"Internal ", false}, {"Beta", false}, {std::nullopt, false}};
+  for (const auto& [releaseType, expected] : rows) {
     test::TestPlatform platform;
-    platform.device.release = row.releaseType;
-    EXPECT_EQ(isInternalBuild(platform), row.expected) << row.releaseType.value_or("none");
-    platform.device.release = row.expected ? "Beta" : "Internal";
-    EXPECT_EQ(isInternalBuild(platform), row.expected) << "asked again";
+    platform.device.release = releaseType;
+    EXPECT_EQ(isInternalBuild(platform), expected) << releaseType.value_or("none");
+    platform.device.release = expected ? "Beta" : "Internal";
+    EXPECT_EQ(isInternalBuild(platform), expected) << "asked again";
   }
 }
 
 TEST(DeviceInfo, persistentIdentifiersSurviveARestart) {
-  struct Row {
-    std::optional<std::string> first, second;
-    std::string key;
-  };
-  const Row rows[] = {
+  const std::tuple<std::optional<std::string>, std::optional<std::string>, std::string> rows[] = {
       {{}, {}, "uuid::"}, {"Mail", {}, "uuid:Mail:"}, {{}, "Mail", "uuid::Mail"}, {"Mail", "push", "uuid:Mail:push"}};
   test::TestPlatform platform;
-  std::vector<std::string> identifiers;
-  for (const Row& row : rows) {
+  std::set<std::string> identifiers;
+  for (const auto& [first, second, key] : rows) {
     const test::LogCapture log;
-    identifiers.push_back(getPersistentIdentifierForCustomClientIDSuffix(platform, row.first, row.second));
-    EXPECT_THAT(identifiers.back(), testing::MatchesRegex(kUuidPattern));
-    EXPECT_TRUE(log.contains("<6>getPersistentIdentifierForCustomClientIDSuffix: The value for " + row.key + ": " +
-                             identifiers.back()));
+    const std::string made = getPersistentIdentifierForCustomClientIDSuffix(platform, first, second);
+    EXPECT_THAT(made, testing::MatchesRegex(kUuidPattern));
+    EXPECT_TRUE(identifiers.insert(made).second);
+    EXPECT_TRUE(log.contains("<6>getPersistentIdentifierForCustomClientIDSuffix: The value for " + key + ": " + made));
     UserDefaults afterRestart(platform.get().files().stateDirectory, "com.kovalt.orvanta");
-    EXPECT_EQ(afterRestart.text(row.key), identifiers.back());
-    EXPECT_EQ(getPersistentIdentifierForCustomClientIDSuffix(platform, row.first, row.second), identifiers.back());
+    EXPECT_EQ(afterRestart.text(key), made);
+    EXPECT_EQ(getPersistentIdentifierForCustomClientIDSuffix(platform, first, second), made);
   }
-  std::sort(identifiers.begin(), identifiers.end());
-  EXPECT_EQ(std::unique(identifiers.begin(), identifiers.end()), identifiers.end());
-}
-
-TEST(DeviceInfo, whatSomebodyElseStoredIsThePersistentIdentifier) {
-  test::TestPlatform platform;
+  // Whatever somebody else has stored there is the identifier.
   ASSERT_TRUE(platform.get().defaults().set("uuid:a:b", "given by hand"));
   ASSERT_TRUE(platform.get().defaults().set("uuid:a:", 12));
   EXPECT_EQ(getPersistentIdentifierForCustomClientIDSuffix(platform, "a", "b"), "given by hand");
   EXPECT_EQ(getPersistentIdentifierForCustomClientIDSuffix(platform, "a", {}), "12");
+}
+
+TEST(Environment, isTheSettingOrFollowsTheBuild) {
+  const struct {
+    Value setting;  // null: none
+    bool internalBuild;
+    std::uint32_t expected;
+    std::string invalid = "";  // the value that the error line names; empty: no such line
+  } rows[] = {
+      {nullptr, false, 3},
+      {nullptr, true, 2},
+      {0, true, 0},
+      {1, false, 1},
+      {3, true, 3},
+      {4, true, 4},
+      {"4", false, 4},
+      {true, false, 1},
+      {"release", false, 0},
+      {5, false, 2, "5"},
+      {std::int64_t{0x1'0000'0001}, false, 2, "4294967297"},  // not 1 with its upper half cut off
+      {-1, false, 2, "4294967295"},
+      {"-3", false, 2, "4294967293"},
+  };
+  for (const auto& row : rows) {
+    test::TestPlatform platform;
+    if (row.internalBuild) platform.device.release = "Internal";
+    if (!row.setting.isNull()) {
+      ASSERT_TRUE(platform.get().defaults().set("environmentType", row.setting));
+    }
+    const test::LogCapture log;
+    std::vector<std::string> lines;
+    if (!row.invalid.empty()) lines.push_back("<3>userDefaultsEnvironment: Invalid environment type " + row.invalid);
+    lines.push_back("<6>userDefaultsEnvironment: Environment type " + std::to_string(row.expected));
+    // Decided once: neither a later setting nor another line.
+    for (int asked = 0; asked < 2; ++asked) {
+      EXPECT_EQ(static_cast<std::uint32_t>(currentEnvironmentType(platform)), row.expected);
+      EXPECT_EQ(log.lines(), lines);
+      ASSERT_TRUE(platform.get().defaults().set("environmentType", row.expected == 1 ? 4 : 1));
+    }
+  }
 }
 
 }  // namespace

@@ -72,30 +72,16 @@ class MessageLogTest : public testing::Test {
 };
 
 TEST(MessageLogName, hasThreePieces) {
-  struct Row {
-    std::string_view name;
-    bool expected;
-  };
-  const Row rows[] = {
-      {"orvantad_1795619045_messageLog.diag", true},
-      {"orvantad_-5_messageLog.diag", true},
-      {"orvantad_any text_messageLog.diag", true},
-      {"orvantad__messageLog.diag", true},
-      {"orvantad_1795619045_1_messageLog.diag", false},
-      {"orvantad_messageLog.diag", false},
-      {"orvantad", false},
-      {"", false},
-      {"_", false},
-      {"__", false},
-      {"Orvantad_1_messageLog.diag", false},
-      {"orvantad_1_messagelog.diag", false},
-      {"orvantad_1_messageLog.diag.gz", false},
-      {"xorvantad_1_messageLog.diag", false},
-      {"orvantad_1_messageLog.diag_", false},
-      {"_orvantad_1_messageLog.diag", false},
-  };
-  for (const Row& row : rows) EXPECT_EQ(isMessageLogName(row.name), row.expected) << row.name;
-  EXPECT_EQ(messageLogName(1795619045), "orvantad_1795619045_messageLog.diag");
+  for (const char* name : {"orvantad_1795619045_messageLog.diag", "orvantad_-5_messageLog.diag",
+                           "orvantad_any text_messageLog.diag", "orvantad__messageLog.diag"}) {
+    EXPECT_TRUE(isMessageLogName(name)) << name;
+  }
+  for (const char* name :
+       {"orvantad_1795619045_1_messageLog.diag", "orvantad_messageLog.diag", "orvantad", "", "_", "__",
+        "Orvantad_1_messageLog.diag", "orvantad_1_messagelog.diag", "orvantad_1_messageLog.diag.gz",
+        "xorvantad_1_messageLog.diag", "orvantad_1_messageLog.diag_", "_orvantad_1_messageLog.diag"}) {
+    EXPECT_FALSE(isMessageLogName(name)) << name;
+  }
   EXPECT_TRUE(isMessageLogName(messageLogName(-1)));
 }
 
@@ -122,33 +108,25 @@ TEST_F(MessageLogTest, laterLinesAreAppendedAsTheyAre) {
   writeToLogFile(platform, "two\nlines\n");
   writeToLogFile(platform, "");
   EXPECT_EQ(content(name), first + "one\n" + prefix() + "two\nlines\n\n" + prefix() + "\n");
-  EXPECT_THAT(log.lines(), ElementsAre("<6>writeToLogFile: Saved log message to " + directory + "/" + name,
-                                       "<6>writeToLogFile: Saved log message to " + directory + "/" + name));
+  const std::string saved = "<6>writeToLogFile: Saved log message to " + directory + "/" + name;
+  EXPECT_THAT(log.lines(), ElementsAre(saved, saved));
 }
 
 TEST_F(MessageLogTest, aFileIsReplacedOnceItIsMoreThanADayOld) {
-  struct Row {
-    double age;
-    bool replaced;
-  };
-  for (const Row& row :
-       {Row{-5, false}, Row{0, false}, Row{86399, false}, Row{86400, false}, Row{86401, true}, Row{1e6, true}}) {
+  for (const double age : {-5.0, 0.0, 86399.0, 86400.0, 86401.0, 1e6}) {
     const std::string old = make("orvantad_1_messageLog.diag", "old\n");
     const double birth = birthTime(old);
-    platform.clock.set(birth + row.age);
+    platform.clock.set(birth + age);
     const test::LogCapture log;
     writeToLogFile(platform, "new");
-    const std::string line = prefix() + "new\n";
-    if (row.replaced) {
-      EXPECT_THAT(names(), ElementsAre(nameForNow())) << row.age;
-      EXPECT_EQ(content(nameForNow()), line);
-      EXPECT_TRUE(log.contains("<6>writeToLogFile: Deleted expired orvantad log file " + old + " (" +
-                               platform::describeDate(birth) + ")"));
-      fs::remove(directory + "/" + nameForNow());
-    } else {
-      EXPECT_THAT(names(), ElementsAre("orvantad_1_messageLog.diag")) << row.age;
-      EXPECT_EQ(content("orvantad_1_messageLog.diag"), "old\n" + line);
-    }
+    const bool replaced = age > 86400;
+    const std::string name = replaced ? nameForNow() : "orvantad_1_messageLog.diag";
+    EXPECT_THAT(names(), ElementsAre(name)) << age;
+    EXPECT_EQ(content(name), (replaced ? "" : "old\n") + prefix() + "new\n");
+    EXPECT_EQ(log.contains("<6>writeToLogFile: Deleted expired orvantad log file " + old + " (" +
+                           platform::describeDate(birth) + ")"),
+              replaced);
+    fs::remove(directory + "/" + name);
   }
 }
 
@@ -176,86 +154,60 @@ TEST_F(MessageLogTest, neverTouchesOtherFiles) {
   writeToLogFile(platform, "line");
   EXPECT_THAT(names(), UnorderedElementsAre("orvantad_1_2_messageLog.diag", "other.diag", "orvantad_2_messageLog.diag",
                                             "orvantad_3_messageLog.diag", nameForNow()));
-  EXPECT_EQ(content("orvantad_1_2_messageLog.diag"), "untouched");
-  EXPECT_EQ(content("other.diag"), "untouched");
-  EXPECT_EQ(content("orvantad_3_messageLog.diag"), "untouched");
+  for (const char* name : {"orvantad_1_2_messageLog.diag", "other.diag", "orvantad_3_messageLog.diag"}) {
+    EXPECT_EQ(content(name), "untouched");
+  }
 }
 
-TEST_F(MessageLogTest, withoutADirectoryTheLineIsLost) {
-  fs::remove(directory);
-  std::ofstream(directory) << "a file in its place";
-  const test::LogCapture log;
-  writeToLogFile(platform, "line");
-  EXPECT_THAT(log.lines(), ElementsAre("<3>writeToLogFile: Error reading from log directory: Not a directory",
-                                       "<3>writeToLogFile: Failed to create new orvantad log file " + directory + "/" +
-                                           nameForNow()));
-}
-
-TEST_F(MessageLogTest, aNewFileNeverReplacesWhatBearsItsName) {
-  fs::create_symlink(platform.directory / "outside", directory + "/" + nameForNow());
-  const test::LogCapture log;
+TEST_F(MessageLogTest, whereNoFileCanBeMadeTheLineIsLost) {
+  const std::string failed =
+      "<3>writeToLogFile: Failed to create new orvantad log file " + directory + "/" + nameForNow();
+  fs::create_symlink(platform.directory / "outside", directory + "/" + nameForNow());  // bears its name
+  test::LogCapture log;
   writeToLogFile(platform, "line");
   EXPECT_FALSE(fs::exists(platform.directory / "outside"));
-  EXPECT_THAT(log.lines(), ElementsAre("<3>writeToLogFile: Failed to create new orvantad log file " + directory + "/" +
-                                       nameForNow()));
+  EXPECT_THAT(log.lines(), ElementsAre(failed));
+  log.clear();
+  fs::remove_all(directory);
+  std::ofstream(directory) << "a file in its place";
+  writeToLogFile(platform, "line");
+  EXPECT_THAT(log.lines(), ElementsAre("<3>writeToLogFile: Error reading from log directory: Not a directory", failed));
 }
 
-// Files of this process end at a number of bytes while it lives.
-class FileSizeLimit {
- public:
-  explicit FileSizeLimit(rlim_t bytes) : _handler(::signal(SIGXFSZ, SIG_IGN)) {
-    ::getrlimit(RLIMIT_FSIZE, &_before);
-    const rlimit lowered{bytes, _before.rlim_max};
-    ::setrlimit(RLIMIT_FSIZE, &lowered);
-  }
-  ~FileSizeLimit() {
-    ::setrlimit(RLIMIT_FSIZE, &_before);
-    ::signal(SIGXFSZ, _handler);
-  }
-
- private:
-  rlimit _before{};
-  void (*_handler)(int);
-};
-
 TEST_F(MessageLogTest, aLineThatDoesNotFitOnTheDiskExpiresTheFile) {
-  for (const rlim_t room : {rlim_t{0}, rlim_t{7}}) {  // nothing or a part of the line can be written
+  rlimit before{};
+  ASSERT_EQ(::getrlimit(RLIMIT_FSIZE, &before), 0);
+  const auto handler = ::signal(SIGXFSZ, SIG_IGN);
+  for (const rlim_t room : {0, 7}) {  // nothing or a part of the line can be written
     const std::string path = make("orvantad_1_messageLog.diag", "earlier\n");
+    const rlimit lowered{8 + room, before.rlim_max};
     const test::LogCapture log;
-    {
-      const FileSizeLimit limit(8 + room);
-      writeToLogFile(platform, "line");
-    }
+    ::setrlimit(RLIMIT_FSIZE, &lowered);
+    writeToLogFile(platform, "line");
+    ::setrlimit(RLIMIT_FSIZE, &before);
     EXPECT_THAT(names(), IsEmpty());
     EXPECT_EQ(log.count("<6>writeToLogFile: Deleted expired orvantad log file " + path), 1);
     EXPECT_FALSE(log.contains("Saved log message"));
   }
+  ::signal(SIGXFSZ, handler);
 }
 
 TEST_F(MessageLogTest, linesOfSeveralThreadsDoNotMix) {
   writeToLogFile(platform, "start");
-  constexpr int kThreads = 4;
-  constexpr int kLines = 100;
+  std::multiset<std::string> expected = {prefix() + "start"};
   std::vector<std::thread> threads;
-  for (int thread = 0; thread < kThreads; ++thread) {
-    threads.emplace_back([this, thread] {
-      for (int line = 0; line < kLines; ++line) {
-        writeToLogFile(platform, std::to_string(thread) + "." + std::to_string(line) + std::string(3000, '.'));
-      }
+  for (char thread = '0'; thread < '4'; ++thread) {
+    const std::string text = thread + std::string(3000, '.');
+    for (int line = 0; line < 100; ++line) expected.insert(prefix() + text);
+    threads.emplace_back([this, text] {
+      for (int line = 0; line < 100; ++line) writeToLogFile(platform, text);
     });
   }
   for (std::thread& thread : threads) thread.join();
   ASSERT_THAT(names(), ElementsAre(nameForNow()));
   std::ifstream file(directory + "/" + nameForNow());
-  std::string line;
-  std::set<std::string> lines;
-  while (std::getline(file, line)) lines.insert(line);
-  std::set<std::string> expected = {prefix() + "start"};
-  for (int thread = 0; thread < kThreads; ++thread) {
-    for (int number = 0; number < kLines; ++number) {
-      expected.insert(prefix() + std::to_string(thread) + "." + std::to_string(number) + std::string(3000, '.'));
-    }
-  }
+  std::multiset<std::string> lines;
+  for (std::string line; std::getline(file, line);) lines.insert(line);
   EXPECT_EQ(lines, expected);
 }
 

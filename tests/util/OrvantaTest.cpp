@@ -12,29 +12,23 @@ namespace orvanta {
 namespace {
 
 TEST(Orvanta, readsTheBundlesVersion) {
-  struct Row {
-    const char* what;
-    std::optional<std::string> file;
-    std::string version;
-    bool logged;
+  const std::tuple<const char*, const char*, std::size_t> rows[] = {
+      // content of the file, version, lines
+      {"<plist><dict><key>version</key><string>8.1.2</string></dict></plist>", "8.1.2", 0},
+      {"<plist><dict><key>version</key><integer>9</integer></dict></plist>", "9", 0},
+      {nullptr, "8.0", 0},
+      {"<plist><dict><key>Version</key><string>9</string></dict></plist>", "8.0", 1},
+      {"<plist><dict><key>version</key><array/></dict></plist>", "8.0", 1},
+      {"<plist><string>8.1</string></plist>", "8.0", 1},
+      {"<plist><dict><key>version", "8.0", 1},
+      {"", "8.0", 1},
   };
-  const auto plist = [](const std::string& content) { return "<plist version=\"1.0\">" + content + "</plist>"; };
-  const Row rows[] = {
-      {"a text", plist("<dict><key>version</key><string>8.1.2</string></dict>"), "8.1.2", false},
-      {"a number", plist("<dict><key>version</key><integer>9</integer></dict>"), "9", false},
-      {"no file", std::nullopt, "8.0", false},
-      {"no version", plist("<dict><key>Version</key><string>9</string></dict>"), "8.0", true},
-      {"another type", plist("<dict><key>version</key><array/></dict>"), "8.0", true},
-      {"no dictionary", plist("<string>8.1</string>"), "8.0", true},
-      {"malformed", "<plist><dict><key>version", "8.0", true},
-      {"empty", "", "8.0", true},
-  };
-  for (const Row& row : rows) {
+  for (const auto& [file, version, lines] : rows) {
     test::TestPlatform platform;
-    if (row.file) platform.directory.write("share/framework.plist", *row.file);
+    if (file != nullptr) platform.directory.write("share/framework.plist", file);
     const test::LogCapture log;
-    EXPECT_EQ(Orvanta::of(platform).bundleVersion(), row.version) << row.what;
-    EXPECT_EQ(log.count("<4>bundleVersion: "), row.logged ? 1 : 0) << row.what;
+    EXPECT_EQ(Orvanta::of(platform).bundleVersion(), version);
+    EXPECT_EQ(log.count("<4>bundleVersion: "), lines) << file;
   }
 }
 
@@ -49,40 +43,37 @@ TEST(Orvanta, keepsTheKeyOnceItHasOne) {
   test::TestPlatform platform;
   Orvanta& orvanta = Orvanta::of(platform);
   EXPECT_FALSE(orvanta.publicKey());
+  const std::string file = platform.directory / "share/publicKey.der";
   const auto install = [&](const test::Bytes& bytes) {
     platform.directory.write("share/publicKey.der", {reinterpret_cast<const char*>(bytes.data()), bytes.size()});
   };
   const auto der = test::StorebagSigner().publicKeyDer(test::KeyLayout::pkcs1);
-  for (const test::Bytes& unusable :
-       {test::Bytes{}, test::Bytes(70'000, 0x30), test::Bytes(der.begin(), der.end() - 1)}) {
+  for (const auto& unusable : {test::Bytes{}, test::Bytes(70'000, 0x30), test::Bytes(der.begin(), der.end() - 1)}) {
     install(unusable);
     EXPECT_FALSE(orvanta.publicKey());
   }
-  std::filesystem::remove(platform.directory / "share/publicKey.der");
-  std::filesystem::create_directory(platform.directory / "share/publicKey.der");
+  std::filesystem::remove(file);
+  std::filesystem::create_directory(file);
   EXPECT_FALSE(orvanta.publicKey());
-  std::filesystem::remove(platform.directory / "share/publicKey.der");
+  std::filesystem::remove(file);
   install(der);
   const auto key = orvanta.publicKey();
   ASSERT_TRUE(key);
-  std::filesystem::remove(platform.directory / "share/publicKey.der");
-  EXPECT_EQ(orvanta.publicKey(), key);
-  EXPECT_EQ(&Orvanta::of(platform), &orvanta);
+  std::filesystem::remove(file);
+  EXPECT_EQ(Orvanta::of(platform).publicKey(), key);
 }
 
 TEST(Orvanta, keepsOneIdentifierPerStandOnConsent) {
   test::TestPlatform platform;
-  Orvanta& orvanta = Orvanta::of(platform);
-  const std::string respect = orvanta.getPersistentIdentifierForDNU(true);
-  const std::string override = orvanta.getPersistentIdentifierForDNU(false);
+  const std::string respect = Orvanta::of(platform).getPersistentIdentifierForDNU(true);
+  const std::string override = Orvanta::of(platform).getPersistentIdentifierForDNU(false);
   EXPECT_THAT(respect, testing::MatchesRegex("[0-9A-F]{8}-[0-9A-F]{4}-4[0-9A-F]{3}-[89AB][0-9A-F]{3}-[0-9A-F]{12}"));
   EXPECT_NE(respect, override);
   Orvanta afterRestart(platform);
   EXPECT_EQ(afterRestart.getPersistentIdentifierForDNU(true), respect);
   EXPECT_EQ(afterRestart.getPersistentIdentifierForDNU(false), override);
-  platform::UserDefaults stored(platform.get().files().stateDirectory, "com.kovalt.orvanta");
-  EXPECT_EQ(stored.text("uuid-respect-dnu"), respect);
-  EXPECT_EQ(stored.text("uuid-override-dnu"), override);
+  EXPECT_EQ(platform.get().defaults().text("uuid-respect-dnu"), respect);
+  EXPECT_EQ(platform.get().defaults().text("uuid-override-dnu"), override);
 }
 
 }  // namespace

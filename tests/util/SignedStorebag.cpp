@@ -4,6 +4,7 @@
 #include <openssl/rsa.h>
 #include <openssl/x509.h>
 
+#include <algorithm>
 #include <map>
 #include <memory>
 #include <stdexcept>
@@ -20,40 +21,29 @@ T must(T result, const char* what) {
   return result;
 }
 
-template <class Encode>
-Bytes encoded(Encode encode) {
-  unsigned char* der = nullptr;
-  const int length = encode(&der);
-  const std::unique_ptr<unsigned char, void (*)(unsigned char*)> owner(der, [](unsigned char* p) { OPENSSL_free(p); });
-  if (length <= 0) throw std::runtime_error("the key cannot be encoded");
-  return {der, der + length};
-}
-
 }  // namespace
 
 StorebagSigner::StorebagSigner(const std::string& keyName) {
-  static std::map<std::string, std::unique_ptr<EVP_PKEY, void (*)(EVP_PKEY*)>> keys;
-  auto found = keys.find(keyName);
-  if (found == keys.end()) {
-    EVP_PKEY* made = must(EVP_RSA_gen(2048), "no key");
-    found = keys.emplace(keyName, std::unique_ptr<EVP_PKEY, void (*)(EVP_PKEY*)>(made, EVP_PKEY_free)).first;
-  }
-  _key = found->second.get();
+  static std::map<std::string, std::shared_ptr<EVP_PKEY>> keys;
+  auto& key = keys[keyName];
+  if (!key) key.reset(must(EVP_RSA_gen(2048), "no key"), EVP_PKEY_free);
+  _key = key.get();
 }
 
 Bytes StorebagSigner::publicKeyDer(KeyLayout layout) const {
   auto* key = static_cast<EVP_PKEY*>(_key);
-  if (layout == KeyLayout::subjectPublicKeyInfo)
-    return encoded([&](unsigned char** der) { return i2d_PUBKEY(key, der); });
-  return encoded([&](unsigned char** der) { return i2d_PublicKey(key, der); });
+  const auto encode = layout == KeyLayout::pkcs1 ? i2d_PublicKey : i2d_PUBKEY;
+  Bytes der(static_cast<std::size_t>(must(std::max(encode(key, nullptr), 0), "the key cannot be encoded")));
+  unsigned char* to = der.data();
+  encode(key, &to);
+  return der;
 }
 
-Bytes StorebagSigner::sign(std::span<const std::uint8_t> bag, SigningDigest digest) const {
+Bytes StorebagSigner::sign(std::span<const std::uint8_t> bag) const {
   const std::unique_ptr<EVP_MD_CTX, void (*)(EVP_MD_CTX*)> context(EVP_MD_CTX_new(), EVP_MD_CTX_free);
-  const EVP_MD* algorithm = digest == SigningDigest::sha1 ? EVP_sha1() : EVP_sha256();
   Bytes signature(512);
   std::size_t length = signature.size();
-  must(EVP_DigestSignInit(context.get(), nullptr, algorithm, nullptr, static_cast<EVP_PKEY*>(_key)) == 1, "init");
+  must(EVP_DigestSignInit(context.get(), nullptr, EVP_sha1(), nullptr, static_cast<EVP_PKEY*>(_key)) == 1, "init");
   must(EVP_DigestSign(context.get(), signature.data(), &length, bag.data(), bag.size()) == 1, "sign");
   signature.resize(length);
   return signature;

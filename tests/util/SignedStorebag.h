@@ -13,7 +13,6 @@ using Bytes = std::vector<std::uint8_t>;
 
 enum class PlistForm { xml, binary };
 enum class KeyLayout { subjectPublicKeyInfo, pkcs1 };
-enum class SigningDigest { sha1, sha256 };
 
 // A storebag server's side: a key pair, made once per name and process, and documents signed with it. Failures throw.
 class StorebagSigner {
@@ -21,7 +20,7 @@ class StorebagSigner {
   explicit StorebagSigner(const std::string& keyName = "server");
 
   Bytes publicKeyDer(KeyLayout layout) const;
-  Bytes sign(std::span<const std::uint8_t> bag, SigningDigest digest = SigningDigest::sha1) const;
+  Bytes sign(std::span<const std::uint8_t> bag) const;
   // The whole document around a bag's bytes.
   std::string document(std::span<const std::uint8_t> bag, PlistForm form = PlistForm::xml) const;
   std::string document(const platform::Dictionary& bag, PlistForm form = PlistForm::xml) const;
