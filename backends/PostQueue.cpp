@@ -139,9 +139,7 @@ class PostQueue::Room {
     _queue->_waitingBytes += _bytes;
     return true;
   }
-  bool isFree() const {
-    return _queue->_waitingBytes == 0 || _queue->_waitingBytes + _bytes <= kMaximumWaitingBytes;
-  }
+  bool isFree() const { return _queue->_waitingBytes == 0 || _queue->_waitingBytes + _bytes <= kMaximumWaitingBytes; }
 
   std::shared_ptr<PostQueue> _queue;  // null once moved from
   const std::size_t _bytes;

@@ -112,7 +112,9 @@ Encoded benchEncode(test::TestPlatform& device) {
       records.back().prepare(nullptr, filters);
       events[i].record = &records[i];
     }
-    return createMessageForPostAndLogging(1'700'000'001.5 + static_cast<double>(first) * 37e-6, "0B7C2F9C-0000-0000-0000-000000000000", events, false).json;
+    return createMessageForPostAndLogging(1'700'000'001.5 + static_cast<double>(first) * 37e-6,
+                                          "0B7C2F9C-0000-0000-0000-000000000000", events, false)
+        .json;
   };
   Encoded encoded;
   for (std::size_t i = 0; i < kBodies; ++i) {

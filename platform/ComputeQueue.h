@@ -18,7 +18,8 @@ using Job = UniqueFunction<void()>;
 class ComputeThreads;
 
 // A serial queue beside the event loop, for jobs that compute for long, such as compressing: they hold up nobody who
-// waits for the loop. Its jobs run one at a time, in the order in which they were posted, on a thread of their own kind.
+// waits for the loop. Its jobs run one at a time, in the order in which they were posted, on a thread of their own
+// kind.
 //
 // Shared: each pending job keeps it alive. Any thread may call it. Jobs must not throw.
 class ComputeQueue final : public std::enable_shared_from_this<ComputeQueue> {

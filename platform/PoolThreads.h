@@ -11,9 +11,9 @@ namespace platform {
 
 // The threads of a WorkPool: a fixed number, and extra ones that stand in for threads that block.
 //
-// Owned by its pool. An extra thread steps in when fewer than the fixed number would be left to run jobs. It steps aside
-// as soon as it is superfluous, since threads that share a loop wake each other, and ends when it has not been needed
-// for kLinger. All operations may be called from any thread.
+// Owned by its pool. An extra thread steps in when fewer than the fixed number would be left to run jobs. It steps
+// aside as soon as it is superfluous, since threads that share a loop wake each other, and ends when it has not been
+// needed for kLinger. All operations may be called from any thread.
 class PoolThreads {
  public:
   static constexpr std::chrono::milliseconds kLinger{1000};
@@ -65,7 +65,7 @@ class PoolThreads {
   std::condition_variable _needed;
   // Guarded by _mutex.
   std::list<std::thread> _threads;
-  std::thread _retired;  // ended or about to, joined by whoever comes next
+  std::thread _retired;      // ended or about to, joined by whoever comes next
   std::size_t _running = 0;  // those called back and not yet awake included
   std::size_t _blocked = 0;
   std::size_t _aside = 0;

@@ -13,8 +13,9 @@ class WorkQueue;
 class Timer;
 class DescriptorWatch;
 
-// The threads that carry out everybody's jobs: one event loop served by a small pool, and as many more for compute queues
-// once there is such a job. The fewer serve the loop, the fewer are woken for jobs that take less than waking does.
+// The threads that carry out everybody's jobs: one event loop served by a small pool, and as many more for compute
+// queues once there is such a job. The fewer serve the loop, the fewer are woken for jobs that take less than waking
+// does.
 //
 // Owned by main (or by a client library instance, or a test) and outlives every queue, timer and watch made from it.
 // All operations may be called from any thread unless they say otherwise. Jobs must not throw.
@@ -89,8 +90,8 @@ class DescriptorWatch {
   virtual void cancel() = 0;
 };
 
-// Held around what blocks a thread of the pool, or keeps it busy for long: meanwhile the pool runs one more thread, so that blocked jobs
-// never starve others. On threads that belong to no pool it does nothing.
+// Held around what blocks a thread of the pool, or keeps it busy for long: meanwhile the pool runs one more thread, so
+// that blocked jobs never starve others. On threads that belong to no pool it does nothing.
 class BlockingScope {
  public:
   BlockingScope();

@@ -1,0 +1,139 @@
+#include "platform/ComputeQueue.h"
+
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <atomic>
+#include <filesystem>
+#include <future>
+#include <iterator>
+#include <memory>
+#include <vector>
+
+#include "platform/WorkQueue.h"
+#include "tests/platform/Waiting.h"
+
+namespace platform {
+namespace {
+
+using orvanta::test::Counter;
+using orvanta::test::eventually;
+using namespace std::chrono_literals;
+
+std::ptrdiff_t threadsOfProcess() {
+  return std::distance(std::filesystem::directory_iterator("/proc/self/task"), {});
+}
+
+TEST(ComputeQueueTest, RunsItsJobsInTheirOrderWhileTheLoopGoesOn) {
+  WorkPool pool(1);
+  const auto compute = pool.makeComputeQueue(), other = pool.makeComputeQueue();
+  const auto queue = pool.makeQueue();
+  const auto before = threadsOfProcess();
+  pool.start();
+  EXPECT_EQ(threadsOfProcess(), before + 1) << "none for computing before there is a job";
+  Counter loopRan, done;
+  std::vector<int> order;  // no lock: each queue is one, and one thread serves both
+  for (int i = 0; i < 100; ++i) {
+    (i % 2 == 0 ? compute : other)->post([&, i] {
+      if (i == 0) {
+        queue->post([&] { loopRan.add(); });
+        loopRan.waitFor(1);
+      }
+      order.push_back(i);
+      done.add();
+    });
+  }
+  ASSERT_TRUE(done.waitFor(100));
+  EXPECT_TRUE(pool.drain(10s));
+  pool.stop();
+  std::vector<int> even, odd;
+  for (const int i : order) (i % 2 == 0 ? even : odd).push_back(i);
+  EXPECT_TRUE(std::is_sorted(even.begin(), even.end()));
+  EXPECT_TRUE(std::is_sorted(odd.begin(), odd.end()));
+}
+
+TEST(ComputeQueueTest, DrainWaitsForItsJobs) {
+  WorkPool pool(1);
+  pool.start();
+  std::promise<void> release;
+  pool.makeComputeQueue()->post([released = release.get_future()] { released.wait(); });
+  EXPECT_FALSE(pool.drain(0ms));
+  release.set_value();
+  EXPECT_TRUE(pool.drain(10s));
+}
+
+// What jobs own may post when it goes, and holds queues of both kinds.
+TEST(ComputeQueueTest, DropsWhatHasNotBegunWhenThePoolStops) {
+  struct PostsWhenDropped {
+    explicit PostsWhenDropped(std::shared_ptr<ComputeQueue> computeQueue, std::shared_ptr<WorkQueue> workQueue,
+                              std::atomic<int>& count)
+        : compute(std::move(computeQueue)), queue(std::move(workQueue)), dropped(count) {}
+    ~PostsWhenDropped() {
+      ++dropped;
+      compute->post([] { ADD_FAILURE(); });
+      queue->post([] { ADD_FAILURE(); });
+    }
+    const std::shared_ptr<ComputeQueue> compute;
+    const std::shared_ptr<WorkQueue> queue;
+    std::atomic<int>& dropped;
+  };
+  std::atomic<int> dropped = 0;
+  std::shared_ptr<ComputeQueue> survivor;
+  {
+    WorkPool pool(1);
+    const auto compute = pool.makeComputeQueue(), other = pool.makeComputeQueue();
+    const auto queue = pool.makeQueue();
+    survivor = other;
+    Counter begun;
+    std::promise<void> release;
+    compute->post([&begun, released = release.get_future()] {
+      begun.add();
+      released.wait();
+    });
+    for (const auto& each : {compute, other}) {
+      each->post([owned = std::make_unique<PostsWhenDropped>(compute, queue, dropped)] { ADD_FAILURE(); });
+    }
+    pool.start();
+    begun.waitFor(1);
+    auto stopped = std::async(std::launch::async, [&pool] { pool.stop(); });
+    EXPECT_EQ(stopped.wait_for(20ms), std::future_status::timeout) << "a running job ends first";
+    release.set_value();
+    stopped.get();
+    EXPECT_EQ(dropped, 2);
+  }
+  survivor->post([] { ADD_FAILURE(); });
+}
+
+TEST(BlockingScopeTest, AStandInStepsAsideAtOnceAndIsCalledBack) {
+  WorkPool pool(1);
+  pool.start();
+  const auto blocked = pool.makeQueue(), other = pool.makeQueue();
+  pid_t standIn = 0;
+  for (int turn = 0; turn < 3; ++turn) {
+    Counter ran, done;
+    std::atomic<pid_t> helper = 0;
+    blocked->post([&] {
+      {
+        const BlockingScope scope;
+        other->post([&] {
+          helper = ::gettid();
+          ran.add();
+        });
+        ran.waitFor(1);
+      }
+      done.add();
+    });
+    ASSERT_TRUE(done.waitFor(1));
+    EXPECT_TRUE(turn == 0 || helper == standIn) << "another thread was started";
+    standIn = helper;
+    // Whichever of the two waits for the next job: after one each, one thread serves the loop.
+    ASSERT_TRUE(eventually([&] {
+      other->post([] {});
+      return pool.threadCount() == 1;
+    }));
+  }
+}
+
+}  // namespace
+}  // namespace platform
