@@ -1,61 +1,45 @@
 #include "platform/PropertyList.h"
 
-#include <gtest/gtest.h>
-
 #include <sys/stat.h>
 
+#include "tests/platform/CodecRows.h"
 #include "tests/support/Bytes.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace platform {
 namespace {
 
-using orvanta::test::bytesOf;
-using orvanta::test::toHex;
+using namespace orvanta::test;
 
 TEST(PropertyList, ChoosesTheFormByTheFirstBytes) {
   const Value value = Dictionary{{"a", 1}};
-  const Result<std::string> xml = writeXmlPropertyList(value);
-  const Result<std::vector<std::uint8_t>> binary = writeBinaryPropertyList(value);
-  EXPECT_EQ(*parsePropertyList(bytesOf(*xml)), value);
-  EXPECT_EQ(*parsePropertyList(*binary), value);
-  const std::pair<std::string_view, const char*> refusals[] = {
-      {"", "empty"},
-      {"bplist15 and so on, long enough for a trailer of 32 bytes", "not a \"bplist00\" at byte 0"},
-      {"bplist0", "too short"},
-      {"{ a = 1; }", "outside the root"},
-      {R"({"a": 1})", "outside the root"},
-      {"<html><body/></html>", "\"html\""},
-      {"\xff\xfe<\0p\0", "no UTF-8"},
+  EXPECT_EQ(*parsePropertyList(bytesOf(*writeXmlPropertyList(value))), value);
+  EXPECT_EQ(*parsePropertyList(*writeBinaryPropertyList(value)), value);
+  const RefusedRows<std::string_view> refusals = {
+      {"empty", {""}},
+      {"not a \"bplist00\" at byte 0", {"bplist15 and so on, long enough for a trailer of 32 bytes"}},
+      {"too short", {"bplist0"}},
+      {"outside the root", {"{ a = 1; }", R"({"a": 1})"}},
+      {"\"html\"", {"<html><body/></html>"}},
+      {"no UTF-8", {"\xff\xfe<\0p\0"}},
   };
-  for (const auto& [text, expected] : refusals) {
-    const Result<Value> parsed = parsePropertyList(bytesOf(text));
-    ASSERT_FALSE(parsed.ok()) << text;
-    EXPECT_NE(parsed.error().find(expected), std::string::npos) << text << ": " << parsed.error();
-  }
+  expectRefusals([](std::string_view text) { return parsePropertyList(bytesOf(text)); }, refusals);
 }
 
 TEST(PropertyList, ReadsFilesAndNamesThemInErrors) {
-  const orvanta::test::TemporaryDirectory directory;
+  const TemporaryDirectory directory;
   const std::string good = directory.write("good.plist", *writeXmlPropertyList(Array{true}));
   EXPECT_EQ(*readPropertyListFile(good), Value(Array{true}));
-  const std::string large = directory.write("large.plist", std::string(1001, ' '));
   const std::string fifo = directory / "fifo";
   ASSERT_EQ(::mkfifo(fifo.c_str(), 0600), 0);
-  const std::pair<std::string, const char*> refusals[] = {
-      {directory / "missing.plist", "No such file"},
-      {directory.path(), "no regular file"},
-      {fifo, "no regular file"},
-      {directory.write("empty.plist", ""), "empty"},
-      {directory.write("bad.plist", "<plist>"), "byte"},
-      {large, "more than 1000 bytes"},
+  const RefusedRows<std::string> refusals = {
+      {"missing.plist: No such file", {directory / "missing.plist"}},
+      {"no regular file", {directory.path(), fifo}},
+      {"empty.plist: ", {directory.write("empty.plist", "")}},
+      {"bad.plist: ", {directory.write("bad.plist", "<plist>")}},
+      {"more than 1000 bytes", {directory.write("large.plist", std::string(1001, ' '))}},
   };
-  for (const auto& [path, expected] : refusals) {
-    const Result<Value> read = readPropertyListFile(path, {10, 10, 1000});
-    ASSERT_FALSE(read.ok()) << path;
-    EXPECT_EQ(read.error().find(path + ": "), 0U) << read.error();
-    EXPECT_NE(read.error().find(expected), std::string::npos) << read.error();
-  }
+  expectRefusals([](const std::string& path) { return readPropertyListFile(path, {10, 10, 1000}); }, refusals);
 }
 
 TEST(Base64, EncodesAndDecodes) {

@@ -14,50 +14,37 @@ constexpr std::int64_t kMinimum = std::numeric_limits<std::int64_t>::min();
 constexpr double kInfinity = std::numeric_limits<double>::infinity();
 
 TEST(Value, Readings) {
-  struct Row {
-    Value given;
+  const struct {
+    std::vector<Value> given;
     std::int64_t integer;
     double real;
     std::optional<bool> boolean;
+  } rows[] = {
+      {{Value(), Data{{1}}, Date{5}, Array{1}, Dictionary{{"a", 1}}}, 0, 0, std::nullopt},
+      {{true}, 1, 1, true},
+      {{std::uint64_t{18446744073709551615U}}, -1, 18446744073709551615.0, true},
+      {{2.9}, 2, 2.9, true},
+      {{0.25}, 0, 0.25, true},
+      {{1e300}, kMaximum, 1e300, true},
+      {{-kInfinity}, kMinimum, -kInfinity, true},
+      {{"12", " \t+12ab"}, 12, 12, true},
+      {{"-3.75e1x"}, -3, -37.5, true},
+      {{".5"}, 0, 0.5, true},
+      {{"9223372036854775808"}, kMaximum, 9223372036854775808.0, true},
+      {{"-9223372036854775809"}, kMinimum, -9223372036854775809.0, true},
+      {{"1e999"}, 1, kInfinity, true},
+      {{"1e-999"}, 1, 0, false},
+      {{"YES", "tRuE"}, 0, 0, true},
+      {{false, "inf", "--1", "", "0", "yesterday", "no"}, 0, 0, false},
   };
-  const Row rows[] = {
-      {Value(), 0, 0, std::nullopt},
-      {true, 1, 1, true},
-      {false, 0, 0, false},
-      {-7, -7, -7, true},
-      {std::uint64_t{18446744073709551615U}, -1, 18446744073709551615.0, true},
-      {2.9, 2, 2.9, true},
-      {-2.9, -2, -2.9, true},
-      {0.25, 0, 0.25, true},
-      {1e300, kMaximum, 1e300, true},
-      {-kInfinity, kMinimum, -kInfinity, true},
-      {"12", 12, 12, true},
-      {" \t+12ab", 12, 12, true},
-      {"-3.75e1x", -3, -37.5, true},
-      {".5", 0, 0.5, true},
-      {"9223372036854775808", kMaximum, 9223372036854775808.0, true},
-      {"-9223372036854775809", kMinimum, -9223372036854775809.0, true},
-      {"1e999", 1, kInfinity, true},
-      {"1e-999", 1, 0, false},
-      {"inf", 0, 0, false},
-      {"--1", 0, 0, false},
-      {"", 0, 0, false},
-      {"0", 0, 0, false},
-      {"YES", 0, 0, true},
-      {"tRuE", 0, 0, true},
-      {"yesterday", 0, 0, false},
-      {"no", 0, 0, false},
-      {Data{{1}}, 0, 0, std::nullopt},
-      {Date{5}, 0, 0, std::nullopt},
-      {Array{1}, 0, 0, std::nullopt},
-      {Dictionary{{"a", 1}}, 0, 0, std::nullopt},
-  };
-  for (const Row& row : rows) {
-    SCOPED_TRACE(row.given.description());
-    EXPECT_EQ(row.given.integerValue(), row.integer);
-    EXPECT_EQ(row.given.doubleValue(), row.real);
-    EXPECT_EQ(row.given.booleanReading(), row.boolean);
-    EXPECT_EQ(row.given.boolValue(), row.boolean.value_or(false));
+  for (const auto& row : rows) {
+    for (const Value& given : row.given) {
+      SCOPED_TRACE(given.description());
+      EXPECT_EQ(given.integerValue(), row.integer);
+      EXPECT_EQ(given.doubleValue(), row.real);
+      EXPECT_EQ(given.booleanReading(), row.boolean);
+      EXPECT_EQ(given.boolValue(), row.boolean.value_or(false));
+    }
   }
   EXPECT_EQ(Value(std::nan("")).integerValue(), 0);
   EXPECT_FALSE(Value(std::nan("")).boolValue());
@@ -75,32 +62,28 @@ TEST(Value, Descriptions) {
   const std::pair<Value, const char*> rows[] = {
       {Value(), "null"},
       {true, "1"},
-      {-12, "-12"},
       {std::uint64_t{18446744073709551615U}, "18446744073709551615"},
       {0.1, "0.1"},
-      {3.0, "3"},
       {"text as it is\n", "text as it is\n"},
       {Date{-1.5}, "1969-12-31 23:59:58 +0000"},
-      {Date{951782399}, "2000-02-28 23:59:59 +0000"},
       {Date{1e300}, "1e+300 s since 1970"},
       {Data{{0, 0xab}}, "<00ab>"},
       {Array{}, "{}"},
       {Dictionary{{"b", Array{1, "x"}}, {"a", 2}}, "{a = 2, b = {1, x}}"},
   };
   for (const auto& [given, expected] : rows) EXPECT_EQ(given.description(), expected);
-}
 
-TEST(Value, DescriptionsOfContainersAndDataAreBounded) {
+  // Those of containers and data are bounded.
   Value deep = 1;
   for (int i = 0; i < 1000; ++i) deep = Array{std::move(deep)};
-  const Value rows[] = {
+  const Value large[] = {
       Data{std::vector<std::uint8_t>(1'000'000)},
       Array(100'000, Value("element")),
       Array{std::string(1'000'000, 'x'), 1},
       Dictionary{{std::string(1'000'000, 'k'), 1}},
       deep,
   };
-  for (const Value& row : rows) {
+  for (const Value& row : large) {
     EXPECT_LT(row.description().size(), 5000U);
     EXPECT_NE(row.description().find("…"), std::string::npos);
   }
@@ -119,16 +102,10 @@ TEST(Dictionary, KeepsKeysSortedAndUnique) {
 }
 
 TEST(Dictionary, MergePrefersTheOthersValues) {
-  const Dictionary rows[][3] = {
-      {{{"a", 1}, {"c", 1}}, {{"b", 2}, {"c", 2}, {"d", 2}}, {{"a", 1}, {"b", 2}, {"c", 2}, {"d", 2}}},
-      {{}, {{"a", 2}}, {{"a", 2}}},
-      {{{"a", 1}}, {}, {{"a", 1}}},
-  };
-  for (const auto& [mine, theirs, expected] : rows) {
-    Dictionary merged = mine;
-    merged.merge(theirs);
-    EXPECT_EQ(merged, expected);
-  }
+  Dictionary merged{{"a", 1}, {"c", 1}};
+  merged.merge({{"b", 2}, {"c", 2}, {"d", 2}});
+  merged.merge({});
+  EXPECT_EQ(merged, (Dictionary{{"a", 1}, {"b", 2}, {"c", 2}, {"d", 2}}));
 }
 
 TEST(Dictionary, FromUniqueEntriesSortsOrRefuses) {
