@@ -1,7 +1,6 @@
 #include "tests/platform/ConnectionFixture.h"
 
 #include <poll.h>
-#include <sys/socket.h>
 #include <sys/time.h>
 
 #include <cstring>
@@ -85,29 +84,6 @@ bool RecordingDelegate::waitForInvalidation() {
   return waitFor([&] { return _invalidations > 0; }) && _afterTheEnd == 0;
 }
 
-std::vector<std::string> RecordingDelegate::methods() const {
-  const std::lock_guard lock(_mutex);
-  std::vector<std::string> result;
-  for (const auto& frame : _frames) result.push_back(frame.method);
-  return result;
-}
-std::size_t RecordingDelegate::frameCount() const {
-  const std::lock_guard lock(_mutex);
-  return _frames.size();
-}
-int RecordingDelegate::interruptions() const {
-  const std::lock_guard lock(_mutex);
-  return _interruptions;
-}
-int RecordingDelegate::invalidations() const {
-  const std::lock_guard lock(_mutex);
-  return _invalidations;
-}
-std::optional<std::string> RecordingDelegate::protocolError() const {
-  const std::lock_guard lock(_mutex);
-  return _protocolError;
-}
-
 Peer::Peer(platform::UniqueFd socket) : _socket(std::move(socket)) {
   const timeval patience{kHangGuard.count(), 0};
   ::setsockopt(fd(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
@@ -152,12 +128,9 @@ Bytes Peer::read(std::size_t count) const {
 }
 
 Bytes Peer::readToEnd() const {
-  Bytes all;
-  for (;;) {
-    const Bytes part = read(1U << 16U);
-    all.insert(all.end(), part.begin(), part.end());
-    if (part.size() < (1U << 16U)) return all;
-  }
+  Bytes all = read(1U << 16U);
+  for (Bytes part = all; part.size() == (1U << 16U);) all = std::move(all) + (part = read(1U << 16U));
+  return all;
 }
 
 bool Peer::atEnd() const {
@@ -169,17 +142,6 @@ bool Peer::atEnd() const {
 bool Peer::hasBytes() const {
   pollfd entry{fd(), POLLIN, 0};
   return ::poll(&entry, 1, 0) == 1;
-}
-
-void Peer::shutdownSending() const {
-  ::shutdown(fd(), SHUT_WR);
-}
-void Peer::shutdownReceiving() const {
-  ::shutdown(fd(), SHUT_RD);
-}
-
-ConnectionFixture::ConnectionFixture() {
-  startPool(2);
 }
 
 void ConnectionFixture::startPool(std::size_t threads) {

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <gtest/gtest.h>
+#include <sys/socket.h>
 
 #include <condition_variable>
 #include <cstdint>
@@ -43,15 +44,26 @@ class RecordingDelegate final : public platform::ConnectionDelegate {
   bool waitForInterruption();
   bool waitForInvalidation();
 
-  std::vector<std::string> methods() const;  // of the frames so far
-  std::size_t frameCount() const;
-  int interruptions() const;
-  int invalidations() const;
-  std::optional<std::string> protocolError() const;
+  // So far.
+  std::vector<std::string> methods() const {
+    const std::lock_guard lock(_mutex);
+    std::vector<std::string> result;
+    for (const auto& frame : _frames) result.push_back(frame.method);
+    return result;
+  }
+  std::size_t frameCount() const { return methods().size(); }
+  int interruptions() const { return locked(_interruptions); }
+  int invalidations() const { return locked(_invalidations); }
+  std::optional<std::string> protocolError() const { return locked(_protocolError); }
 
  private:
   template <class Condition>
   bool waitFor(Condition condition);
+  template <class T>
+  T locked(const T& value) const {
+    const std::lock_guard lock(_mutex);
+    return value;
+  }
 
   mutable std::mutex _mutex;
   std::condition_variable _changed;
@@ -78,8 +90,8 @@ class Peer {
   Bytes readToEnd() const;
   bool atEnd() const;  // waits for the end of the stream; false when bytes come instead
   bool hasBytes() const;
-  void shutdownSending() const;
-  void shutdownReceiving() const;
+  void shutdownSending() const { ::shutdown(fd(), SHUT_WR); }
+  void shutdownReceiving() const { ::shutdown(fd(), SHUT_RD); }
   void close() { _socket.reset(); }
 
  private:
@@ -89,7 +101,7 @@ class Peer {
 // A running pool, and connections whose other ends the test holds.
 class ConnectionFixture : public ::testing::Test {
  protected:
-  ConnectionFixture();
+  ConnectionFixture() { startPool(2); }
 
   struct Made {
     std::shared_ptr<platform::Connection> connection;

@@ -7,8 +7,6 @@
 #include <sys/stat.h>
 #include <sys/wait.h>
 
-#include <algorithm>
-#include <array>
 #include <atomic>
 #include <cstdlib>
 #include <memory>
@@ -39,23 +37,20 @@ const std::string kService = "test.service";
 
 class ListenerTest : public ConnectionFixture {
  protected:
-  // Admits everybody, and keeps what was admitted.
+  // Admits everybody.
   Listener::Handler admitting() {
     return [this](OfferedConnection&& offered) {
-      const auto delegate = std::make_shared<RecordingDelegate>();
-      offered.connection->resume(delegate);
-      const std::lock_guard lock(_mutex);
-      _peers.push_back(offered.peer);
-      _descriptions.push_back(offered.connection->description());
+      offered.connection->resume(std::make_shared<RecordingDelegate>());
       _admitted.add();
       return true;
     };
   }
-  static Listener::Handler refusing() {
-    return [](OfferedConnection&&) { return false; };
+  static bool refuse(OfferedConnection&& /*offered*/) { return false; }
+  platform::Result<std::unique_ptr<Listener>> create(Listener::Handler handler) {
+    return Listener::create(*_pool, _directory.path(), kService, std::move(handler));
   }
   std::unique_ptr<Listener> listen(Listener::Handler handler) {
-    auto listener = Listener::create(*_pool, _directory.path(), kService, std::move(handler));
+    auto listener = create(std::move(handler));
     EXPECT_TRUE(listener.ok()) << listener.error();
     if (!listener) return nullptr;
     (*listener)->resume();
@@ -73,9 +68,6 @@ class ListenerTest : public ConnectionFixture {
 
   TemporaryDirectory _directory;
   Counter _admitted;
-  std::mutex _mutex;
-  std::vector<platform::PeerIdentity> _peers;  // guarded by _mutex
-  std::vector<std::string> _descriptions;      // guarded by _mutex
 };
 
 UniqueFd listeningSocket(const std::string& path, bool listening = true) {
@@ -88,28 +80,41 @@ UniqueFd listeningSocket(const std::string& path, bool listening = true) {
   return socket;
 }
 
+std::vector<gid_t> ownGroups() {
+  std::vector<gid_t> groups(static_cast<std::size_t>(::getgroups(0, nullptr)));
+  groups.resize(static_cast<std::size_t>(::getgroups(static_cast<int>(groups.size()), groups.data())));
+  return groups;
+}
+
 TEST_F(ListenerTest, OffersEveryConnectionWithItsPeer) {
-  const auto listener = listen(admitting());
+  const std::string who = " (pid " + std::to_string(::getpid()) + ", uid " + std::to_string(::geteuid()) + ")";
+  const auto listener = listen([&, admit = admitting()](OfferedConnection&& offered) {
+    EXPECT_EQ(offered.peer.pid, ::getpid());
+    EXPECT_EQ(offered.peer.uid, ::geteuid());
+    EXPECT_EQ(offered.peer.gid, ::getegid());
+    EXPECT_THAT(offered.peer.groups, ::testing::UnorderedElementsAreArray(ownGroups()));
+    EXPECT_EQ(offered.peer.label.find('\0'), std::string::npos);
+    EXPECT_THAT(offered.connection->description(),
+                ::testing::AllOf(::testing::StartsWith("fd "), ::testing::EndsWith(who)));
+    return admit(std::move(offered));
+  });
   std::vector<Peer> peers;
   for (int i = 0; i < 50; ++i) peers.push_back(connect());
   ASSERT_TRUE(_admitted.waitFor(50));
   listener->stop();
-  for (const auto& peer : _peers) {
-    EXPECT_EQ(peer.pid, ::getpid());
-    EXPECT_EQ(peer.uid, ::geteuid());
-  }
-  const std::string who = " (pid " + std::to_string(::getpid()) + ", uid " + std::to_string(::geteuid()) + ")";
-  EXPECT_THAT(_descriptions, ::testing::Each(::testing::AllOf(::testing::StartsWith("fd "), ::testing::EndsWith(who))));
+  const UniqueFd unconnected(::socket(AF_UNIX, SOCK_STREAM, 0));
+  const UniqueFd internet(::socket(AF_INET, SOCK_STREAM, 0));
+  for (const int nobody : {unconnected.get(), internet.get(), -1}) EXPECT_FALSE(platform::peerIdentityOf(nobody).ok());
 }
 
-TEST_F(ListenerTest, ClosesWhatTheHandlerRefuses) {
-  const auto listener = listen(refusing());
-  EXPECT_TRUE(connect().atEnd());
-}
-
-TEST_F(ListenerTest, AcceptsNothingBeforeResume) {
-  auto listener = Listener::create(*_pool, _directory.path(), kService, admitting());
+TEST_F(ListenerTest, EverybodyMayConnectWhateverTheMaskButNobodyIsAcceptedBeforeResume) {
+  const mode_t before = ::umask(0077);
+  auto listener = create(admitting());
+  ::umask(before);
   ASSERT_TRUE(listener.ok());
+  struct stat status {};
+  ASSERT_EQ(::stat(socketPath().c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 07777U, 0666U);
   const Peer early = connect();
   EXPECT_EQ(_admitted.value(), 0);
   (*listener)->resume();
@@ -117,39 +122,10 @@ TEST_F(ListenerTest, AcceptsNothingBeforeResume) {
   (*listener)->stop();
 }
 
-TEST_F(ListenerTest, EverybodyMayConnectWhateverTheMask) {
-  const mode_t before = ::umask(0077);
-  const auto listener = listen(refusing());
-  ::umask(before);
-  struct stat status {};
-  ASSERT_EQ(::stat(socketPath().c_str(), &status), 0);
-  EXPECT_EQ(status.st_mode & 07777U, 0666U);
-}
-
-TEST_F(ListenerTest, ReplacesAStaleSocket) {
-  { const UniqueFd gone = listeningSocket(socketPath()); }
-  LogCapture log;
-  const auto listener = listen(admitting());
-  EXPECT_EQ(log.count("stale socket"), 1U);
-  const Peer peer = connect();
-  EXPECT_TRUE(_admitted.waitFor(1));
-  listener->stop();
-}
-
-TEST_F(ListenerTest, RefusesToListenBesideALiveOne) {
-  const auto listener = listen(admitting());
-  const auto second = Listener::create(*_pool, _directory.path(), kService, refusing());
-  ASSERT_FALSE(second.ok());
-  EXPECT_THAT(second.error(), HasSubstr("Process " + std::to_string(::getpid()) + " listens at " + socketPath()));
-  const Peer peer = connect();
-  EXPECT_TRUE(_admitted.waitFor(1)) << "the first one listens on";
-  listener->stop();
-}
-
 // One that knows nothing of our lock.
 TEST_F(ListenerTest, LeavesAForeignLiveSocketAlone) {
   const UniqueFd foreign = listeningSocket(socketPath());
-  const auto listener = Listener::create(*_pool, _directory.path(), kService, refusing());
+  const auto listener = create(refuse);
   ASSERT_FALSE(listener.ok());
   EXPECT_THAT(listener.error(), HasSubstr("Process " + std::to_string(::getpid())));
   EXPECT_TRUE(connectToService(_directory.path(), kService).ok());
@@ -167,7 +143,7 @@ TEST_F(ListenerTest, SaysWhatStandsInTheWay) {
       {_directory.path(), std::string(120, 'x'), "File name too long"},
   };
   for (const auto& row : rows) {
-    const auto listener = Listener::create(*_pool, row.directory, row.service, refusing());
+    const auto listener = Listener::create(*_pool, row.directory, row.service, refuse);
     ASSERT_FALSE(listener.ok()) << row.service;
     EXPECT_THAT(listener.error(), HasSubstr(row.reason));
   }
@@ -177,16 +153,17 @@ TEST_F(ListenerTest, SaysWhatStandsInTheWay) {
 TEST_F(ListenerTest, OfSeveralThatStartAtOnceOneWins) {
   { const UniqueFd gone = listeningSocket(socketPath()); }
   constexpr int kStarters = 8;
-  std::vector<std::unique_ptr<Listener>> winners;
-  std::vector<std::string> errors;
+  std::mutex mutex;
+  std::vector<std::unique_ptr<Listener>> winners;  // guarded by mutex
+  std::vector<std::string> errors;                 // guarded by mutex
   Counter ready;
   std::vector<std::thread> starters;
   for (int i = 0; i < kStarters; ++i) {
     starters.emplace_back([&] {
       ready.add();
       ready.waitFor(kStarters);
-      auto listener = Listener::create(*_pool, _directory.path(), kService, admitting());
-      const std::lock_guard lock(_mutex);
+      auto listener = create(admitting());
+      const std::lock_guard lock(mutex);
       if (listener) {
         winners.push_back(std::move(*listener));
       } else {
@@ -215,7 +192,7 @@ TEST_F(ListenerTest, StopRemovesItsSocketAndFreesTheName) {
 }
 
 TEST_F(ListenerTest, StopLeavesASocketThatIsNotItsOwn) {
-  const auto listener = listen(refusing());
+  const auto listener = listen(refuse);
   ASSERT_EQ(::unlink(socketPath().c_str()), 0);
   const UniqueFd foreign = listeningSocket(socketPath());
   listener->stop();
@@ -244,7 +221,7 @@ TEST_F(ListenerTest, StopWaitsForHandlersUnderWay) {
 TEST_F(ListenerTest, AHandlerMayStopItsListener) {
   std::unique_ptr<Listener> listener;
   Counter stopped;
-  auto made = Listener::create(*_pool, _directory.path(), kService, [&](OfferedConnection&&) {
+  auto made = create([&](OfferedConnection&&) {
     listener->stop();
     stopped.add();
     return false;
@@ -303,7 +280,7 @@ TEST_F(ListenerTest, PausesWhenDescriptorsRunOutAndGoesOn) {
   GTEST_SKIP() << "the sanitizer looks at objects through a pipe, for which this test leaves no descriptor";
 #endif
   LogCapture log;
-  auto listener = Listener::create(*_pool, _directory.path(), kService, admitting());
+  auto listener = create(admitting());
   ASSERT_TRUE(listener.ok());
   const Peer first = connect();
   const Peer second = connect();
@@ -336,12 +313,11 @@ TEST_F(ListenerTest, RepliesStillGoOutWhenDescriptorsRunOut) {
 // descriptor 3.
 TEST_F(ListenerTest, TakesTheSocketOfTheServiceManager) {
   if (std::getenv("LISTEN_FDS") != nullptr) {
-    const auto listener = Listener::create(*_pool, "/nonexistent", kService, [&](OfferedConnection&& offered) {
-      offered.connection->outbox()->send(notification("activated"));
-      offered.connection->resume(std::make_shared<RecordingDelegate>());
-      _admitted.add();
-      return true;
-    });
+    const auto listener =
+        Listener::create(*_pool, "/nonexistent", kService, [admit = admitting()](OfferedConnection&& offered) {
+          offered.connection->outbox()->send(notification("activated"));
+          return admit(std::move(offered));
+        });
     ASSERT_TRUE(listener.ok()) << listener.error();
     (*listener)->resume();
     ASSERT_TRUE(_admitted.waitFor(1));
@@ -350,21 +326,12 @@ TEST_F(ListenerTest, TakesTheSocketOfTheServiceManager) {
   }
 
   const UniqueFd listening = listeningSocket(socketPath());
-  std::array<char, 32> process{};
-  std::vector<std::string> environment = {"LISTEN_FDS=1"};
-  std::vector<char*> variables;
-  for (char** variable = environ; *variable != nullptr; ++variable) variables.push_back(*variable);
-  variables.insert(variables.end(), {environment[0].data(), process.data(), nullptr});
   const pid_t child = ::fork();
   if (child == 0) {
-    std::snprintf(process.data(), process.size(), "LISTEN_PID=%d", ::getpid());
-    if (listening.get() == 3) {
-      ::fcntl(3, F_SETFD, 0);
-    } else {
-      ::dup2(listening.get(), 3);
-    }
-    ::execle("/proc/self/exe", "test", "--gtest_filter=ListenerTest.TakesTheSocketOfTheServiceManager",
-             static_cast<char*>(nullptr), variables.data());
+    ::setenv("LISTEN_FDS", "1", 1);
+    ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
+    ::dup2(::dup(listening.get()), 3);  // not closed when the program starts, whatever number it had
+    ::execl("/proc/self/exe", "test", "--gtest_filter=ListenerTest.TakesTheSocketOfTheServiceManager", nullptr);
     ::_exit(127);
   }
   ASSERT_GT(child, 0);
