@@ -25,91 +25,72 @@ TEST_F(HttpAnswerTest, Bodies) {
     int status;
     std::string body;
   } rows[] = {
-      {RawServer::response("200 OK", {}, "hello"), 200, "hello"},
       {"HTTP/1.1 200 OK\r\n\r\nuntil the end", 200, "until the end"},
       {"HTTP/1.0 404 Not Found\r\n\r\n", 404, ""},
       {"HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\n3\r\nabc\r\n2;x=y\r\nde\r\n0\r\nX-Trailer: 1\r\n\r\n", 200,
        "abcde"},
       {RawServer::response("200 OK", "Content-Encoding: gzip\r\n", gzipped), 200, gzipped},
-      {"HTTP/1.1 100 Continue\r\n\r\nHTTP/1.1 103 Early Hints\r\nX-A: no\r\n\r\n" +
-           RawServer::response("201 Made", {}, "x"),
-       201, "x"},
+      {"HTTP/1.1 103 Early Hints\r\nX-A: no\r\n\r\n" + RawServer::response("201 Made", {}, "x"), 201, "x"},
       {"HTTP/1.1 204 No Content\r\n\r\n", 204, ""},
       {"HTTP/1.1 304 Not Modified\r\nContent-Length: 99\r\n\r\n", 304, ""},
-      {RawServer::response("503 Gone Fishing", {}, "later"), 503, "later"},
-      {RawServer::response("599 Odd", {}, {}), 599, ""},
       {RawServer::response("302 No Target", {}, "stay"), 302, "stay"},
+      {RawServer::response("599 Odd", {}, "later"), 599, "later"},
   };
   for (const auto& row : rows) {
-    const HttpResult result = after(row.answer);
-    ASSERT_TRUE(result.response) << row.answer << ": " << result.error;
-    EXPECT_EQ(result.response->status, row.status);
-    EXPECT_EQ(result.response->body, row.body);
-    EXPECT_EQ(result.response->header("X-A"), nullptr);
-    EXPECT_EQ(result.response->header("X-Trailer"), nullptr);
-    EXPECT_TRUE(result.error.empty());
+    HttpRequest request;
+    for (request.discardResponseBody = false;; request.discardResponseBody = true) {
+      const HttpResult result = after(row.answer, request);
+      ASSERT_TRUE(result.response) << row.answer << ": " << result.error;
+      EXPECT_EQ(result.response->status, row.status);
+      EXPECT_EQ(result.response->body, request.discardResponseBody ? "" : row.body);
+      EXPECT_EQ(result.response->header("X-A"), nullptr);
+      EXPECT_EQ(result.response->header("X-Trailer"), nullptr);
+      EXPECT_TRUE(result.error.empty());
+      if (request.discardResponseBody) break;
+    }
   }
 }
 
 TEST_F(HttpAnswerTest, Headers) {
-  const HttpResult result = after(RawServer::response(
-      "200 OK",
-      "Cache-Control:  max-age=600 \r\nlast-modified: Tue, 01 Jan 2030 00:00:00 GMT\r\nX-Empty:\r\nX-Twice: 1\r\n"
-      "X-Twice: 2\r\nX-Folded: one\r\n   two\r\n"));
+  const HttpResult result =
+      after(RawServer::response("200 OK",
+                                "Cache-Control:  max-age=600 \r\nlast-modified: Tue\r\nX-Empty:\r\nX-Twice: 1\r\n"
+                                "X-Twice: 2\r\nX-Folded: one\r\n   two\r\n"));
   ASSERT_TRUE(result.response) << result.error;
-  const auto value = [&](const char* name) {
-    const std::string* found = result.response->header(name);
-    return found != nullptr ? *found : "(none)";
-  };
-  EXPECT_EQ(value("cache-control"), "max-age=600");
-  EXPECT_EQ(value("Last-Modified"), "Tue, 01 Jan 2030 00:00:00 GMT");
-  EXPECT_EQ(value("X-Empty"), "");
-  EXPECT_EQ(value("X-Twice"), "1");
-  EXPECT_EQ(value("X-Folded"), "one two");
-  EXPECT_EQ(value("X-Twic"), "(none)");
-}
-
-TEST_F(HttpAnswerTest, ABodyNobodyWantsIsThrownAway) {
-  HttpRequest request;
-  request.discardResponseBody = true;
-  const HttpResult result = after(RawServer::response("200 OK", "X-A: 1\r\n", std::string(100000, 'x')), request);
-  ASSERT_TRUE(result.response) << result.error;
-  EXPECT_TRUE(result.response->body.empty());
-  EXPECT_NE(result.response->header("x-a"), nullptr);
+  const std::pair<const char*, const char*> rows[] = {{"cache-control", "max-age=600"},
+                                                      {"Last-Modified", "Tue"},
+                                                      {"X-Empty", ""},
+                                                      {"X-Twice", "1"},
+                                                      {"X-Folded", "one two"}};
+  for (const auto& [name, value] : rows) {
+    ASSERT_NE(result.response->header(name), nullptr) << name;
+    EXPECT_EQ(*result.response->header(name), value) << name;
+  }
+  EXPECT_EQ(result.response->header("X-Twic"), nullptr);
 }
 
 TEST_F(HttpAnswerTest, BrokenAnswersAreErrors) {
-  const struct {
-    const char* what;
-    std::string answer;
-  } rows[] = {
-      {"nothing", ""},
-      {"not HTTP", "SSH-2.0-OpenSSH\r\n\r\n"},
-      {"half a status line", "HTTP/1.1 20"},
-      {"a header without a colon", "HTTP/1.1 200 OK\r\nnonsense\r\nContent-Length: 0\r\n\r\n"},
-      {"a body cut short", "HTTP/1.1 200 OK\r\nContent-Length: 10\r\n\r\nabc"},
-      {"a chunk cut short", "HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\nff\r\nabc"},
-      {"no last chunk", "HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\n3\r\nabc\r\n"},
-      {"a chunk size that is none", "HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\nzz\r\nabc\r\n0\r\n\r\n"},
-      {"a negative length", "HTTP/1.1 200 OK\r\nContent-Length: -5\r\n\r\nabc"},
+  const std::string answers[] = {
+      "",
+      "SSH-2.0-OpenSSH\r\n\r\n",
+      "HTTP/1.1 20",
+      "HTTP/1.1 200 OK\r\nnonsense\r\nContent-Length: 0\r\n\r\n",
+      "HTTP/1.1 200 OK\r\nContent-Length: 10\r\n\r\nabc",
+      "HTTP/1.1 200 OK\r\nContent-Length: -5\r\n\r\nabc",
+      "HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\nff\r\nabc",
+      "HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\n3\r\nabc\r\n",
+      "HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\nzz\r\nabc\r\n0\r\n\r\n",
   };
-  for (const auto& row : rows) {
-    const HttpResult result = after(row.answer);
-    EXPECT_FALSE(result.response) << row.what;
-    EXPECT_FALSE(result.error.empty()) << row.what;
-  }
-}
-
-TEST_F(HttpAnswerTest, ResetsAreErrors) {
-  for (const std::string& answer : {std::string(), std::string("HTTP/1.1 200 OK\r\nContent-Length: 10\r\n\r\nabc")}) {
-    RawServer server([&](RawConnection& connection) {
-      if (!connection.readRequest()) return;
-      connection.write(answer);
-      connection.reset();
-    });
-    const HttpResult result = perform(post(server.url()));
-    EXPECT_FALSE(result.response);
-    EXPECT_FALSE(result.error.empty());
+  for (const std::string& answer : answers) {
+    for (const bool reset : {false, true}) {
+      SCOPED_TRACE(answer);
+      RawServer server([&](RawConnection& connection) {
+        if (!connection.readRequest()) return;
+        connection.write(answer);
+        if (reset) connection.reset();
+      });
+      expectError(perform(post(server.url())));
+    }
   }
 }
 
@@ -118,8 +99,7 @@ TEST_F(HttpAnswerTest, EndlessAnswersAreCut) {
   limits.responseBytes = 100'000;
   makeClient(limits);
   EXPECT_EQ(statusOf(after(RawServer::response("200 OK", {}, std::string(100'000, 'x')))), 200) << "just fits";
-  EXPECT_TRUE(
-      has(after(RawServer::response("200 OK", {}, std::string(100'001, 'x'))).error, "larger than 100000 bytes"));
+  expectError(after(RawServer::response("200 OK", {}, std::string(100'001, 'x'))), "larger than 100000 bytes");
   const struct {
     std::string begin, rest;
     const char* error;
@@ -139,10 +119,7 @@ TEST_F(HttpAnswerTest, EndlessAnswersAreCut) {
       });
       HttpRequest request = get(server.url());
       request.discardResponseBody = discard;
-      const HttpResult result = perform(std::move(request));
-      EXPECT_FALSE(result.response) << row.rest;
-      EXPECT_FALSE(result.error.empty()) << row.rest;
-      EXPECT_TRUE(has(result.error, row.error)) << result.error;
+      expectError(perform(std::move(request)), row.error);
     }
   }
 }
@@ -157,17 +134,13 @@ TEST_F(HttpAnswerTest, SilentServersAreGivenUp) {
       connection.write(answer);
       connection.waitForClose();
     });
-    const HttpResult result = perform(get(server.url()));
-    EXPECT_TRUE(has(result.error, "too slow")) << result.error;
+    expectError(perform(get(server.url())), "too slow");
   }
 }
 
 TEST_F(HttpAnswerTest, TimeoutsEndWhatTakesTooLong) {
   using std::chrono::milliseconds;
-  RawServer silent([](RawConnection& connection) {
-    connection.readRequest();
-    connection.waitForClose();
-  });
+  RawServer silent(beSilent);
   // Progress all the time, so that only the request's own time can end it.
   RawServer dribbling([](RawConnection& connection) {
     connection.readRequest();
@@ -185,12 +158,9 @@ TEST_F(HttpAnswerTest, TimeoutsEndWhatTakesTooLong) {
   for (const RawServer* server : {&silent, &dribbling, &redirecting}) {
     HttpRequest request = within(milliseconds(200), get(server->url()));
     request.discardResponseBody = true;
-    const HttpResult result = perform(std::move(request));
-    EXPECT_FALSE(result.response);
-    EXPECT_EQ(result.error, "Timed out after 200 ms, waiting for the answer");
+    expectError(perform(std::move(request)), "Timed out after 200 ms, waiting for the answer");
   }
-  EXPECT_TRUE(has(perform(within(milliseconds(-1), get(silent.url()))).error, "Timed out"));
-  EXPECT_TRUE(has(perform(within(milliseconds(0), get(silent.url()))).error, "Timed out"));
+  for (const int none : {-1, 0}) expectError(perform(within(milliseconds(none), get(silent.url()))), "Timed out");
 }
 
 }  // namespace

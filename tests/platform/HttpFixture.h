@@ -59,6 +59,19 @@ class HttpFixture : public testing::Test {
     return future.get();
   }
 
+  // An error whose text holds that part.
+  static void expectError(const HttpResult& result, const std::string& part = {}) {
+    EXPECT_FALSE(result.response);
+    EXPECT_FALSE(result.error.empty());
+    EXPECT_TRUE(has(result.error, part)) << result.error;
+  }
+  static orvanta::test::RawServer::Script answering(std::string_view status) {
+    return orvanta::test::RawServer::answering(orvanta::test::RawServer::response(status));
+  }
+  static void beSilent(orvanta::test::RawConnection& connection) {
+    connection.readRequest();
+    connection.waitForClose();
+  }
   static int statusOf(const HttpResult& result) { return result.response ? result.response->status : -1; }
   static bool has(const std::string& text, const std::string& part) { return text.find(part) != std::string::npos; }
 

@@ -21,25 +21,28 @@ class HttpMessageTest : public HttpFixture {
   }
   std::string host() const { return fmt::format("Host: 127.0.0.1:{}\r\n", _server.port()); }
 
-  RawServer _server{RawServer::answering(RawServer::response("200 OK"))};
+  RawServer _server{answering("200 OK")};
   LogCapture _log;
 };
 
-TEST_F(HttpMessageTest, NothingIsAddedButHost) {
+TEST_F(HttpMessageTest, NothingIsAddedButHostAndTheLength) {
+  const std::string large(3U << 20U, 'b');  // without Expect
   EXPECT_EQ(sent(get(_server.url("/a?b=c"))), "GET /a?b=c HTTP/1.1\r\n" + host() + "\r\n");
-  EXPECT_EQ(sent(post(_server.url("/"), "")), "POST / HTTP/1.1\r\n" + host() + "Content-Length: 0\r\n\r\n");
-  EXPECT_EQ(sent(post(_server.url("/"), "x")), "POST / HTTP/1.1\r\n" + host() + "Content-Length: 1\r\n\r\nx");
+  for (const std::string& body : {std::string(), std::string("a\0b\n", 4), large}) {
+    EXPECT_EQ(sent(post(_server.url("/"), body)),
+              "POST / HTTP/1.1\r\n" + host() + fmt::format("Content-Length: {}\r\n\r\n", body.size()) + body);
+  }
+  EXPECT_EQ(sent(get(_server.url(), {{"X-A", "1"}, {"Host", "example.org"}})),
+            "GET / HTTP/1.1\r\nHost: example.org\r\nX-A: 1\r\n\r\n");
 }
 
 TEST_F(HttpMessageTest, HeadersKeepTheirOrder) {
   const Headers headers{{"X-ORV-Client-Name", "Mail"},  {"User-Agent", "Orvanta/8.0 (Parva3,2; 12.5)"},
-                        {"X-ORV-Sender", "7"},          {"X-ORV-Event-Map", "3 1"},
                         {"Accept", "application/json"}, {"Content-Type", "application/json"},
                         {"Content-Length", "4"},        {"Content-Encoding", "gzip"}};
   std::string expected = "POST /p HTTP/1.1\r\n" + host();
   for (const HttpHeader& header : headers) expected += header.name + ": " + header.value + "\r\n";
-  EXPECT_EQ(sent(post(_server.url("/p"), std::string("a\0b\n", 4), headers)),
-            expected + "\r\n" + std::string("a\0b\n", 4));
+  EXPECT_EQ(sent(post(_server.url("/p"), "body", headers)), expected + "\r\nbody");
 }
 
 TEST_F(HttpMessageTest, WhatBecomesOfEachHeader) {
@@ -47,14 +50,11 @@ TEST_F(HttpMessageTest, WhatBecomesOfEachHeader) {
     HttpHeader header;
     std::string expected;  // in place of the header; empty: left out, with a warning
   } rows[] = {
-      {{"X-A", "plain"}, "X-A: plain\r\n"},
       {{"X-A", "gr\xc3\xbc\xc3\x9f"}, "X-A: gr\xc3\xbc\xc3\x9f\r\n"},
       {{"X-A", ""}, "X-A:\r\n"},
-      {{"X-A", "   "}, "X-A:\r\n"},
       {{"X-A", "a;b: c, \"d\""}, "X-A: a;b: c, \"d\"\r\n"},
       {{"Connection", "close"}, "Connection: close\r\n"},
       {{"X-A", "a\r\nX-Evil: 1"}, ""},
-      {{"X-A", "a\nb"}, ""},
       {{"X-A", std::string("a\0b", 3)}, ""},
       {{"X-A", "a\tb"}, ""},
       {{"X-A", "a\x7f"}, ""},
@@ -90,17 +90,6 @@ TEST_F(HttpMessageTest, ContentLengthIsTrueWhateverTheCallerSays) {
   EXPECT_EQ(sent(get(_server.url(), {{"Content-Length", "5"}})), "GET / HTTP/1.1\r\n" + host() + "\r\n");
 }
 
-TEST_F(HttpMessageTest, LargeBodiesGoOutWholeAndWithoutExpect) {
-  const std::string body(3U << 20U, 'b');
-  EXPECT_EQ(sent(post(_server.url(), body)),
-            "POST / HTTP/1.1\r\n" + host() + fmt::format("Content-Length: {}\r\n\r\n", body.size()) + body);
-}
-
-TEST_F(HttpMessageTest, AGivenHostStandsAtItsPlace) {
-  EXPECT_EQ(sent(get(_server.url(), {{"X-A", "1"}, {"Host", "example.org"}})),
-            "GET / HTTP/1.1\r\nHost: example.org\r\nX-A: 1\r\n\r\n");
-}
-
 // The handle and the connection are used again; nothing of one request may show in the next.
 TEST_F(HttpMessageTest, RequestsDoNotMixOnOneConnection) {
   const auto lane = client().makeLane();
@@ -132,12 +121,10 @@ TEST_F(HttpMessageTest, RefusesWhatCannotBeSent) {
     std::string url;
     const char* error;
   } rows[] = {
-      {"PUT", _server.url(), "Unsupported method PUT"},
       {"get", _server.url(), "Unsupported method get"},
       {"GET", "", "neither http nor https"},
       {"GET", "127.0.0.1/x", "neither http nor https"},
       {"GET", "file:///etc/passwd", "neither http nor https"},
-      {"GET", "ftp://127.0.0.1/", "neither http nor https"},
       {"GET", "httpx://127.0.0.1/", "neither http nor https"},
       {"GET", _server.url("/a b"), "Malformed URL"},
       {"GET", _server.url(std::string("/a\0b", 4)), "Malformed URL"},
@@ -151,10 +138,8 @@ TEST_F(HttpMessageTest, RefusesWhatCannotBeSent) {
   for (const auto& row : rows) {
     HttpRequest request = get(row.url);
     request.method = row.method;
-    const HttpResult result = perform(std::move(request));
-    EXPECT_FALSE(result.response) << row.url;
-    EXPECT_FALSE(result.error.empty()) << row.url;
-    EXPECT_TRUE(has(result.error, row.error)) << row.url << ": " << result.error;
+    SCOPED_TRACE(row.url);
+    expectError(perform(std::move(request)), row.error);
   }
   EXPECT_TRUE(_server.requests().empty());
 }

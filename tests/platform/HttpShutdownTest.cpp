@@ -70,10 +70,6 @@ using std::chrono::seconds;
 
 class HttpShutdownTest : public HttpFixture {
  protected:
-  static void beSilent(RawConnection& connection) {
-    connection.readRequest();
-    connection.waitForClose();
-  }
   std::future<HttpResult> performInThread(const std::shared_ptr<HttpLane>& lane, HttpRequest request) {
     return std::async(std::launch::async, [this, lane, request = std::move(request)]() mutable {
       return client().perform(lane, std::move(request));
@@ -82,7 +78,7 @@ class HttpShutdownTest : public HttpFixture {
 };
 
 TEST_F(HttpShutdownTest, RequestsThatEndInTimeGetTheirAnswers) {
-  RawServer server(RawServer::answering(RawServer::response("200 OK")));
+  RawServer server(answering("200 OK"));
   const auto lane = client().makeLane();
   std::vector<std::future<HttpResult>> results;
   for (int i = 0; i < 30; ++i) results.push_back(start(lane, post(server.url())));
@@ -98,7 +94,7 @@ TEST_F(HttpShutdownTest, TheRestFailsAndCompletes) {
   auto blocked = performInThread(client().makeLane(), get(server.url()));
   ASSERT_TRUE(server.waitForRequests(2));
   client().shutdown(milliseconds(1));
-  for (auto* result : {&inFlight, &waiting, &blocked}) EXPECT_TRUE(has(await(*result).error, "shutting down"));
+  for (auto* result : {&inFlight, &waiting, &blocked}) expectError(await(*result), "shutting down");
   EXPECT_EQ(server.requests().size(), 2U);
   auto late = start(lane, post(server.url()));
   EXPECT_EQ(await(late).error, "The HTTP client has been shut down");
@@ -110,7 +106,7 @@ TEST_F(HttpShutdownTest, DestructionEndsWhatIsInFlight) {
   auto result = start(client().makeLane(), post(server.url()));
   ASSERT_TRUE(server.waitForRequests(1));
   _client.reset();
-  EXPECT_FALSE(await(result).error.empty());
+  expectError(await(result));
 }
 
 TEST_F(HttpShutdownTest, AHangingResolverHoldsNobody) {
@@ -118,11 +114,11 @@ TEST_F(HttpShutdownTest, AHangingResolverHoldsNobody) {
   auto result = start(client().makeLane(), post(url));
   auto blocked = performInThread(client().makeLane(), get(url));
   ASSERT_TRUE(gResolver.waitUntilHanging());
-  EXPECT_TRUE(has(perform(within(milliseconds(100), get(url))).error, "Timed out after 100 ms, not connected"));
+  expectError(perform(within(milliseconds(100), get(url))), "Timed out after 100 ms, not connected");
   client().abortBlockingRequests();
-  EXPECT_TRUE(has(await(blocked).error, "Aborted"));
+  expectError(await(blocked), "Aborted");
   _client.reset();
-  EXPECT_TRUE(has(await(result).error, "shutting down"));
+  expectError(await(result), "shutting down");
   EXPECT_TRUE(gResolver.hanging());
   gResolver.release();
 }
@@ -142,9 +138,9 @@ TEST_F(HttpShutdownTest, AbortingEndsBlockedCallersOnly) {
   ASSERT_TRUE(silent.waitForRequests(1) && slow.waitForRequests(1));
   auto waiting = performInThread(lane, get(silent.url()));
   client().abortBlockingRequests();
-  EXPECT_TRUE(has(await(inFlight).error, "Aborted"));
-  EXPECT_TRUE(has(await(waiting).error, "Aborted"));
-  EXPECT_TRUE(has(perform(get(slow.url())).error, "Aborted"));
+  expectError(await(inFlight), "Aborted");
+  expectError(await(waiting), "Aborted");
+  expectError(perform(get(slow.url())), "Aborted");
   EXPECT_EQ(silent.requests().size(), 1U);
   gate.set_value();
   EXPECT_EQ(statusOf(await(other)), 200) << "nobody waits for this one";
@@ -152,7 +148,7 @@ TEST_F(HttpShutdownTest, AbortingEndsBlockedCallersOnly) {
 
 // Every request ends once, whoever hands in, aborts and shuts down at the same time.
 TEST_F(HttpShutdownTest, EveryRequestEndsExactlyOnce) {
-  RawServer server(RawServer::answering(RawServer::response("200 OK")));
+  RawServer server(answering("200 OK"));
   for (int round = 0; round < 10; ++round) {
     makeClient();
     std::atomic<int> started{0};
