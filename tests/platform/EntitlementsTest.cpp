@@ -40,73 +40,68 @@ std::string number(const std::string& key, const std::string& value) {
   return "<key>" + key + "</key><integer>" + value + "</integer>";
 }
 
-struct Row {
-  const char* name;
-  std::string content;
-  bool granted;
-  const char* logged = nullptr;  // part of the one line; null: none
-};
+const std::string kUser = number("user", "4711");
 
-class EntitlementsTest : public ::testing::TestWithParam<Row> {};
-
-TEST_P(EntitlementsTest, ReadsOneFile) {
-  const TemporaryDirectory directory;
-  directory.write("grant.plist", GetParam().content);
-  LogCapture log;
-  Entitlements entitlements(directory.path());
-  EXPECT_EQ(entitlements.holds(somebody(), kGranted), GetParam().granted);
-  EXPECT_FALSE(entitlements.holds(somebody(), "com.example.mayNot"));
-  if (GetParam().logged == nullptr) {
-    EXPECT_TRUE(log.lines().empty()) << log.lines().front();
-  } else {
-    EXPECT_EQ(log.count(GetParam().logged), 1U);
+TEST(EntitlementsTest, ReadsOneFile) {
+  const struct {
+    std::string content;
+    bool granted;
+    const char* logged = nullptr;  // part of the one line; null: none
+  } rows[] = {
+      {grant(kUser), true},
+      {grant(text("user", "4711")), true},
+      {grant(number("group", "4712")), true},
+      {grant(text("group", "4713")), true},
+      {grant(text("group", "daemon")), true},
+      {grant(text("label", "trusted_t")), true},
+      {grant(kUser, "<integer>2</integer>"), true},
+      {grant(kUser, "<string>YES</string>"), true},
+      // What matches nobody here, or says no.
+      {grant(number("user", "4712")), false},
+      {grant(number("group", "4711")), false},
+      {grant(text("user", "root")), false},
+      {grant(text("label", "trusted")), false},
+      {grant(kUser, "<false/>"), false},
+      {grant(kUser, "<integer>0</integer>"), false},
+      {grant(kUser, "<string>NO</string>"), false},
+      {grant(kUser, "<array><true/></array>"), false},
+      // What makes no sense.
+      {"user: 4711", false, "grant.plist"},
+      {"<plist><array/></plist>", false, "no dictionary"},
+      {grant(""), false, "exactly one of"},
+      {grant(kUser + number("group", "4712")), false, "exactly one of"},
+      {grant(number("users", "4711")), false, "unknown key \"users\", did you mean \"user\"?"},
+      {grant(kUser + text("expires", "never")), false, "unknown key \"expires\""},
+      {propertyList(kUser), false, "\"entitlements\" is missing"},
+      {propertyList(kUser + "<key>entitlements</key><array/>"), false, "is no dictionary"},
+      {grant(text("user", "no-such-user-here")), false, "there is no \"no-such-user-here\""},
+      {grant(text("group", "no-such-group-here")), false, "there is no"},
+      {grant(number("user", "-1")), false, "out of range"},
+      {grant(number("user", "4294971007")), false, "out of range"},
+      {grant(text("user", "4294971007")), false, "out of range"},
+      {grant(number("user", "4294967295")), false, "out of range"},
+      {grant("<key>user</key><true/>"), false, "neither a name nor a number"},
+      {grant("<key>user</key><real>4711</real>"), false, "neither a name nor a number"},
+      {grant(text("user", "")), false, "neither a name nor a number"},
+      {grant(text("label", "")), false, "\"label\" is no text"},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.content);
+    const TemporaryDirectory directory;
+    directory.write("grant.plist", row.content);
+    LogCapture log;
+    Entitlements entitlements(directory.path());
+    EXPECT_EQ(entitlements.holds(somebody(), kGranted), row.granted);
+    EXPECT_FALSE(entitlements.holds(somebody(), "com.example.mayNot"));
+    EXPECT_EQ(log.lines().size(), row.logged == nullptr ? 0U : 1U) << "once, however often it is read";
+    if (row.logged == nullptr) continue;
+    EXPECT_EQ(log.count(row.logged), 1U);
     EXPECT_EQ(log.count("grant.plist"), 1U) << "the file is named";
-    EXPECT_EQ(log.count("<4>"), 1U) << "once, however often it is read";
+    EXPECT_EQ(log.count("<4>"), 1U);
   }
 }
 
-INSTANTIATE_TEST_SUITE_P(
-    Files, EntitlementsTest,
-    ::testing::Values(
-        Row{"userNumber", grant(number("user", "4711")), true},
-        Row{"userNumberAsText", grant(text("user", "4711")), true},
-        Row{"groupNumber", grant(number("group", "4712")), true},
-        Row{"supplementaryGroup", grant(text("group", "4713")), true},
-        Row{"groupName", grant(text("group", "daemon")), true}, Row{"label", grant(text("label", "trusted_t")), true},
-        Row{"valueNumber", grant(number("user", "4711"), "<integer>2</integer>"), true},
-        Row{"valueYes", grant(number("user", "4711"), "<string>YES</string>"), true},
-        // What matches nobody here, or says no.
-        Row{"otherUser", grant(number("user", "4712")), false},
-        Row{"otherGroup", grant(number("group", "4711")), false},
-        Row{"otherUserName", grant(text("user", "root")), false},
-        Row{"otherLabel", grant(text("label", "trusted")), false},
-        Row{"valueFalse", grant(number("user", "4711"), "<false/>"), false},
-        Row{"valueZero", grant(number("user", "4711"), "<integer>0</integer>"), false},
-        Row{"valueNo", grant(number("user", "4711"), "<string>NO</string>"), false},
-        Row{"valueWithoutBooleanReading", grant(number("user", "4711"), "<array><true/></array>"), false},
-        // What makes no sense.
-        Row{"noPropertyList", "user: 4711", false, "grant.plist"},
-        Row{"noDictionary", "<plist><array/></plist>", false, "no dictionary"},
-        Row{"nobody", grant(""), false, "exactly one of"},
-        Row{"twoSubjects", grant(number("user", "4711") + number("group", "4712")), false, "exactly one of"},
-        Row{"misspelt", grant(number("users", "4711")), false, "unknown key \"users\", did you mean \"user\"?"},
-        Row{"extraKey", grant(number("user", "4711") + text("expires", "never")), false, "unknown key \"expires\""},
-        Row{"noEntitlements", propertyList(number("user", "4711")), false, "\"entitlements\" is missing"},
-        Row{"entitlementsNoDictionary", propertyList(number("user", "4711") + "<key>entitlements</key><array/>"), false,
-            "is no dictionary"},
-        Row{"unknownUser", grant(text("user", "no-such-user-here")), false, "there is no \"no-such-user-here\""},
-        Row{"unknownGroup", grant(text("group", "no-such-group-here")), false, "there is no"},
-        Row{"negativeUser", grant(number("user", "-1")), false, "out of range"},
-        Row{"userBeyond32Bits", grant(number("user", "4294971007")), false, "out of range"},
-        Row{"userTextBeyond32Bits", grant(text("user", "4294971007")), false, "out of range"},
-        Row{"nobodyAtAll", grant(number("user", "4294967295")), false, "out of range"},
-        Row{"userTrue", grant("<key>user</key><true/>"), false, "neither a name nor a number"},
-        Row{"userReal", grant("<key>user</key><real>4711</real>"), false, "neither a name nor a number"},
-        Row{"userEmpty", grant(text("user", "")), false, "neither a name nor a number"},
-        Row{"labelEmpty", grant(text("label", "")), false, "\"label\" is no text"}),
-    [](const auto& info) { return std::string(info.param.name); });
-
-TEST(EntitlementsDirectoryTest, AnyMatchingGrantThatReadsAsTrueCounts) {
+TEST(EntitlementsTest, AnyMatchingGrantThatReadsAsTrueCounts) {
   const TemporaryDirectory directory;
   Entitlements entitlements(directory.path());
   EXPECT_FALSE(entitlements.holds(somebody(), kGranted)) << "nothing is granted by default";
@@ -124,14 +119,14 @@ TEST(EntitlementsDirectoryTest, AnyMatchingGrantThatReadsAsTrueCounts) {
   EXPECT_TRUE(entitlements.holds(somebody(), kGranted)) << "read anew each time";
 }
 
-TEST(EntitlementsDirectoryTest, AnAbsentDirectoryGrantsNothing) {
+TEST(EntitlementsTest, AnAbsentDirectoryGrantsNothing) {
   LogCapture log;
   EXPECT_FALSE(Entitlements("/nonexistent/entitlements.d").holds(somebody(), kGranted));
   EXPECT_EQ(log.count("<5>Entitlements: /nonexistent/entitlements.d cannot be read"), 1U);
 }
 
 // Without a security module every label is empty: that must not match anything.
-TEST(EntitlementsDirectoryTest, APeerWithoutALabelMatchesNoLabel) {
+TEST(EntitlementsTest, APeerWithoutALabelMatchesNoLabel) {
   const TemporaryDirectory directory;
   directory.write("empty.plist", grant(text("label", "")));
   directory.write("other.plist", grant(text("label", "trusted_t")));

@@ -31,40 +31,34 @@ class ChangedEnvironment {
 };
 
 TEST(FileLocations, comeFromTheEnvironment) {
-  struct Row {
-    const char* given;   // to each variable; null: unset
-    std::string listed;  // what becomes of it where systemd may give several; empty: the default
-    std::string single;
-  };
-  const Row rows[] = {
+  // A variable's value, and what becomes of it where the service manager may give several paths, and elsewhere.
+  const struct {
+    const char* given;
+    std::optional<std::string> listed, single;  // none: the default
+  } rows[] = {
       {"/srv/a", "/srv/a", "/srv/a"},
-      {"/srv/a/", "/srv/a", "/srv/a"},
       {"/srv/a///", "/srv/a", "/srv/a"},
-      {"/srv/a:/srv/b", "/srv/a", "/srv/a:/srv/b"},
       {"/srv/a/:/srv/b", "/srv/a", "/srv/a/:/srv/b"},
       {"/", "/", "/"},
-      {":/srv/b", "", ":/srv/b"},
-      {"", "", ""},
-      {nullptr, "", ""},
+      {":/srv/b", {}, ":/srv/b"},
+      {"", {}, {}},
+      {nullptr, {}, {}},
   };
   const FileLocations defaults;
-  const auto orDefault = [](const std::string& expected, const std::string& fallback) {
-    return expected.empty() ? fallback : expected;
-  };
-  for (const Row& row : rows) {
-    const ChangedEnvironment environment({{"RUNTIME_DIRECTORY", row.given},
-                                          {"STATE_DIRECTORY", row.given},
-                                          {"CONFIGURATION_DIRECTORY", row.given},
-                                          {"ORVANTA_FRAMEWORK", row.given},
-                                          {"ORVANTA_PLUGINS", row.given},
-                                          {"ORVANTA_CA_FILE", row.given}});
+  for (const auto& [given, listed, single] : rows) {
+    const ChangedEnvironment environment({{"RUNTIME_DIRECTORY", given},
+                                          {"STATE_DIRECTORY", given},
+                                          {"CONFIGURATION_DIRECTORY", given},
+                                          {"ORVANTA_FRAMEWORK", given},
+                                          {"ORVANTA_PLUGINS", given},
+                                          {"ORVANTA_CA_FILE", given}});
     const FileLocations locations = FileLocations::fromEnvironment();
-    EXPECT_EQ(locations.runtimeDirectory, orDefault(row.listed, defaults.runtimeDirectory));
-    EXPECT_EQ(locations.stateDirectory, orDefault(row.listed, defaults.stateDirectory));
-    EXPECT_EQ(locations.configurationDirectory, orDefault(row.listed, defaults.configurationDirectory));
-    EXPECT_EQ(locations.frameworkDirectory, orDefault(row.single, defaults.frameworkDirectory));
-    EXPECT_EQ(locations.plugInsDirectory, orDefault(row.single, defaults.plugInsDirectory));
-    EXPECT_EQ(locations.caFile, row.single);
+    EXPECT_EQ(locations.runtimeDirectory, listed.value_or(defaults.runtimeDirectory));
+    EXPECT_EQ(locations.stateDirectory, listed.value_or(defaults.stateDirectory));
+    EXPECT_EQ(locations.configurationDirectory, listed.value_or(defaults.configurationDirectory));
+    EXPECT_EQ(locations.frameworkDirectory, single.value_or(defaults.frameworkDirectory));
+    EXPECT_EQ(locations.plugInsDirectory, single.value_or(defaults.plugInsDirectory));
+    EXPECT_EQ(locations.caFile, single.value_or(""));
   }
 }
 
@@ -90,35 +84,23 @@ TEST(Platform, makesEachOnceValueOnceWhateverThreadAsks) {
   EXPECT_EQ(another.get().once<Inner>([] { return Inner{5}; }).value, 5);
 }
 
-// What a once-value holds of the client and the pool must go while they are there: told by the order of the ends.
-struct Ends {
-  std::vector<std::string> order;
-};
+using Ends = std::vector<std::string>;
 
 class TellingHttpClient final : public HttpClient {
  public:
   explicit TellingHttpClient(Ends& ends) : _ends(ends) {}
-  ~TellingHttpClient() override { _ends.order.emplace_back("client destroyed"); }
+  ~TellingHttpClient() override { _ends.emplace_back("client destroyed"); }
   std::shared_ptr<HttpLane> makeLane(LaneKind) override { return std::make_shared<HttpLane>(); }
   void start(const std::shared_ptr<HttpLane>&, HttpRequest, Observer, Completion) override {}
   HttpResult perform(const std::shared_ptr<HttpLane>&, HttpRequest) override { return {}; }
   void abortBlockingRequests() override {}
-  void shutdown(std::chrono::milliseconds) override { _ends.order.emplace_back("client shut down"); }
+  void shutdown(std::chrono::milliseconds) override { _ends.emplace_back("client shut down"); }
 
  private:
   Ends& _ends;
 };
 
-struct Telling {
-  explicit Telling(Ends& told) : ends(&told) {}
-  Telling(Telling&& other) noexcept : ends(std::exchange(other.ends, nullptr)) {}
-  Telling& operator=(Telling&&) = delete;
-  ~Telling() {
-    if (ends != nullptr) ends->order.emplace_back("once-value destroyed");
-  }
-  Ends* ends;
-};
-
+// What a once-value holds of the client and the pool must go while they are there.
 TEST(Platform, endsItsPartsInOrder) {
   Ends ends;
   {
@@ -127,16 +109,16 @@ TEST(Platform, endsItsPartsInOrder) {
     parts.pool->start();
     parts.http = std::make_unique<TellingHttpClient>(ends);
     Platform platform(std::move(parts));
-    platform.once<Telling>([&] { return Telling(ends); });
+    using Telling = std::shared_ptr<void>;
+    platform.once<Telling>([&] { return Telling(nullptr, [&](void*) { ends.emplace_back("once-value destroyed"); }); });
     std::promise<void> ran;
     platform.pool().post([&] {
-      ends.order.emplace_back("job");
+      ends.emplace_back("job");
       ran.set_value();
     });
     ran.get_future().get();
   }
-  EXPECT_EQ(ends.order,
-            (std::vector<std::string>{"job", "client shut down", "once-value destroyed", "client destroyed"}));
+  EXPECT_EQ(ends, (Ends{"job", "client shut down", "once-value destroyed", "client destroyed"}));
 }
 
 }  // namespace

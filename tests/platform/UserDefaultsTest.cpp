@@ -2,10 +2,10 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <csignal>
 #include <filesystem>
 #include <fstream>
@@ -46,34 +46,22 @@ class UserDefaultsTest : public testing::Test {
   LogCapture _log;
 };
 
-TEST_F(UserDefaultsTest, ReadingsOfEachType) {
-  ASSERT_TRUE(_defaults.set("text", "hello"));
-  ASSERT_TRUE(_defaults.set("number", 42));
-  ASSERT_TRUE(_defaults.set("real", 0.5));
-  ASSERT_TRUE(_defaults.set("flag", true));
-  ASSERT_TRUE(_defaults.set("empty", ""));
+TEST_F(UserDefaultsTest, AnotherReadsWhatWasSetAndEachSettingSaysWhetherTheFileHadToChange) {
+  EXPECT_FALSE(*_defaults.set("text", nullptr));
+  EXPECT_FALSE(fs::exists(_defaults.path()));
+  EXPECT_TRUE(*_defaults.set("text", "hello"));
+  EXPECT_FALSE(*_defaults.set("text", "hello"));
+  EXPECT_TRUE(*_defaults.set("text", "other"));
+  EXPECT_TRUE(*_defaults.set("number", 42));
+  EXPECT_TRUE(*_defaults.set("flag", true));
+  EXPECT_TRUE(*_defaults.set("flag", nullptr));
   UserDefaults other(_directory.path(), kDomain);
   EXPECT_EQ(other.value("number"), Value(42));
-  EXPECT_EQ(other.text("text"), "hello");
   EXPECT_EQ(other.text("number"), "42");
-  EXPECT_EQ(other.text("real"), "0.5");
-  EXPECT_EQ(other.text("flag"), "1");
-  EXPECT_EQ(other.text("empty"), "");
-  EXPECT_EQ(other.text("absent"), std::nullopt);
-  EXPECT_EQ(other.value("absent"), std::nullopt);
-  EXPECT_EQ(other.all().size(), 5U);
+  EXPECT_EQ(other.text("text"), "other");
+  EXPECT_EQ(other.text("flag"), std::nullopt);
+  EXPECT_EQ(other.all().size(), 2U);
   EXPECT_TRUE(_log.lines().empty());
-}
-
-TEST_F(UserDefaultsTest, SetSaysWhetherTheFileHadToChange) {
-  EXPECT_FALSE(*_defaults.set("key", nullptr));
-  EXPECT_FALSE(fs::exists(_defaults.path()));
-  EXPECT_TRUE(*_defaults.set("key", "a"));
-  EXPECT_FALSE(*_defaults.set("key", "a"));
-  EXPECT_TRUE(*_defaults.set("key", "b"));
-  EXPECT_TRUE(*_defaults.set("key", nullptr));
-  EXPECT_EQ(_defaults.value("key"), std::nullopt);
-  EXPECT_TRUE(_defaults.all().empty());
 }
 
 // Same size, same second, and possibly the same inode again: none of it may hide a change.
@@ -92,21 +80,11 @@ TEST_F(UserDefaultsTest, NoticesEveryChangeByOthers) {
   EXPECT_EQ(_defaults.text("key"), std::nullopt);
 }
 
-TEST_F(UserDefaultsTest, WritingKeepsWhatOthersWroteMeanwhile) {
-  ASSERT_TRUE(_defaults.set("mine", 1));
-  replaceFile(_defaults.path(), plist("<key>theirs</key><string>2</string>"));
-  ASSERT_TRUE(_defaults.set("mine", 3));
-  EXPECT_EQ(_defaults.text("theirs"), "2");
-  EXPECT_EQ(_defaults.text("mine"), "3");
-}
-
 TEST_F(UserDefaultsTest, KeepsCorruptFilesAside) {
-  for (const std::string& bad : {std::string("<plist><dict><key>a</key>"), std::string(), std::string("bplist00\xff"),
-                                 std::string("<plist version=\"1.0\"><array/></plist>")}) {
+  for (const std::string bad : {"<plist><dict><key>a</key>", "", "bplist00\xff", "<plist><array/></plist>"}) {
     replaceFile(_defaults.path(), bad);
     _log.clear();
-    EXPECT_EQ(_defaults.value("a"), std::nullopt);
-    EXPECT_EQ(_defaults.value("a"), std::nullopt);
+    for (int i = 0; i < 2; ++i) EXPECT_EQ(_defaults.value("a"), std::nullopt);
     EXPECT_EQ(_log.count("<3>UserDefaults: " + _defaults.path() + " is no property list, kept aside as"), 1U) << bad;
     EXPECT_EQ(contentOf(_defaults.path() + ".corrupt"), bad);
     EXPECT_FALSE(fs::exists(_defaults.path()));
@@ -117,8 +95,7 @@ TEST_F(UserDefaultsTest, KeepsCorruptFilesAside) {
 
 TEST_F(UserDefaultsTest, NeverWritesOverWhatItCannotRead) {
   fs::create_directory(_defaults.path());  // stands in for a file without permission, which root would be able to read
-  EXPECT_EQ(_defaults.value("key"), std::nullopt);
-  EXPECT_EQ(_defaults.value("key"), std::nullopt);
+  for (int i = 0; i < 2; ++i) EXPECT_EQ(_defaults.value("key"), std::nullopt);
   EXPECT_EQ(_log.count("not a regular file"), 1U);
   const auto result = _defaults.set("key", 1);
   ASSERT_FALSE(result);
@@ -158,14 +135,11 @@ TEST_F(UserDefaultsTest, WorksThroughASymbolicLinkAndMakesItsDirectory) {
 }
 
 TEST_F(UserDefaultsTest, KeepsTheModeOfAFileAndMakesNewOnesPrivate) {
-  struct stat status {};
   ASSERT_TRUE(_defaults.set("key", 1));
-  ASSERT_EQ(::stat(_defaults.path().c_str(), &status), 0);
-  EXPECT_EQ(status.st_mode & 07777U, 0600U);
-  ::chmod(_defaults.path().c_str(), 0640);
+  EXPECT_EQ(fs::status(_defaults.path()).permissions(), fs::perms{0600});
+  fs::permissions(_defaults.path(), fs::perms{0640});
   ASSERT_TRUE(_defaults.set("key", 2));
-  ASSERT_EQ(::stat(_defaults.path().c_str(), &status), 0);
-  EXPECT_EQ(status.st_mode & 07777U, 0640U);
+  EXPECT_EQ(fs::status(_defaults.path()).permissions(), fs::perms{0640});
 }
 
 // Runs `body` in `count` child processes; true when all ended with status 0.
@@ -185,16 +159,22 @@ bool inProcesses(int count, Body body) {
   return ok;
 }
 
-TEST_F(UserDefaultsTest, WritersInSeveralProcessesLoseNothing) {
+TEST_F(UserDefaultsTest, WritersInSeveralProcessesAndThreadsLoseNothing) {
   constexpr int kProcesses = 4;
   constexpr int kWrites = 25;
   ASSERT_TRUE(inProcesses(kProcesses, [&](int process) {
     UserDefaults defaults(_directory.path(), kDomain);
-    bool ok = true;
-    for (int i = 0; i < kWrites; ++i) {
-      ok = defaults.set(std::to_string(process) + "/" + std::to_string(i), i).ok() && ok;
-    }
-    return ok;
+    std::atomic<int> written{0};
+    const auto write = [&](int first) {
+      for (int i = first; i < kWrites; i += 2) {
+        const std::string key = std::to_string(process) + "/" + std::to_string(i);
+        written += defaults.set(key, i).ok() && defaults.value(key) ? 1 : 0;
+      }
+    };
+    std::thread other(write, 1);
+    write(0);
+    other.join();
+    return written == kWrites;
   }));
   EXPECT_EQ(_defaults.all().size(), std::size_t{kProcesses * kWrites});
 }
@@ -252,20 +232,6 @@ TEST_F(UserDefaultsTest, AKilledWriterLeavesAWholeFile) {
     EXPECT_EQ(_defaults.text("padding")->size(), 20000U);
   }
   EXPECT_TRUE(_log.lines().empty());
-}
-
-TEST_F(UserDefaultsTest, ThreadsOfOneObject) {
-  std::vector<std::thread> threads;
-  for (int i = 0; i < 4; ++i) {
-    threads.emplace_back([&, i] {
-      for (int n = 0; n < 20; ++n) {
-        EXPECT_TRUE(_defaults.set(std::to_string(i) + "." + std::to_string(n), n));
-        EXPECT_TRUE(_defaults.value(std::to_string(i) + "." + std::to_string(n)));
-      }
-    });
-  }
-  for (auto& thread : threads) thread.join();
-  EXPECT_EQ(_defaults.all().size(), 80U);
 }
 
 }  // namespace
