@@ -68,20 +68,6 @@ TEST_F(Upload, passesTheOpenFileWithTheCall) {
   EXPECT_TRUE(std::filesystem::exists(path));
 }
 
-TEST_F(Upload, asksForAnAnswerEvenIfTheProgramDoesNot) {
-  session().uploadFileAtPath(files.write("f", "x"), {});
-  const auto call = nextUpload();
-  EXPECT_EQ(call.frame.kind, Frame::Kind::request);
-  peer->answer(call.frame, {false});
-  exchangeOneCall();
-}
-
-TEST_F(Upload, removesTheFileWhenAskedTo) {
-  const auto path = files.write("f", "x");
-  uploadAndRemove(path, [] {});
-  EXPECT_FALSE(std::filesystem::exists(path));
-}
-
 TEST_F(Upload, removesNoOtherFileThanTheOneItOpened) {
   const auto path = files.write("f", "mine");
   uploadAndRemove(path, [&] {
@@ -100,7 +86,7 @@ TEST_F(Upload, removesNoOtherFileThanTheOneItOpened) {
   EXPECT_TRUE(std::filesystem::is_symlink(swapped));
 }
 
-TEST_F(Upload, ofALinkRemovesTheFileBehindIt) {
+TEST_F(Upload, removesTheFileBehindALink) {
   const auto target = files.write("target", "x");
   const auto link = files / "link";
   std::filesystem::create_symlink(target, link);
@@ -170,6 +156,7 @@ TEST_F(Upload, keepsNoMoreDescriptorsWaitingThanTheDaemonAllows) {
   for (std::size_t i = 0; i < UploadTokens::kMaximumInFlight; ++i) {
     session().uploadFileAtPath(path, {});
     calls.push_back(nextUpload());
+    EXPECT_EQ(calls.back().frame.kind, Frame::Kind::request) << "the answer is wanted here";
   }
   Awaited<UploadReply> tooMany;
   session().uploadFileAtPath(path, tooMany.reply());
