@@ -14,12 +14,6 @@ class BatchingTest : public IntegrationFixture {
     return {.sessionID = 1, .clientType = 5, .requireUserInfo = requiresUserInfo, .batchEvent = true};
   }
   static UserInfo user() { return {"client", "service", {}}; }
-  // With a log level that costs nothing; the line that startDaemon() waits for is not written then.
-  void startQuietDaemon() {
-    options.logLevel = "4";
-    daemon = std::make_unique<DaemonProcess>(options);
-    ASSERT_TRUE(daemon->startQuietly());
-  }
   std::vector<collector::ReceivedRequest> posts() { return server->requests(RequestKind::events); }
   bool waitForPosts(std::size_t count) { return server->waitForRequests(RequestKind::events, count, kPatience); }
 };
@@ -39,7 +33,7 @@ TEST_F(BatchingTest, ARealtimeEventIsPrecededByWhatWaited) {
   EXPECT_EQ(received[2].path, "/events/realtime");
   const auto events = clientEvents();
   ASSERT_EQ(events.size(), 4U);
-  for (std::size_t i = 0; i < 4; ++i) EXPECT_EQ(events[i].event.find("_status")->integerValue(), std::int64_t(i) + 1);
+  for (std::size_t i = 0; i < 4; ++i) EXPECT_EQ(number(events[i], "_status"), std::int64_t(i) + 1);
   EXPECT_EQ(events[2].request, received[1].id);
   EXPECT_EQ(received[1].header("X-ORV-Event-Map"), nullptr);
   ASSERT_TRUE(reply) << "with consent the client sees what was sent";
@@ -47,19 +41,7 @@ TEST_F(BatchingTest, ARealtimeEventIsPrecededByWhatWaited) {
   EXPECT_NE(reply->find("\nStandalone event:\n"), std::string::npos);
 }
 
-TEST_F(BatchingTest, WithoutConsentNothingOfTheTextComesBack) {
-  options.device.set("DiagnosticsSubmissionAllowed", false);
-  setSection({{"http_post", httpPost(clientSection({{"override_dnu", 1}}))}});
-  startDaemon();
-  auto session = openSession(batching(), user());
-  send(*session, event(5, 1));
-  const auto answer = flush(*session);
-  EXPECT_EQ(answer.text, std::nullopt);
-  EXPECT_EQ(answer.error, std::nullopt);
-  ASSERT_TRUE(waitForClientEvents(1));
-}
-
-TEST_F(BatchingTest, WithoutConsentAndOverrideNothingLeaves) {
+TEST_F(BatchingTest, WithoutConsentNothingLeavesUnlessOverridden) {
   options.device.set("DiagnosticsSubmissionAllowed", false);
   startDaemon();
   BackendNames names;
@@ -71,6 +53,15 @@ TEST_F(BatchingTest, WithoutConsentAndOverrideNothingLeaves) {
   session.reset();
   EXPECT_EQ(daemon->terminate(), 0);
   EXPECT_TRUE(posts().empty());
+
+  setSection({{"http_post", httpPost(clientSection({{"override_dnu", 1}}))}});
+  startDaemon();
+  session = openSession(batching(), user());
+  send(*session, event(5, 1));
+  const auto answer = flush(*session);
+  EXPECT_EQ(answer.text, std::nullopt) << "nothing of the text comes back";
+  EXPECT_EQ(answer.error, std::nullopt);
+  ASSERT_TRUE(waitForClientEvents(1));
 }
 
 TEST_F(BatchingTest, AHeldSessionIsPromoted) {
@@ -174,8 +165,8 @@ TEST_F(BatchingTest, TenThousandEventsArriveOnceAndInOrderAndLeaveNoMemoryBehind
     std::map<std::int64_t, std::int64_t> next;  // category -> the event that comes next
     for (int category = 0; category < 40; ++category) next[100 + category] = category;
     for (const auto& received : events) {
-      const auto category = received.event.find("_method")->integerValue();
-      ASSERT_EQ(received.event.find("n")->integerValue(), next[category]) << "category " << category;
+      const auto category = number(received, "_method");
+      ASSERT_EQ(number(received, "n"), next[category]) << "category " << category;
       next[category] += 40;
     }
   };

@@ -14,7 +14,8 @@ TEST_F(EventDeliveryTest, AnEventStandsInTheInboxWithEveryReservedKeyAndItsType)
   EXPECT_EQ(names, (std::vector<std::string>{"http_post"}));
   send(*session, event(11, 12, {{"text", "hello"}, {"yes", true}, {"list", Array{1}}, {"day", platform::Date{86400}}}));
   ASSERT_TRUE(waitForClientEvents(1));
-  const Dictionary posted = clientEvents()[0].event;
+  const auto received = clientEvents()[0];
+  const Dictionary& posted = received.event;
   const struct {
     const char* key;
     char type;  // i integer, n number, s string
@@ -28,10 +29,10 @@ TEST_F(EventDeliveryTest, AnEventStandsInTheInboxWithEveryReservedKeyAndItsType)
     EXPECT_TRUE(type == 's' ? value->string() != nullptr : type == 'i' ? value->isInteger() : value->isNumber()) << key;
   }
   EXPECT_EQ(posted.find("_sender")->description(), "ZK");
-  EXPECT_EQ(posted.find("_method")->integerValue(), 11);
-  EXPECT_EQ(posted.find("_status")->integerValue(), 12);
-  EXPECT_EQ(posted.find("_eventNumber")->integerValue(), 2) << "the session-start record was the first";
-  EXPECT_EQ(posted.find("_internal")->integerValue(), 2);
+  EXPECT_EQ(number(received, "_method"), 11);
+  EXPECT_EQ(number(received, "_status"), 12);
+  EXPECT_EQ(number(received, "_eventNumber"), 2) << "the session-start record was the first";
+  EXPECT_EQ(number(received, "_internal"), 2);
   EXPECT_EQ(posted.find("_reportVers")->description(), "8.0");
   EXPECT_EQ(posted.find("text")->description(), "hello");
   EXPECT_TRUE(posted.contains("yes")) << "booleans count as numbers and stay";
@@ -91,7 +92,7 @@ TEST_F(EventDeliveryTest, TheOneOffPathSendsOneEvent) {
   ASSERT_TRUE(answer) << answer.error().text;
   EXPECT_EQ(*answer, "finished");
   ASSERT_TRUE(waitForClientEvents(1));
-  EXPECT_EQ(clientEvents()[0].event.find("_method")->integerValue(), 8);
+  EXPECT_EQ(number(clientEvents()[0], "_method"), 8);
   auto refused = connection->session().blocking().sendMessage(
       std::make_shared<const Dictionary>(Dictionary{{"clientType", 5}}), nullptr, 8, 9, nullptr);
   EXPECT_FALSE(refused) << "a reply that the daemon drops is an error, not silence";

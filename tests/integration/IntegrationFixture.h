@@ -30,6 +30,16 @@ class IntegrationFixture : public ::testing::Test {
  protected:
   static constexpr std::chrono::seconds kPatience{60};
 
+  // A device with consent, so that nothing but what a test changes keeps events back.
+  IntegrationFixture() {
+    options.device = {{"UniqueDeviceID", "00112233445566778899aabbccddeeff00112233"},
+                      {"ProductVersion", "12.5"},
+                      {"BuildVersion", "12F5"},
+                      {"ProductType", "Parva3,2"},
+                      {"DeviceName", "Parva"},
+                      {"CountryCode", "DE"},
+                      {"DiagnosticsSubmissionAllowed", true}};
+  }
   void SetUp() override { startCollector({}); }
 
   void startCollector(collector::CollectorOptions collectorOptions) {
@@ -46,6 +56,12 @@ class IntegrationFixture : public ::testing::Test {
   void startDaemon() {
     daemon = std::make_unique<DaemonProcess>(options);
     ASSERT_TRUE(daemon->start()) << daemon->process().allLines();
+  }
+  // With a log that costs nothing.
+  void startQuietDaemon() {
+    options.logLevel = "4";
+    daemon = std::make_unique<DaemonProcess>(options);
+    ASSERT_TRUE(daemon->startQuietly());
   }
   void TearDown() override {
     if (daemon && !daemon->process().exitStatus()) {
@@ -84,11 +100,11 @@ class IntegrationFixture : public ::testing::Test {
     return connection;
   }
   static MessageParameters event(std::uint16_t category, std::uint16_t type, Dictionary payload = {}) {
-    MessageParameters parameters;
-    parameters.category = category;
-    parameters.type = type;
-    parameters.payload = std::move(payload);
-    return parameters;
+    return {.category = category, .type = type, .payload = std::move(payload)};
+  }
+  static std::int64_t number(const collector::ReceivedEvent& received, std::string_view key) {
+    const Value* value = received.event.find(key);
+    return value == nullptr ? -1 : value->integerValue();
   }
   static std::optional<std::string> send(OrvantaConnection& connection, const MessageParameters& parameters) {
     auto reply = connection.session().blocking().sendMessage(parameters);
@@ -104,8 +120,7 @@ class IntegrationFixture : public ::testing::Test {
   std::vector<collector::ReceivedEvent> clientEvents() {
     std::vector<collector::ReceivedEvent> found;
     for (auto& received : server->events()) {
-      const Value* method = received.event.find("_method");
-      if (method == nullptr || method->integerValue() != 0) found.push_back(std::move(received));
+      if (number(received, "_method") != 0) found.push_back(std::move(received));
     }
     return found;
   }
@@ -118,18 +133,7 @@ class IntegrationFixture : public ::testing::Test {
   }
 
   std::unique_ptr<Collector> server;
-  // A device with consent, so that nothing but what a test changes keeps events back.
-  DaemonProcess::Options options = [] {
-    DaemonProcess::Options made;
-    made.device = {{"UniqueDeviceID", "00112233445566778899aabbccddeeff00112233"},
-                   {"ProductVersion", "12.5"},
-                   {"BuildVersion", "12F5"},
-                   {"ProductType", "Parva3,2"},
-                   {"DeviceName", "Parva"},
-                   {"CountryCode", "DE"},
-                   {"DiagnosticsSubmissionAllowed", true}};
-    return made;
-  }();
+  DaemonProcess::Options options;
   std::unique_ptr<DaemonProcess> daemon;
 
  private:

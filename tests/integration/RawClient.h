@@ -22,6 +22,10 @@ namespace orvanta::test {
 
 using Bytes = std::vector<std::uint8_t>;
 
+inline void append(Bytes& bytes, const Bytes& more) {
+  bytes.insert(bytes.end(), more.begin(), more.end());
+}
+
 // A client that speaks bytes, as good or as bad as a test wants.
 class RawClient {
  public:

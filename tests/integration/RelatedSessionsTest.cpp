@@ -38,8 +38,7 @@ class RelatedSessionsTest : public IntegrationFixture {
   }
   std::string postedSessionID(std::int64_t marker) {
     for (const auto& received : clientEvents()) {
-      const Value* found = received.event.find("marker");
-      if (found != nullptr && found->integerValue() == marker) return received.event.find("_sessionID")->description();
+      if (number(received, "marker") == marker) return received.event.find("_sessionID")->description();
     }
     return "none";
   }

@@ -96,12 +96,10 @@ TEST_F(UploadTest, FilesOfAnyNameArriveUnderItAndAreRemoved) {
 
 TEST_F(UploadTest, WhateverDoesNotSaySuccessKeepsTheFile) {
   const auto path = files.write("file", "content");
-  answerWith("{\"status\": \"failed\"}");
-  EXPECT_TRUE(upload(path));
-  answerWith("");
-  EXPECT_TRUE(upload(path));
-  answerWith("SUCCESS");
-  EXPECT_TRUE(upload(path));
+  for (const char* answer : {"{\"status\": \"failed\"}", "", "SUCCESS"}) {
+    answerWith(answer);
+    EXPECT_TRUE(upload(path));
+  }
   server->setStatus("/upload", 500);
   EXPECT_TRUE(upload(path));
   server->clearBehaviours();
@@ -124,10 +122,11 @@ TEST_F(UploadTest, WhateverDoesNotSaySuccessKeepsTheFile) {
 TEST_F(UploadTest, AFileIsReadAndRemovedAsItWasOpened) {
   const auto precious = files.write("precious", "not the client's to give");
   const auto path = files.write("file", "the client's own");
-  EXPECT_TRUE(uploadWhile(path, [&] {
+  const auto swap = [&] {
     fs::remove(path);
     fs::create_symlink(precious, path);
-  }));
+  };
+  EXPECT_TRUE(uploadWhile(path, swap));
   EXPECT_EQ(uploads().back().body, "the client's own");
   EXPECT_TRUE(fs::exists(precious));
   EXPECT_TRUE(fs::is_symlink(path));
@@ -136,13 +135,9 @@ TEST_F(UploadTest, AFileIsReadAndRemovedAsItWasOpened) {
   const auto target = files.write("target", "behind the link");
   fs::remove(path);
   fs::create_symlink(target, path);
-  EXPECT_TRUE(uploadWhile(path, [&] {
-    fs::remove(path);
-    fs::create_symlink(precious, path);
-  }));
+  EXPECT_TRUE(uploadWhile(path, swap));
   EXPECT_EQ(uploads().back().body, "behind the link");
-  EXPECT_TRUE(fs::exists(precious));
-  EXPECT_TRUE(fs::exists(target));
+  EXPECT_TRUE(fs::exists(precious) && fs::exists(target));
 }
 
 TEST_F(UploadTest, FilesThatChangeWhileTheyAreReadHarmNobody) {
