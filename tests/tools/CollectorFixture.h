@@ -3,6 +3,8 @@
 #include <gtest/gtest.h>
 #include <httplib.h>
 
+#include <array>
+#include <cerrno>
 #include <chrono>
 #include <memory>
 #include <string>
@@ -11,6 +13,7 @@
 #include "platform/Json.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tools/collector/Collector.h"
+#include "tools/collector/Transport.h"
 
 namespace orvanta::collector {
 
@@ -38,6 +41,17 @@ class CollectorFixture : public testing::Test {
   }
   httplib::Result post(const std::string& path, const std::string& body) const {
     return http().Post(path, body, "application/json");
+  }
+  // Sends bytes as they are, over a fresh connection, and reads until the collector closes.
+  std::string converse(const std::string& bytes, bool finishes = false) const {
+    const auto stream = Transport::connectLoopback(collector->httpPort());
+    EXPECT_TRUE(stream->write(bytes));
+    if (finishes) stream->finish();
+    std::string answer;
+    std::array<char, 4096> piece{};
+    errno = 0;
+    while (const std::size_t count = stream->read(piece.data(), piece.size())) answer.append(piece.data(), count);
+    return errno == ECONNRESET ? answer + "[reset]" : answer;
   }
   platform::Value list(const std::string& path) const {
     const auto answer = http().Get(path);

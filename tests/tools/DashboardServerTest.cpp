@@ -52,9 +52,7 @@ class DashboardServerTest : public CollectorFixture {
   }
   // The next acknowledgement; one without bytes when none comes.
   Acknowledgement receive() const {
-    pollfd waiting{_socket.get(), POLLIN, 0};
-    const auto patience = std::chrono::duration_cast<std::chrono::milliseconds>(kPatience).count();
-    if (::poll(&waiting, 1, static_cast<int>(patience)) <= 0) return {};
+    if (!waits(kPatience)) return {};
     std::array<char, 2048> buffer{};
     sockaddr_in from{};
     socklen_t size = sizeof from;
@@ -62,10 +60,10 @@ class DashboardServerTest : public CollectorFixture {
         ::recvfrom(_socket.get(), buffer.data(), buffer.size(), 0, reinterpret_cast<sockaddr*>(&from), &size);
     return {ntohs(from.sin_port), std::string(buffer.data(), static_cast<std::size_t>(std::max<ssize_t>(count, 0)))};
   }
-  // Whether nothing waits to be read.
-  bool quiet() const {
+  // Whether something can be read within the time.
+  bool waits(std::chrono::milliseconds patience = {}) const {
     pollfd waiting{_socket.get(), POLLIN, 0};
-    return ::poll(&waiting, 1, 0) == 0;
+    return ::poll(&waiting, 1, static_cast<int>(patience.count())) > 0;
   }
 
  private:
@@ -83,7 +81,6 @@ TEST_F(DashboardServerTest, DecodesAndAcknowledges) {
   EXPECT_TRUE(received.wellFormed);
   EXPECT_EQ(received.bytes, sent);
   EXPECT_EQ(received.eventNumber, 513);
-  EXPECT_EQ(received.sessionID, 7U);
   EXPECT_EQ(received.method, 300);
   EXPECT_EQ(received.milliseconds, 4);
   EXPECT_EQ(received.deviceID, "device");
@@ -100,7 +97,7 @@ TEST_F(DashboardServerTest, AcknowledgesOnlyWhatAsksForIt) {
   send(datagram(2).substr(0, 64));  // tells a longer length
   send(datagram(3));
   EXPECT_EQ(receive().bytes, datagram(3).substr(0, 64));
-  EXPECT_TRUE(quiet());
+  EXPECT_FALSE(waits());
   ASSERT_TRUE(collector->waitForDatagrams(4, kPatience));
   const auto received = collector->datagrams();
   EXPECT_TRUE(received[0].wellFormed);
@@ -124,7 +121,7 @@ TEST_F(DashboardServerTest, ForgesAndRepeatsAsAsked) {
     const auto answer = receive();
     (answer.port == collector->dashboardPort() ? fromServer : fromElsewhere).push_back(answer.bytes);
   }
-  EXPECT_TRUE(quiet());
+  EXPECT_FALSE(waits());
   EXPECT_THAT(fromElsewhere, testing::ElementsAre(right));
   ASSERT_EQ(fromServer.size(), 4U);
   EXPECT_EQ(fromServer[0].size(), 64U);
@@ -145,7 +142,7 @@ TEST_F(DashboardServerTest, LosesAShareAndCanBeSwitchedOff) {
   EXPECT_GT(acknowledged, 110);
   EXPECT_LT(acknowledged, 170);
   for (std::int64_t i = 0; i < acknowledged; ++i) EXPECT_EQ(receive().bytes.size(), 64U);
-  EXPECT_TRUE(quiet());
+  EXPECT_FALSE(waits());
 
   settings = {};
   settings.acknowledge = false;

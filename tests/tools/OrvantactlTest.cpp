@@ -50,7 +50,6 @@ TEST(EventLine, takesEventsAsTheyAreWritten) {
       {R"({"category":1,"type":2,"payload":{"a":[1,{"b":"x"}]}})",
        {},
        {{"category", 1}, {"type", 2}, {"payload", Dictionary{{"a", Array{1, Dictionary{{"b", "x"}}}}}}}},
-      {R"({"category":1,"type":2,"flag":5})", {}, {{"category", 1}, {"type", 2}, {"flag", 5}}},
       {R"({"category":1,"type":2,"realtime":true,"promote":true})", {}, {{"category", 1}, {"type", 2}, {"flag", 3}}},
       {R"({"category":1,"type":2,"flag":1,"promote":true})", {}, {{"category", 1}, {"type", 2}, {"flag", 3}}},
       {R"({"category":1,"type":2})", {true, false}, {{"category", 1}, {"type", 2}, {"flag", 1}}},
@@ -67,36 +66,31 @@ TEST(EventLine, takesEventsAsTheyAreWritten) {
 }
 
 TEST(EventLine, saysWhatIsWrong) {
-  const struct {
-    const char* line;
-    const char* problem;
-  } rows[] = {
-      {"", ""},
-      {"{", ""},
-      {R"({"category":1,"type":2} x)", ""},
-      {"[1,2]", "object"},
-      {R"({"type":2})", "\"category\" is missing"},
-      {R"({"category":1})", "\"type\" is missing"},
-      {R"({"category":65536,"type":2})", "\"category\" must be"},
-      {R"({"category":-1,"type":2})", "\"category\" must be"},
-      {R"({"category":1.5,"type":2})", "\"category\" must be"},
-      {R"({"category":"1","type":2})", "\"category\" must be"},
-      {R"({"category":true,"type":2})", "\"category\" must be"},
-      {R"({"category":1,"type":null})", "\"type\" must be"},
-      {R"({"category":1,"type":2,"payload":[]})", "\"payload\" must be an object"},
-      {R"({"category":1,"type":2,"flag":4294967296})", "\"flag\" must be"},
-      {R"({"category":1,"type":2,"realtime":1})", "\"realtime\" must be true or false"},
-      {R"({"category":1,"type":2,"realtme":true})", "\"realtme\" is no key"},
-      {R"({"category":1,"type":2,"payload":{"a":{"$date":"x"}}})", "$date"},
-      {R"({"category":1,"type":2,"payload":{"a":{"$date":1,"b":2}}})", "alone"},
-      {R"({"category":1,"type":2,"payload":{"a":[{"$data":"A"}]}})", "$data"},
-      {R"({"category":1,"type":2,"payload":{"$date":1}})", "\"payload\" must be an object"},
+  const std::pair<const char*, std::vector<const char*>> rows[] = {
+      {"", {"", "{", R"({"category":1,"type":2} x)"}},
+      {"object", {"[1,2]"}},
+      {"\"category\" is missing", {R"({"type":2})"}},
+      {"\"type\" is missing", {R"({"category":1})"}},
+      {"\"category\" must be",
+       {R"({"category":65536,"type":2})", R"({"category":-1,"type":2})", R"({"category":1.5,"type":2})",
+        R"({"category":"1","type":2})", R"({"category":true,"type":2})"}},
+      {"\"type\" must be", {R"({"category":1,"type":null})"}},
+      {"\"payload\" must be an object",
+       {R"({"category":1,"type":2,"payload":[]})", R"({"category":1,"type":2,"payload":{"$date":1}})"}},
+      {"\"flag\" must be", {R"({"category":1,"type":2,"flag":4294967296})"}},
+      {"\"realtime\" must be true or false", {R"({"category":1,"type":2,"realtime":1})"}},
+      {"\"realtme\" is no key", {R"({"category":1,"type":2,"realtme":true})"}},
+      {"$date", {R"({"category":1,"type":2,"payload":{"a":{"$date":"x"}}})"}},
+      {"alone", {R"({"category":1,"type":2,"payload":{"a":{"$date":1,"b":2}}})"}},
+      {"$data", {R"({"category":1,"type":2,"payload":{"a":[{"$data":"A"}]}})"}},
   };
-  for (const auto& row : rows) {
-    const auto event = parseEventLine(row.line, {});
-    ASSERT_FALSE(event) << row.line;
-    EXPECT_NE(event.error().find(row.problem), std::string::npos) << row.line << ": " << event.error();
-    EXPECT_FALSE(event.error().empty()) << row.line;
+  for (const auto& [problem, lines] : rows) {
+    for (const char* line : lines) {
+      const auto event = parseEventLine(line, {});
+      ASSERT_FALSE(event) << line;
+      EXPECT_NE(event.error().find(problem), std::string::npos) << line << ": " << event.error();
+      EXPECT_FALSE(event.error().empty()) << line;
+    }
   }
 }
 
@@ -144,10 +138,7 @@ std::vector<std::string> linesOf(const std::string& content) {
 
 TEST(LineReader, givesEveryLineOnce) {
   const std::string wide(200'000, 'w');
-  const struct {
-    std::string content;
-    std::vector<std::string> lines;
-  } rows[] = {
+  const std::pair<std::string, std::vector<std::string>> rows[] = {
       {"", {}},
       {"\n", {""}},
       {"a", {"a"}},
@@ -155,10 +146,7 @@ TEST(LineReader, givesEveryLineOnce) {
       {"a\r\n\nb\n", {"a", "", "b"}},
       {wide + "\nx\n" + wide, {wide, "x", wide}},
   };
-  for (const auto& row : rows) EXPECT_EQ(linesOf(row.content), row.lines) << row.content.substr(0, 20);
-}
-
-TEST(LineReader, skipsALineThatIsTooLong) {
+  for (const auto& [content, lines] : rows) EXPECT_EQ(linesOf(content), lines) << content.substr(0, 20);
   const std::string giant(LineReader::kMaximumLine + 1, 'g');
   EXPECT_EQ(linesOf("a\n" + giant + "\nb"), (std::vector<std::string>{"a", "too long: 2", "b"}));
   EXPECT_EQ(linesOf(giant), (std::vector<std::string>{"too long: 1"}));

@@ -99,18 +99,21 @@ TEST_F(StorebagServerTest, AnswersNotModifiedByTheFilesTime) {
 
 TEST_F(StorebagServerTest, PrefersTheBagsOwnFile) {
   const auto plist = platform::writeXmlPropertyList(Dictionary{{"version", "plist"}});
+  const auto version = [&](const char* name) {
+    return at(verified(get(name)->body, collector->publicKeyFile()), "version");
+  };
   directory.write("confluo.plist", *plist);
   directory.write("brindle.json", R"({"version":"json"})");
-  EXPECT_EQ(at(verified(get("confluo")->body, collector->publicKeyFile()), "version"), "plist");
-  EXPECT_EQ(at(verified(get("brindle")->body, collector->publicKeyFile()), "version"), "json");
-  EXPECT_EQ(at(verified(get("halvora")->body, collector->publicKeyFile()), "version"), "1.0.0");
+  EXPECT_EQ(version("confluo"), "plist");
+  EXPECT_EQ(version("brindle"), "json");
+  EXPECT_EQ(version("halvora"), "1.0.0");
   collector->setBag(Dictionary{{"version", "held for all"}});
-  EXPECT_EQ(at(verified(get("brindle")->body, collector->publicKeyFile()), "version"), "json");
-  EXPECT_EQ(at(verified(get("halvora")->body, collector->publicKeyFile()), "version"), "held for all");
+  EXPECT_EQ(version("brindle"), "json");
+  EXPECT_EQ(version("halvora"), "held for all");
   ASSERT_EQ(http().Put("/control/bag?name=brindle", R"({"version":"put"})", "application/json")->status, 204);
-  EXPECT_EQ(at(verified(get("brindle")->body, collector->publicKeyFile()), "version"), "put");
+  EXPECT_EQ(version("brindle"), "put");
   EXPECT_EQ(http().Delete("/control/bag")->status, 204);
-  EXPECT_EQ(at(verified(get("halvora")->body, collector->publicKeyFile()), "version"), "1.0.0");
+  EXPECT_EQ(version("halvora"), "1.0.0");
 }
 
 TEST_F(StorebagServerTest, SaysWhatIsWrongWithABag) {
