@@ -7,23 +7,14 @@
 #include <thread>
 
 #include "tests/platform/HttpFixture.h"
+#include "tests/platform/Waiting.h"
 
 namespace platform {
 namespace {
 
+using orvanta::test::Counter;
 using orvanta::test::RawConnection;
 using orvanta::test::RawServer;
-
-// A door that scripts wait at until the test opens it.
-class Gate {
- public:
-  void open() { _promise.set_value(); }
-  void pass() const { _opened.wait_for(std::chrono::seconds(30)); }
-
- private:
-  std::promise<void> _promise;
-  std::shared_future<void> _opened = _promise.get_future().share();
-};
 
 std::string pathOf(const std::string& request) {
   const std::size_t begin = request.find(' ') + 1;
@@ -33,10 +24,10 @@ std::string pathOf(const std::string& request) {
 class HttpLaneTest : public HttpFixture {
  protected:
   // Answers everything, what begins with /held only once the gate is open.
-  RawServer::Script holding(const Gate& gate) {
+  RawServer::Script holding(Counter& gate) {
     return [&gate](RawConnection& connection) {
       while (const auto request = connection.readRequest()) {
-        if (pathOf(*request).rfind("/held", 0) == 0) gate.pass();
+        if (pathOf(*request).rfind("/held", 0) == 0) gate.waitFor(1);
         connection.write(RawServer::response("200 OK"));
       }
     };
@@ -78,7 +69,7 @@ TEST_F(HttpLaneTest, ALaneKeepsItsOrderToTheLastCompletion) {
 }
 
 TEST_F(HttpLaneTest, TheNextWaitsForTheOneBeforeOtherLanesDoNot) {
-  Gate gate;
+  Counter gate;
   RawServer server(holding(gate));
   const auto lane = client().makeLane();
   auto first = start(lane, post(server.url("/held")));
@@ -86,7 +77,7 @@ TEST_F(HttpLaneTest, TheNextWaitsForTheOneBeforeOtherLanesDoNot) {
   ASSERT_TRUE(server.waitForRequests(1));
   for (int i = 0; i < 5; ++i) EXPECT_EQ(statusOf(perform(get(server.url("/other")))), 200);
   EXPECT_EQ(paths(server).size(), 6U) << "the second of the lane was not sent";
-  gate.open();
+  gate.add();
   EXPECT_EQ(statusOf(await(first)), 200);
   EXPECT_EQ(statusOf(await(second)), 200);
   EXPECT_EQ(paths(server).back(), "/second");
@@ -154,7 +145,7 @@ TEST_F(HttpLaneTest, LimitsOnWaitingBytes) {
   limits.laneBytes = 10'000;
   limits.totalBytes = 15'000;
   makeClient(limits);
-  Gate gate;
+  Counter gate;
   RawServer server(holding(gate));
   const std::string body(5'000 - 1024, 'b');  // each request is charged 5000
   const auto lane = client().makeLane();
@@ -169,7 +160,7 @@ TEST_F(HttpLaneTest, LimitsOnWaitingBytes) {
   for (int i = 0; i < 5; ++i) accepted.push_back(start(free, post(server.url("/held/free"), body + body)));
   EXPECT_EQ(await(laneFull).error, "Refused: 10000 bytes wait in this lane, 1024 more would exceed its limit of 10000");
   EXPECT_EQ(await(allFull).error, "Refused: 15000 bytes wait in all lanes, 1024 more would exceed the limit of 15000");
-  gate.open();
+  gate.add();
   for (auto& result : accepted) EXPECT_EQ(statusOf(await(result)), 200);
   auto again = start(lane, post(server.url("/fits"), std::string(10'000 - 1024, 'b')));
   EXPECT_EQ(statusOf(await(again)), 200) << "what has ended waits no more";
@@ -181,7 +172,7 @@ TEST_F(HttpLaneTest, LimitsOnWaitingBytes) {
 // Servers that never answer hold as many requests as may be in flight; those of unrefused lanes must get past them.
 TEST_F(HttpLaneTest, SilentServersDoNotHoldUpUnrefusedLanes) {
   constexpr std::size_t kMaximumInFlight = 64;
-  Gate gate;
+  Counter gate;
   RawServer server(holding(gate));
   RawServer storebags(answering("200 OK"));
   std::vector<std::future<HttpResult>> results;
@@ -192,19 +183,19 @@ TEST_F(HttpLaneTest, SilentServersDoNotHoldUpUnrefusedLanes) {
   const auto lane = client().makeLane(HttpClient::LaneKind::unrefused);
   EXPECT_EQ(statusOf(client().perform(lane, get(storebags.url()))), 200);
   EXPECT_EQ(server.requests().size(), kMaximumInFlight);
-  gate.open();
+  gate.add();
   for (auto& result : results) EXPECT_EQ(statusOf(await(result)), 200);
 }
 
 TEST_F(HttpLaneTest, TimeSpentWaitingInTheLaneCounts) {
-  Gate gate;
+  Counter gate;
   RawServer server(holding(gate));
   const auto lane = client().makeLane();
   auto first = start(lane, post(server.url("/held")));
   auto late = start(lane, within(std::chrono::milliseconds(50), get(server.url("/late"))));
   auto patient = start(lane, within(std::chrono::seconds(60), get(server.url("/patient"))));
   EXPECT_EQ(await(late).error, "Timed out after 50 ms, waiting for its turn");
-  gate.open();
+  gate.add();
   EXPECT_EQ(statusOf(await(first)), 200);
   EXPECT_EQ(statusOf(await(patient)), 200);
   EXPECT_EQ(paths(server), (std::vector<std::string>{"/held", "/patient"}));
@@ -212,14 +203,14 @@ TEST_F(HttpLaneTest, TimeSpentWaitingInTheLaneCounts) {
 
 // Both threads of the pool wait for a request whose completion chain needs the pool.
 TEST_F(HttpLaneTest, BlockedCallersLeaveThePoolAlive) {
-  Gate gate;
+  Counter gate;
   RawServer server(holding(gate));
   std::promise<HttpResult> results[4];
   for (auto& result : results) _pool.post([&] { result.set_value(perform(get(server.url("/held")))); });
   ASSERT_TRUE(server.waitForRequests(4));
   auto opener = start(client().makeLane(), post(server.url("/free")));
   EXPECT_EQ(statusOf(await(opener)), 200);
-  gate.open();
+  gate.add();
   for (auto& result : results) {
     auto future = result.get_future();
     EXPECT_EQ(statusOf(await(future)), 200);

@@ -36,15 +36,6 @@ TEST_F(HttpMessageTest, NothingIsAddedButHostAndTheLength) {
             "GET / HTTP/1.1\r\nHost: example.org\r\nX-A: 1\r\n\r\n");
 }
 
-TEST_F(HttpMessageTest, HeadersKeepTheirOrder) {
-  const Headers headers{{"X-ORV-Client-Name", "Mail"},  {"User-Agent", "Orvanta/8.0 (Parva3,2; 12.5)"},
-                        {"Accept", "application/json"}, {"Content-Type", "application/json"},
-                        {"Content-Length", "4"},        {"Content-Encoding", "gzip"}};
-  std::string expected = "POST /p HTTP/1.1\r\n" + host();
-  for (const HttpHeader& header : headers) expected += header.name + ": " + header.value + "\r\n";
-  EXPECT_EQ(sent(post(_server.url("/p"), "body", headers)), expected + "\r\nbody");
-}
-
 TEST_F(HttpMessageTest, WhatBecomesOfEachHeader) {
   const struct {
     HttpHeader header;

@@ -2,59 +2,25 @@
 #include <netdb.h>
 
 #include <atomic>
-#include <condition_variable>
 #include <cstring>
-#include <mutex>
 #include <thread>
 
 #include "tests/platform/HttpFixture.h"
-
-namespace {
+#include "tests/platform/Waiting.h"
 
 // A resolver that hangs on one name until it is let go; libcurl's look-ups come through here.
-class HangingResolver {
- public:
-  static constexpr const char* kName = "hangs.test";
-
-  void hang() {
-    std::unique_lock lock(_mutex);
-    ++_hanging;
-    _changed.notify_all();
-    _changed.wait(lock, [&] { return _released; });
-    --_hanging;
-    _changed.notify_all();
-  }
-  bool waitUntilHanging() {
-    std::unique_lock lock(_mutex);
-    return _changed.wait_for(lock, std::chrono::seconds(30), [&] { return _hanging > 0; });
-  }
-  bool hanging() {
-    const std::lock_guard lock(_mutex);
-    return _hanging > 0;
-  }
-  void release() {
-    std::unique_lock lock(_mutex);
-    _released = true;
-    _changed.notify_all();
-    _changed.wait(lock, [&] { return _hanging == 0; });
-    _released = false;
-  }
-
- private:
-  std::mutex _mutex;
-  std::condition_variable _changed;
-  int _hanging = 0;        // guarded by _mutex
-  bool _released = false;  // guarded by _mutex
-};
-HangingResolver gResolver;
-
+namespace {
+constexpr const char* kHangingName = "hangs.test";
+orvanta::test::Counter gHanging, gReleased, gEnded;
 }  // namespace
 
 extern "C" int getaddrinfo(const char* node, const char* service, const addrinfo* hints, addrinfo** result) {
   using Function = int (*)(const char*, const char*, const addrinfo*, addrinfo**);
   static const auto real = reinterpret_cast<Function>(::dlsym(RTLD_NEXT, "getaddrinfo"));
-  if (node != nullptr && std::strcmp(node, HangingResolver::kName) == 0) {
-    gResolver.hang();
+  if (node != nullptr && std::strcmp(node, kHangingName) == 0) {
+    gHanging.add();
+    gReleased.waitFor(1);
+    gEnded.add();
     return EAI_FAIL;
   }
   return real(node, service, hints, result);
@@ -110,25 +76,26 @@ TEST_F(HttpShutdownTest, DestructionEndsWhatIsInFlight) {
 }
 
 TEST_F(HttpShutdownTest, AHangingResolverHoldsNobody) {
-  const std::string url = std::string("http://") + HangingResolver::kName + "/";
+  const std::string url = std::string("http://") + kHangingName + "/";
   auto result = start(client().makeLane(), post(url));
   auto blocked = performInThread(client().makeLane(), get(url));
-  ASSERT_TRUE(gResolver.waitUntilHanging());
+  ASSERT_TRUE(gHanging.waitFor(1));
   expectError(perform(within(milliseconds(100), get(url))), "Timed out after 100 ms, not connected");
   client().abortBlockingRequests();
   expectError(await(blocked), "Aborted");
   _client.reset();
   expectError(await(result), "shutting down");
-  EXPECT_TRUE(gResolver.hanging());
-  gResolver.release();
+  EXPECT_EQ(gEnded.value(), 0);
+  gReleased.add();
+  EXPECT_TRUE(gEnded.waitFor(gHanging.value()));
 }
 
 TEST_F(HttpShutdownTest, AbortingEndsBlockedCallersOnly) {
   RawServer silent(beSilent);
-  std::promise<void> gate;
-  RawServer slow([opened = gate.get_future().share()](RawConnection& connection) {
+  orvanta::test::Counter gate;
+  RawServer slow([&](RawConnection& connection) {
     if (!connection.readRequest()) return;
-    opened.wait_for(seconds(30));
+    gate.waitFor(1);
     connection.write(RawServer::response("200 OK"));
     connection.waitForClose();
   });
@@ -142,7 +109,7 @@ TEST_F(HttpShutdownTest, AbortingEndsBlockedCallersOnly) {
   expectError(await(waiting), "Aborted");
   expectError(perform(get(slow.url())), "Aborted");
   EXPECT_EQ(silent.requests().size(), 1U);
-  gate.set_value();
+  gate.add();
   EXPECT_EQ(statusOf(await(other)), 200) << "nobody waits for this one";
 }
 
