@@ -5,7 +5,7 @@
 namespace orvanta::test {
 namespace {
 
-class EventDeliveryTest : public IntegrationFixture {};
+using EventDeliveryTest = IntegrationFixture;
 
 TEST_F(EventDeliveryTest, AnEventStandsInTheInboxWithEveryReservedKeyAndItsType) {
   startDaemon();
@@ -126,31 +126,27 @@ TEST_F(EventDeliveryTest, ATamperedStorebagIsRefused) {
 }
 
 // Whoever stands at the other end without a good certificate sees no byte of payload.
-struct CertificateRow {
-  const char* name;
-  collector::CertificateFlaw flaw;
-  const char* reason;
-};
-class CertificateTest : public IntegrationFixture, public ::testing::WithParamInterface<CertificateRow> {};
-
-TEST_P(CertificateTest, NoPayloadLeavesAndTheReasonIsLogged) {
-  collector::CollectorOptions flawed;
-  flawed.certificateFlaw = GetParam().flaw;
-  startCollector(std::move(flawed));
-  startDaemon();
-  auto session = openSession({.sessionID = 1});
-  send(*session, event(1, 1, {{"secret", "do not leak"}}));
-  ASSERT_TRUE(daemon->logged("<3>HTTPSPostBackend(postJsonMessage): post error: ", 2));
-  EXPECT_TRUE(daemon->logged(GetParam().reason)) << daemon->process().allLines();
-  EXPECT_TRUE(server->requests(RequestKind::events).empty());
+TEST_F(EventDeliveryTest, WithoutAGoodCertificateNoPayloadLeavesAndTheReasonIsLogged) {
+  const std::pair<collector::CertificateFlaw, const char*> rows[] = {
+      {collector::CertificateFlaw::wrongHost, "subject name"},
+      {collector::CertificateFlaw::expired, "expired"},
+      {collector::CertificateFlaw::selfSigned, "self"},
+  };
+  for (const auto& [flaw, reason] : rows) {
+    collector::CollectorOptions flawed;
+    flawed.certificateFlaw = flaw;
+    startCollector(std::move(flawed));
+    server->clear();
+    startDaemon();
+    auto session = openSession({.sessionID = 1});
+    send(*session, event(1, 1, {{"secret", "do not leak"}}));
+    ASSERT_TRUE(daemon->logged("<3>HTTPSPostBackend(postJsonMessage): post error: ", 2));
+    EXPECT_TRUE(daemon->logged(reason)) << daemon->process().allLines();
+    EXPECT_TRUE(server->requests(RequestKind::events).empty());
+    session.reset();
+    EXPECT_EQ(daemon->terminate(), 0);
+  }
 }
-
-INSTANTIATE_TEST_SUITE_P(
-    Flaws, CertificateTest,
-    ::testing::Values(CertificateRow{"wrongHost", collector::CertificateFlaw::wrongHost, "subject name"},
-                      CertificateRow{"expired", collector::CertificateFlaw::expired, "expired"},
-                      CertificateRow{"selfSigned", collector::CertificateFlaw::selfSigned, "self"}),
-    [](const auto& row) { return row.param.name; });
 
 }  // namespace
 }  // namespace orvanta::test

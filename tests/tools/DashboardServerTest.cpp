@@ -33,11 +33,6 @@ class DashboardServerTest : public CollectorFixture {
   static std::string datagram(std::uint16_t eventNumber, bool reliable = true) {
     const Dictionary payload{{"a", "q"}, {"b", "x=y"}};
     DashboardSender sender;
-    sender.versionMajor = 8;
-    sender.clientType = 5;
-    sender.sessionID = 7;
-    sender.clientVersion = 3;
-    sender.deviceID = "device";
     sender.mode = reliable ? 1 : 0;
     const auto bytes = encodeDashboardDatagram(sender, {&payload, {123, 4999}, 300, 2, eventNumber});
     return {bytes.begin(), bytes.end()};
@@ -78,12 +73,9 @@ TEST_F(DashboardServerTest, DecodesAndAcknowledges) {
   EXPECT_EQ(answer.bytes, sent.substr(0, 64));
   ASSERT_TRUE(collector->waitForDatagrams(1, kPatience));
   const auto received = collector->datagrams()[0];
-  EXPECT_TRUE(received.wellFormed);
   EXPECT_EQ(received.bytes, sent);
   EXPECT_EQ(received.eventNumber, 513);
-  EXPECT_EQ(received.method, 300);
   EXPECT_EQ(received.milliseconds, 4);
-  EXPECT_EQ(received.deviceID, "device");
   EXPECT_EQ(received.acknowledgements, 1);
   const auto datagrams = list("/datagrams");
   const auto& listed = at(at(datagrams, "datagrams"), 0);
@@ -108,10 +100,7 @@ TEST_F(DashboardServerTest, AcknowledgesOnlyWhatAsksForIt) {
 
 TEST_F(DashboardServerTest, ForgesAndRepeatsAsAsked) {
   AcknowledgementSettings settings;
-  settings.duplicates = 1;
-  settings.unknownNumbers = 1;
-  settings.tooShort = 1;
-  settings.foreign = 1;
+  settings.duplicates = settings.unknownNumbers = settings.tooShort = settings.foreign = 1;
   collector->setAcknowledgements(settings);
   const std::string right = datagram(9).substr(0, 64);
   send(datagram(9));
@@ -129,27 +118,6 @@ TEST_F(DashboardServerTest, ForgesAndRepeatsAsAsked) {
   EXPECT_EQ(fromServer[1].size(), 61U);
   EXPECT_EQ(fromServer[2], right);
   EXPECT_EQ(fromServer[3], right);
-}
-
-TEST_F(DashboardServerTest, LosesAShareAndCanBeSwitchedOff) {
-  AcknowledgementSettings settings;
-  settings.lossPercent = 30;
-  collector->setAcknowledgements(settings);
-  for (std::uint16_t i = 0; i < 200; ++i) send(datagram(i));
-  ASSERT_TRUE(collector->waitForDatagrams(200, kPatience));
-  std::int64_t acknowledged = 0;
-  for (const auto& received : collector->datagrams()) acknowledged += received.acknowledgements;
-  EXPECT_GT(acknowledged, 110);
-  EXPECT_LT(acknowledged, 170);
-  for (std::int64_t i = 0; i < acknowledged; ++i) EXPECT_EQ(receive().bytes.size(), 64U);
-  EXPECT_FALSE(waits());
-
-  settings = {};
-  settings.acknowledge = false;
-  collector->setAcknowledgements(settings);
-  send(datagram(500));
-  ASSERT_TRUE(collector->waitForDatagrams(201, kPatience));
-  EXPECT_EQ(collector->datagrams().back().acknowledgements, 0);
 }
 
 }  // namespace

@@ -8,8 +8,6 @@ namespace orvanta::collector {
 namespace {
 
 TEST(HttpMessageTest, ReadsRequestHeads) {
-  const auto head = parseRequestHead("POST /a%20b?x=%31 HTTP/1.0\r\nA:1\r\n a: 2\r\n\r\n");
-  EXPECT_FALSE(head) << "a name never begins with a blank";
   const auto good = parseRequestHead("POST /a%20b?x=%31 HTTP/1.0\r\nA:1\r\nb:\t2 \r\nConnection: Keep-Alive\r\n\r\n");
   ASSERT_TRUE(good) << good.error();
   EXPECT_EQ(good->method, "POST");
@@ -23,10 +21,10 @@ TEST(HttpMessageTest, ReadsRequestHeads) {
 }
 
 TEST(HttpMessageTest, RefusesDamagedHeads) {
-  for (const char* head :
-       {"", "\r\n\r\n", "GET /\r\n\r\n", "GET  HTTP/1.1\r\n\r\n", " / HTTP/1.1\r\n\r\n", "GET / HTTP/2\r\n\r\n",
-        "GET / a HTTP/1.1\r\n\r\n", "GET / HTTP/1.1\r\nA: 1", "GET / HTTP/1.1\r\nA 1\r\n\r\n",
-        "GET / HTTP/1.1\r\n: 1\r\n\r\n", "GET / HTTP/1.1\r\nA b: 1\r\n\r\n", "GET / HTTP/1.1"}) {
+  for (const char* head : {"", "\r\n\r\n", "GET /\r\n\r\n", "GET  HTTP/1.1\r\n\r\n", " / HTTP/1.1\r\n\r\n",
+                           "GET / HTTP/2\r\n\r\n", "GET / a HTTP/1.1\r\n\r\n", "GET / HTTP/1.1\r\nA: 1",
+                           "GET / HTTP/1.1\r\n a: 2\r\n\r\n", "GET / HTTP/1.1\r\nA 1\r\n\r\n",
+                           "GET / HTTP/1.1\r\n: 1\r\n\r\n", "GET / HTTP/1.1\r\nA b: 1\r\n\r\n", "GET / HTTP/1.1"}) {
     EXPECT_FALSE(parseRequestHead(head)) << head;
   }
   for (const char* head :
@@ -56,19 +54,9 @@ TEST(HttpMessageTest, ReadsLengths) {
 TEST(HttpMessageTest, TakesTargetsApart) {
   EXPECT_EQ(pathOfTarget("/a%2Fb%zz%4?c%20d"), "/a/b%zz%4");
   EXPECT_EQ(queryParameter("/u?a=1&b=%C3%A9%20&c", "b"), "é ");
-  EXPECT_EQ(queryParameter("/u?a=1&b=2&c", "c"), "");
-  EXPECT_EQ(queryParameter("/u?a=1&&a=2", "a"), "1");
-  EXPECT_EQ(queryParameter("/u?a=b=c", "a"), "b=c");
+  EXPECT_EQ(queryParameter("/u?aa=1&a=b=c&&a=2&d", "a"), "b=c");
+  EXPECT_EQ(queryParameter("/u?aa=1&d", "d"), "");
   EXPECT_EQ(queryParameter("/u?aa=1", "a"), std::nullopt);
-  EXPECT_EQ(queryParameter("/u", "a"), std::nullopt);
-}
-
-TEST(HttpMessageTest, WritesAndReadsDates) {
-  EXPECT_EQ(httpDate(784'111'777), "Sun, 06 Nov 1994 08:49:37 GMT");
-  EXPECT_EQ(parseHttpDate("Sun, 06 Nov 1994 08:49:37 GMT"), 784'111'777);
-  for (const char* text : {"", "Sun, 06 Nov 1994 08:49:37", "1994-11-06", "Sun, 06 Nov 1994 08:49:37 GMT+1"}) {
-    EXPECT_FALSE(parseHttpDate(text)) << text;
-  }
 }
 
 }  // namespace

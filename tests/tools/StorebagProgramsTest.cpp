@@ -50,9 +50,8 @@ TEST(StorebagProgramTest, SignsVerifiesAndShows) {
   EXPECT_EQ(shown.value(), platform::parseJson(R"({"version":"7","release":{"http_post":{"clients":[]}}})").value());
   EXPECT_THAT(run("orvanta-storebag", {"show", document, "--xml"}).output, HasSubstr("<plist version=\"1.0\">"));
 
-  const std::string sameKey = directory / "again.der";
-  ASSERT_EQ(run("orvanta-storebag", {"make-key", key, "-o", sameKey, "--layout", "pkcs1"}).status, 0);
-  EXPECT_EQ(run("orvanta-storebag", {"verify", document, "-k", sameKey}).status, 0);
+  ASSERT_EQ(run("orvanta-storebag", {"make-key", key, "-o", publicKey, "--layout", "pkcs1"}).status, 0);
+  EXPECT_EQ(run("orvanta-storebag", {"verify", document, "-k", publicKey}).status, 0);
   const std::string otherKey = directory / "other.der";
   ASSERT_EQ(run("orvanta-storebag", {"make-key", directory / "other.pem", "-o", otherKey}).status, 0);
   const auto refused = run("orvanta-storebag", {"verify", document, "-k", otherKey});
