@@ -232,18 +232,28 @@ TEST_F(OutboxTest, DescriptorsTravelWithTheirMessages) {
   ASSERT_TRUE(senderDelegate->waitForInvalidation());
 }
 
-TEST_F(OutboxTest, ADescriptorWaitsForItsFrameToComplete) {
-  int content = -1;
-  auto made = open([&](Connection& connection, Frame&) { content = contentOf(connection.takeDescriptor()); });
+TEST_F(OutboxTest, ADescriptorWaitsForItsFrameToCompleteAndIsClosedIfNobodyTakesIt) {
+  int ends[2] = {-1, -1};
+  ASSERT_EQ(::pipe(ends), 0);
+  const UniqueFd reading(ends[0]);
+  UniqueFd writing(ends[1]);
+  std::vector<bool> taken;
+  auto made = open([&](Connection& connection, Frame& frame) {
+    if (frame.method == "upload") taken.push_back(static_cast<bool>(connection.takeDescriptor()));
+  });
   const Bytes frame = notification("upload");
-  const UniqueFd descriptor = readableWith(42);
-  ASSERT_TRUE(made.peer.write(notification("plain")));
+  ASSERT_TRUE(made.peer.write(frame));
   ASSERT_TRUE(made.delegate->waitForFrames(1));
-  EXPECT_EQ(content, -1);
-  ASSERT_TRUE(made.peer.writeWithDescriptors(Bytes(frame.begin(), frame.begin() + 3), {descriptor.get()}));
+  ASSERT_TRUE(made.peer.writeWithDescriptors(Bytes(frame.begin(), frame.begin() + 3), {writing.get()}));
   ASSERT_TRUE(made.peer.write(Bytes(frame.begin() + 3, frame.end())));
-  ASSERT_TRUE(made.delegate->waitForFrames(2));
-  EXPECT_EQ(content, 42);
+  ASSERT_TRUE(made.peer.writeWithDescriptors(notification("takesNone"), {writing.get()}));
+  ASSERT_TRUE(made.delegate->waitForFrames(3));
+  writing.reset();
+  made.peer.close();
+  ASSERT_TRUE(made.delegate->waitForInvalidation());
+  EXPECT_EQ(taken, (std::vector<bool>{false, true}));
+  char byte = 0;
+  EXPECT_EQ(::read(reading.get(), &byte, 1), 0);  // nobody holds the other end any more
 }
 
 TEST_F(OutboxTest, TooManyWaitingDescriptorsEndTheConnection) {
@@ -267,21 +277,6 @@ TEST_F(OutboxTest, TooManyWaitingDescriptorsEndTheConnection) {
     EXPECT_TRUE(made.peer.atEnd());
   }
   EXPECT_TRUE(eventually([&] { return openDescriptors() == before; }));
-}
-
-TEST_F(OutboxTest, DescriptorsLeftOverAreClosedWithTheConnection) {
-  int ends[2] = {-1, -1};
-  ASSERT_EQ(::pipe(ends), 0);
-  const UniqueFd reading(ends[0]);
-  UniqueFd writing(ends[1]);
-  auto made = open();
-  ASSERT_TRUE(made.peer.writeWithDescriptors(notification("call"), {writing.get()}));
-  ASSERT_TRUE(made.delegate->waitForFrames(1));
-  writing.reset();
-  made.peer.close();
-  ASSERT_TRUE(made.delegate->waitForInvalidation());
-  char byte = 0;
-  EXPECT_EQ(::read(reading.get(), &byte, 1), 0);  // nobody holds the other end any more
 }
 
 }  // namespace

@@ -27,17 +27,5 @@ TEST(Utf8, TellsValidFromMalformed) {
   for (const std::string_view text : malformed) expectEverywhere(text, false);
 }
 
-TEST(Utf8, WritesWhatItReads) {
-  for (const char32_t codePoint :
-       {0x0U, 0x7fU, 0x80U, 0x7ffU, 0x800U, 0xd7ffU, 0xe000U, 0xffffU, 0x10000U, 0x10ffffU}) {
-    std::string text;
-    appendUtf8(text, codePoint);
-    const Utf8Character character = firstUtf8Character(text);
-    EXPECT_TRUE(character.valid);
-    EXPECT_EQ(character.codePoint, codePoint);
-    EXPECT_EQ(character.length, text.size());
-  }
-}
-
 }  // namespace
 }  // namespace platform

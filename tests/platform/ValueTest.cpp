@@ -108,16 +108,5 @@ TEST(Dictionary, MergePrefersTheOthersValues) {
   EXPECT_EQ(merged, (Dictionary{{"a", 1}, {"b", 2}, {"c", 2}, {"d", 2}}));
 }
 
-TEST(Dictionary, FromUniqueEntriesSortsOrRefuses) {
-  using Entries = std::vector<Dictionary::Entry>;
-  Entries unsorted{{"c", 1}, {"a", 2}, {"b", 3}};
-  EXPECT_EQ(Dictionary::fromUniqueEntries(std::move(unsorted)), (Dictionary{{"a", 2}, {"b", 3}, {"c", 1}}));
-  Entries repeated{{"c", 1}, {"a", 2}, {"c", 3}};
-  EXPECT_EQ(Dictionary::fromUniqueEntries(std::move(repeated)), std::nullopt);
-  EXPECT_EQ(repeated.size(), 3U);
-  Entries adjacent{{"a", 1}, {"a", 2}};
-  EXPECT_EQ(Dictionary::fromUniqueEntries(std::move(adjacent)), std::nullopt);
-}
-
 }  // namespace
 }  // namespace platform

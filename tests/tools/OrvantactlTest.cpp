@@ -26,7 +26,6 @@
 #include "tools/orvantactl/FlushVerdict.h"
 #include "tools/orvantactl/JsonValues.h"
 #include "tools/orvantactl/LineReader.h"
-#include "tools/orvantactl/OrderedLines.h"
 #include "tools/orvantactl/ProgressBar.h"
 
 namespace orvanta::ctl {
@@ -102,24 +101,6 @@ TEST(TaggedJson, readsBackWhatItWrote) {
   const auto read = parseTaggedJson(writeTaggedJson(value));
   ASSERT_TRUE(read);
   EXPECT_EQ(*read, value);
-}
-
-TEST(OrderedLines, comeOutInTheOrderOfTheirPlaces) {
-  OrderedLines lines;
-  const auto first = lines.reserve(), second = lines.reserve(), third = lines.reserve();
-  lines.fill(third, "3");
-  lines.fill(second, "2");
-  EXPECT_EQ(lines.take(), std::nullopt);
-  lines.fill(first, "1");
-  EXPECT_EQ(lines.take(), "1");
-  EXPECT_EQ(lines.take(), "2");
-  const auto fourth = lines.reserve();
-  EXPECT_EQ(lines.take(), "3");
-  EXPECT_EQ(lines.take(), std::nullopt);
-  EXPECT_EQ(lines.size(), 1U);
-  lines.fill(fourth, "4");
-  EXPECT_EQ(lines.take(), "4");
-  EXPECT_EQ(lines.size(), 0U);
 }
 
 std::vector<std::string> linesOf(const std::string& content) {
