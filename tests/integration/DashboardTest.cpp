@@ -192,7 +192,6 @@ TEST_F(FloodTest, AMillionWrongAcknowledgementsRemoveNothingAndHarmNobody) {
   auto session = openSession({.sessionID = 7});
   EXPECT_EQ(received(), 1) << "the session's start";
   dashboardServer.send(acknowledgement(1));
-  const auto calm = roundTrips(*bystander, [](std::size_t count) { return count == 2000; });
 
   send(*session, event(9, 1));
   const auto sentAt = Clock::now();
@@ -208,11 +207,10 @@ TEST_F(FloodTest, AMillionWrongAcknowledgementsRemoveNothingAndHarmNobody) {
   const auto flooded = roundTrips(*bystander, [&](std::size_t count) { return over && count >= 100; });
   flooder.join();
   const double wall = Seconds(Clock::now() - sentAt).count();
-  const auto median = [](const std::vector<double>& times) { return times[times.size() / 2]; };
-  fmt::print("a flood of {:.1f} s: a call's median was {:.0f} us, {:.1f} x the calm one\n", wall, median(flooded) * 1e6,
-             median(flooded) / median(calm));
+  const double median = flooded[flooded.size() / 2];
+  fmt::print("a flood of {:.1f} s: the median of another session's calls was {:.0f} us\n", wall, median * 1e6);
   // The flooder takes a processor of its own, which on a small machine the calls would otherwise have.
-  EXPECT_LT(median(flooded), 0.05);
+  EXPECT_LT(median, 0.05);
 
   // The datagram has kept its schedule, which a removal would have ended.
   const double ticks = std::floor(wall / kPeriod) - 1;

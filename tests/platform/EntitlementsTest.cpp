@@ -44,60 +44,54 @@ const std::string kUser = number("user", "4711");
 
 TEST(EntitlementsTest, ReadsOneFile) {
   const struct {
-    std::string content;
     bool granted;
-    const char* logged = nullptr;  // part of the one line; null: none
+    const char* logged;  // part of the one line; null: none
+    std::vector<std::string> contents;
   } rows[] = {
-      {grant(kUser), true},
-      {grant(text("user", "4711")), true},
-      {grant(number("group", "4712")), true},
-      {grant(text("group", "4713")), true},
-      {grant(text("group", "daemon")), true},
-      {grant(text("label", "trusted_t")), true},
-      {grant(kUser, "<integer>2</integer>"), true},
-      {grant(kUser, "<string>YES</string>"), true},
+      {true,
+       nullptr,
+       {grant(kUser), grant(text("user", "4711")), grant(number("group", "4712")), grant(text("group", "4713")),
+        grant(text("group", "daemon")), grant(text("label", "trusted_t")), grant(kUser, "<integer>2</integer>"),
+        grant(kUser, "<string>YES</string>")}},
       // What matches nobody here, or says no.
-      {grant(number("user", "4712")), false},
-      {grant(number("group", "4711")), false},
-      {grant(text("user", "root")), false},
-      {grant(text("label", "trusted")), false},
-      {grant(kUser, "<false/>"), false},
-      {grant(kUser, "<integer>0</integer>"), false},
-      {grant(kUser, "<string>NO</string>"), false},
-      {grant(kUser, "<array><true/></array>"), false},
+      {false,
+       nullptr,
+       {grant(number("user", "4712")), grant(number("group", "4711")), grant(text("user", "root")),
+        grant(text("label", "trusted")), grant(kUser, "<false/>"), grant(kUser, "<integer>0</integer>"),
+        grant(kUser, "<string>NO</string>"), grant(kUser, "<array><true/></array>")}},
       // What makes no sense.
-      {"user: 4711", false, "grant.plist"},
-      {"<plist><array/></plist>", false, "no dictionary"},
-      {grant(""), false, "exactly one of"},
-      {grant(kUser + number("group", "4712")), false, "exactly one of"},
-      {grant(number("users", "4711")), false, "unknown key \"users\", did you mean \"user\"?"},
-      {grant(kUser + text("expires", "never")), false, "unknown key \"expires\""},
-      {propertyList(kUser), false, "\"entitlements\" is missing"},
-      {propertyList(kUser + "<key>entitlements</key><array/>"), false, "is no dictionary"},
-      {grant(text("user", "no-such-user-here")), false, "there is no \"no-such-user-here\""},
-      {grant(text("group", "no-such-group-here")), false, "there is no"},
-      {grant(number("user", "-1")), false, "out of range"},
-      {grant(number("user", "4294971007")), false, "out of range"},
-      {grant(text("user", "4294971007")), false, "out of range"},
-      {grant(number("user", "4294967295")), false, "out of range"},
-      {grant("<key>user</key><true/>"), false, "neither a name nor a number"},
-      {grant("<key>user</key><real>4711</real>"), false, "neither a name nor a number"},
-      {grant(text("user", "")), false, "neither a name nor a number"},
-      {grant(text("label", "")), false, "\"label\" is no text"},
+      {false, "<4>", {"user: 4711"}},
+      {false, "no dictionary", {"<plist><array/></plist>"}},
+      {false, "exactly one of", {grant(""), grant(kUser + number("group", "4712"))}},
+      {false, "unknown key \"users\", did you mean \"user\"?", {grant(number("users", "4711"))}},
+      {false, "unknown key \"expires\"", {grant(kUser + text("expires", "never"))}},
+      {false, "\"entitlements\" is missing", {propertyList(kUser)}},
+      {false, "is no dictionary", {propertyList(kUser + "<key>entitlements</key><array/>")}},
+      {false, "there is no \"no-such-", {grant(text("user", "no-such-user")), grant(text("group", "no-such-group"))}},
+      {false,
+       "out of range",
+       {grant(number("user", "-1")), grant(number("user", "4294971007")), grant(text("user", "4294971007")),
+        grant(number("user", "4294967295"))}},
+      {false,
+       "neither a name nor a number",
+       {grant("<key>user</key><true/>"), grant("<key>user</key><real>4711</real>"), grant(text("user", ""))}},
+      {false, "\"label\" is no text", {grant(text("label", ""))}},
   };
   for (const auto& row : rows) {
-    SCOPED_TRACE(row.content);
-    const TemporaryDirectory directory;
-    directory.write("grant.plist", row.content);
-    LogCapture log;
-    Entitlements entitlements(directory.path());
-    EXPECT_EQ(entitlements.holds(somebody(), kGranted), row.granted);
-    EXPECT_FALSE(entitlements.holds(somebody(), "com.example.mayNot"));
-    EXPECT_EQ(log.lines().size(), row.logged == nullptr ? 0U : 1U) << "once, however often it is read";
-    if (row.logged == nullptr) continue;
-    EXPECT_EQ(log.count(row.logged), 1U);
-    EXPECT_EQ(log.count("grant.plist"), 1U) << "the file is named";
-    EXPECT_EQ(log.count("<4>"), 1U);
+    for (const std::string& content : row.contents) {
+      SCOPED_TRACE(content);
+      const TemporaryDirectory directory;
+      directory.write("grant.plist", content);
+      LogCapture log;
+      Entitlements entitlements(directory.path());
+      EXPECT_EQ(entitlements.holds(somebody(), kGranted), row.granted);
+      EXPECT_FALSE(entitlements.holds(somebody(), "com.example.mayNot"));
+      EXPECT_EQ(log.lines().size(), row.logged == nullptr ? 0U : 1U) << "once, however often it is read";
+      if (row.logged == nullptr) continue;
+      EXPECT_EQ(log.count("<4>"), 1U);
+      EXPECT_EQ(log.count(row.logged), 1U);
+      EXPECT_EQ(log.count("grant.plist"), 1U) << "the file is named";
+    }
   }
 }
 

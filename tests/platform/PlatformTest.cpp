@@ -12,24 +12,6 @@
 namespace platform {
 namespace {
 
-// The process's environment with some variables changed, until the object goes.
-class ChangedEnvironment {
- public:
-  explicit ChangedEnvironment(std::vector<std::pair<const char*, const char*>> changes) {
-    for (const auto& [name, value] : changes) {
-      const char* before = std::getenv(name);
-      _before.emplace_back(name, before == nullptr ? std::nullopt : std::optional<std::string>(before));
-      value == nullptr ? ::unsetenv(name) : ::setenv(name, value, 1);
-    }
-  }
-  ~ChangedEnvironment() {
-    for (const auto& [name, value] : _before) value ? ::setenv(name, value->c_str(), 1) : ::unsetenv(name);
-  }
-
- private:
-  std::vector<std::pair<const char*, std::optional<std::string>>> _before;
-};
-
 TEST(FileLocations, comeFromTheEnvironment) {
   // A variable's value, and what becomes of it where the service manager may give several paths, and elsewhere.
   const struct {
@@ -46,12 +28,10 @@ TEST(FileLocations, comeFromTheEnvironment) {
   };
   const FileLocations defaults;
   for (const auto& [given, listed, single] : rows) {
-    const ChangedEnvironment environment({{"RUNTIME_DIRECTORY", given},
-                                          {"STATE_DIRECTORY", given},
-                                          {"CONFIGURATION_DIRECTORY", given},
-                                          {"ORVANTA_FRAMEWORK", given},
-                                          {"ORVANTA_PLUGINS", given},
-                                          {"ORVANTA_CA_FILE", given}});
+    for (const char* name : {"RUNTIME_DIRECTORY", "STATE_DIRECTORY", "CONFIGURATION_DIRECTORY", "ORVANTA_FRAMEWORK",
+                             "ORVANTA_PLUGINS", "ORVANTA_CA_FILE"}) {
+      given == nullptr ? ::unsetenv(name) : ::setenv(name, given, 1);
+    }
     const FileLocations locations = FileLocations::fromEnvironment();
     EXPECT_EQ(locations.runtimeDirectory, listed.value_or(defaults.runtimeDirectory));
     EXPECT_EQ(locations.stateDirectory, listed.value_or(defaults.stateDirectory));

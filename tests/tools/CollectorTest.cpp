@@ -42,7 +42,7 @@ TEST_F(CollectorTest, TakesChunkedAndPipelinedRequests) {
       "POST /events HTTP/1.1\r\nTransfer-Encoding: chunked\r\n\r\nd;ext=1\r\n{\"events\":[{}\r\n2\r\n]}\r\n0\r\nT: "
       "1\r\n\r\n"
       "POST /events HTTP/1.1\r\nContent-Length: 13\r\n\r\n{\"events\":[]}"
-      "POST /events HTTP/1.0\r\nContent-Length: 15\r\n\r\n{\"events\":[{}]}");
+      "POST /events HTTP/1.0\r\nContent-Length: 15\r\n\r\n{\"events\":[{}]}");  // and closes
   EXPECT_THAT(answer, testing::EndsWith("\r\n\r\n{\"accepted\":1}\n")) << "the last one's";
   EXPECT_EQ(collector->requests().size(), 3U);
   EXPECT_EQ(collector->events().size(), 2U);
@@ -52,15 +52,24 @@ TEST_F(CollectorTest, RefusesWhatIsNoHttpAndWhatIsTooLong) {
   CollectorOptions options;
   options.maximumBodyBytes = 1000;
   start(std::move(options));
-  const std::vector<std::pair<std::string, std::string>> table{
-      {"GET /x HTTP/3\r\n\r\n", "HTTP/1.1 400 "},
-      {"POST /events HTTP/1.1\r\nContent-Length: x\r\n\r\n", "HTTP/1.1 400 "},
-      {"POST /events HTTP/1.1\r\nTransfer-Encoding: chunked\r\n\r\nfffffffffffffff0\r\n", "HTTP/1.1 400 "},
-      {"GET /" + std::string(70'000, 'a'), "HTTP/1.1 431 "},
+  const std::string noHttp[] = {
+      "\r\n\r\n",
+      "GET /\r\n\r\n",
+      "GET /x HTTP/3\r\n\r\n",
+      "GET / a HTTP/1.1\r\n\r\n",
+      "GET /x HTTP/1.1\r\nno colon\r\n\r\n",
+      "GET /x HTTP/1.1\r\nA b: 1\r\n\r\n",
+      "GET /x HTTP/1.1\r\n a: 2\r\n\r\n",
+      "POST /events HTTP/1.1\r\nContent-Length: x\r\n\r\n",
+      "POST /events HTTP/1.1\r\nContent-Length: -1\r\n\r\n",
+      "POST /events HTTP/1.1\r\nContent-Length: 1\r\nContent-Length: 2\r\n\r\nab",
+      "POST /events HTTP/1.1\r\nTransfer-Encoding: chunked\r\n\r\nzz\r\n",
+      "POST /events HTTP/1.1\r\nTransfer-Encoding: chunked\r\n\r\nfffffffffffffff0\r\n",
   };
-  for (const auto& [bytes, expected] : table) {
-    EXPECT_THAT(converse(bytes, true), testing::StartsWith(expected)) << bytes.substr(0, 100);
+  for (const std::string& bytes : noHttp) {
+    EXPECT_THAT(converse(bytes, true), testing::StartsWith("HTTP/1.1 400 ")) << bytes;
   }
+  EXPECT_THAT(converse("GET /" + std::string(70'000, 'a'), true), testing::StartsWith("HTTP/1.1 431 "));
   EXPECT_EQ(post("/events", std::string(1001, ' '))->status, 413);
 }
 
