@@ -5,10 +5,6 @@
 
 namespace orvanta::test {
 
-using platform::Array;
-using platform::Dictionary;
-using platform::Value;
-
 namespace {
 
 class Aggregation : public ClientFixture {

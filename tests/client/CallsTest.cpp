@@ -8,11 +8,6 @@
 
 namespace orvanta::test {
 
-using platform::Array;
-using platform::Dictionary;
-using platform::Frame;
-using platform::Value;
-
 namespace {
 
 class Calls : public ClientFixture {};

@@ -16,6 +16,11 @@
 
 namespace orvanta::test {
 
+using platform::Array;
+using platform::Dictionary;
+using platform::Frame;
+using platform::Value;
+
 constexpr std::chrono::seconds kPatience{30};
 
 template <class T>

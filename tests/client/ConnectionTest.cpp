@@ -9,9 +9,6 @@
 
 namespace orvanta::test {
 
-using platform::Dictionary;
-using platform::Frame;
-
 namespace {
 
 class Connection : public ClientFixture {};

@@ -12,8 +12,6 @@
 
 namespace orvanta::test {
 
-using platform::Frame;
-
 namespace {
 
 std::string contentOf(int fd) {

@@ -1,10 +1,8 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <linux/capability.h>
-#include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <atomic>
@@ -15,6 +13,7 @@
 #include "platform/PropertyList.h"
 #include "tests/integration/IntegrationFixture.h"
 #include "tests/integration/RawClient.h"
+#include "tests/support/ForbiddenActs.h"
 
 namespace orvanta::test {
 namespace {
@@ -190,12 +189,8 @@ TEST_F(UploadTest, AFileInADirectoryThatMayNotBeWrittenStays) {
 TEST_F(UploadTest, WhatIsNoRegularFileIsRefusedAtOnceAndStays) {
   const auto fifo = files / "fifo";
   ASSERT_EQ(::mkfifo(fifo.c_str(), 0600), 0);
-  const platform::UniqueFd listener(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
   const auto socket = files / "socket";
-  socket.copy(address.sun_path, sizeof address.sun_path - 1);
-  ASSERT_EQ(::bind(listener.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+  ASSERT_EQ(binding(socket), "done");
   fs::create_directory(files / "directory");
   std::vector<std::string> paths{fifo, socket, files / "directory", "/dev/zero", "/dev/tty"};
   for (const std::string target : {"fifo", "socket", "directory", "/dev/zero"}) {

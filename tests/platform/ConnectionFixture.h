@@ -25,6 +25,7 @@
 
 namespace orvanta::test {
 
+using namespace platform;
 using Bytes = std::vector<std::uint8_t>;
 
 inline Bytes operator+(Bytes left, const Bytes& right) {
@@ -38,33 +39,33 @@ inline Bytes repeated(const Bytes& bytes, std::size_t times) {
 }
 
 // Whole messages.
-inline Bytes notification(std::string_view method, const platform::Value& parameter = nullptr) {
+inline Bytes notification(std::string_view method, const Value& parameter = nullptr) {
   Bytes bytes;
-  platform::appendNotificationHeader(bytes, method, 1);
-  platform::MessagePackWriter(bytes).value(parameter);
+  appendNotificationHeader(bytes, method, 1);
+  MessagePackWriter(bytes).value(parameter);
   return bytes;
 }
 inline Bytes request(std::uint32_t id, std::string_view method) {
   Bytes bytes;
-  platform::appendRequestHeader(bytes, id, method, 0);
+  appendRequestHeader(bytes, id, method, 0);
   return bytes;
 }
-inline Bytes response(std::uint32_t id, const platform::Value& result) {
+inline Bytes response(std::uint32_t id, const Value& result) {
   Bytes bytes;
-  platform::appendResponseHeader(bytes, id);
-  platform::MessagePackWriter writer(bytes);
+  appendResponseHeader(bytes, id);
+  MessagePackWriter writer(bytes);
   writer.nil();
   writer.value(result);
   return bytes;
 }
 
 // Keeps what a connection delivers, and hands each frame to `onFrame` on the way. Thread-safe.
-class RecordingDelegate final : public platform::ConnectionDelegate {
+class RecordingDelegate final : public ConnectionDelegate {
  public:
-  std::function<void(platform::Frame&)> onFrame;  // set before the connection resumes
+  std::function<void(Frame&)> onFrame;  // set before the connection resumes
   std::function<void()> onInvalidated;
 
-  void received(platform::Frame&& frame) override {
+  void received(Frame&& frame) override {
     if (onFrame) onFrame(frame);
     change([&] { _methods.push_back(frame.method); });
   }
@@ -131,14 +132,14 @@ class RecordingDelegate final : public platform::ConnectionDelegate {
 class Peer {
  public:
   Peer() = default;
-  explicit Peer(platform::UniqueFd socket) : _socket(std::move(socket)) {
+  explicit Peer(UniqueFd socket) : _socket(std::move(socket)) {
     const timeval patience{kHangGuard.count(), 0};
     ::setsockopt(fd(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
     ::setsockopt(fd(), SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience);
   }
 
   int fd() const { return _socket.get(); }
-  platform::UniqueFd takeSocket() { return std::move(_socket); }
+  UniqueFd takeSocket() { return std::move(_socket); }
   bool write(std::span<const std::uint8_t> bytes) const {
     while (!bytes.empty()) {
       const ssize_t size = ::send(fd(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
@@ -186,7 +187,7 @@ class Peer {
   void close() { _socket.reset(); }
 
  private:
-  platform::UniqueFd _socket;
+  UniqueFd _socket;
 };
 
 // A running pool, and connections whose other ends the test holds.
@@ -203,7 +204,7 @@ class ConnectionFixture : public ::testing::Test {
   }
 
   struct Made {
-    std::shared_ptr<platform::Connection> connection;
+    std::shared_ptr<Connection> connection;
     std::shared_ptr<RecordingDelegate> delegate;
     Peer peer;
     // Declared behind what its handlers use, it stops the pool before that goes, however the test ends.
@@ -213,13 +214,13 @@ class ConnectionFixture : public ::testing::Test {
   Made make() {
     int fds[2] = {-1, -1};
     EXPECT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, fds), 0);
-    return {platform::Connection::create(*_pool, platform::UniqueFd(fds[0]), {}), std::make_shared<RecordingDelegate>(),
-            Peer(platform::UniqueFd(fds[1])), std::shared_ptr<void>(nullptr, [this](void*) {
+    return {Connection::create(*_pool, UniqueFd(fds[0]), {}), std::make_shared<RecordingDelegate>(),
+            Peer(UniqueFd(fds[1])), std::shared_ptr<void>(nullptr, [this](void*) {
               if (_pool) _pool->stop();
             })};
   }
   // Resumed.
-  Made open(std::function<void(platform::Connection&, platform::Frame&)> onFrame = {}) {
+  Made open(std::function<void(Connection&, Frame&)> onFrame = {}) {
     Made made = make();
     if (onFrame) {
       made.delegate->onFrame = [weak = std::weak_ptr(made.connection), onFrame = std::move(onFrame)](auto& frame) {
@@ -229,7 +230,7 @@ class ConnectionFixture : public ::testing::Test {
     made.connection->resume(made.delegate);
     return made;
   }
-  void onQueueOf(platform::Connection& connection, const std::function<void()>& step) {
+  void onQueueOf(Connection& connection, const std::function<void()>& step) {
     Counter done;
     connection.queue()->post([&] {
       step();
@@ -238,7 +239,7 @@ class ConnectionFixture : public ::testing::Test {
     ASSERT_TRUE(done.waitFor(1));
   }
 
-  std::optional<platform::WorkPool> _pool;
+  std::optional<WorkPool> _pool;
 };
 
 inline std::size_t openDescriptors() {

@@ -10,11 +10,6 @@
 namespace orvanta::test {
 namespace {
 
-using platform::BlockingScope;
-using platform::Connection;
-using platform::Frame;
-using platform::Outbox;
-using platform::Value;
 using namespace std::chrono_literals;
 
 using ConnectionTest = ConnectionFixture;
@@ -50,7 +45,7 @@ TEST_F(ConnectionTest, ABrokenStreamEndsItAfterTheFramesBefore) {
 }
 
 TEST_F(ConnectionTest, EndsQuietlyWhenThePeerClosesWithinAFrame) {
-  LogCapture log(platform::LogLevel::info);
+  LogCapture log(LogLevel::info);
   auto made = open();
   const Bytes whole = notification("whole");
   ASSERT_TRUE(made.peer.write(whole + Bytes(whole.begin(), whole.end() - 2)));

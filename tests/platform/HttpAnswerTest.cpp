@@ -3,9 +3,6 @@
 namespace platform {
 namespace {
 
-using orvanta::test::RawConnection;
-using orvanta::test::RawServer;
-
 class HttpAnswerTest : public HttpFixture {
  protected:
   // The client's result when the server sends `answer` and closes the connection.

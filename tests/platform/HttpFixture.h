@@ -16,6 +16,10 @@
 
 namespace platform {
 
+using orvanta::test::LogCapture;
+using orvanta::test::RawConnection;
+using orvanta::test::RawServer;
+
 // A real client with a pool of its own.
 class HttpFixture : public testing::Test {
  protected:
@@ -65,10 +69,10 @@ class HttpFixture : public testing::Test {
     EXPECT_FALSE(result.error.empty());
     EXPECT_TRUE(has(result.error, part)) << result.error;
   }
-  static orvanta::test::RawServer::Script answering(std::string_view status) {
-    return orvanta::test::RawServer::answering(orvanta::test::RawServer::response(status));
+  static RawServer::Script answering(std::string_view status) {
+    return RawServer::answering(RawServer::response(status));
   }
-  static void beSilent(orvanta::test::RawConnection& connection) {
+  static void beSilent(RawConnection& connection) {
     connection.readRequest();
     connection.waitForClose();
   }

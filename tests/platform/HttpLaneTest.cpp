@@ -13,8 +13,6 @@ namespace platform {
 namespace {
 
 using orvanta::test::Counter;
-using orvanta::test::RawConnection;
-using orvanta::test::RawServer;
 
 std::string pathOf(const std::string& request) {
   const std::size_t begin = request.find(' ') + 1;

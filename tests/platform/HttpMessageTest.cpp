@@ -5,10 +5,6 @@
 namespace platform {
 namespace {
 
-using orvanta::test::LogCapture;
-using orvanta::test::RawConnection;
-using orvanta::test::RawServer;
-
 class HttpMessageTest : public HttpFixture {
  protected:
   // What went over the wire for `request`, and the log lines about it.

@@ -5,9 +5,6 @@
 namespace platform {
 namespace {
 
-using orvanta::test::RawConnection;
-using orvanta::test::RawServer;
-
 TEST(HttpRedirectVerdict, Table) {
   using enum RedirectVerdict;
   const struct {

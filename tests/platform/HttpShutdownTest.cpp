@@ -29,8 +29,6 @@ extern "C" int getaddrinfo(const char* node, const char* service, const addrinfo
 namespace platform {
 namespace {
 
-using orvanta::test::RawConnection;
-using orvanta::test::RawServer;
 using std::chrono::milliseconds;
 using std::chrono::seconds;
 

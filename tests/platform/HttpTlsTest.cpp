@@ -10,8 +10,6 @@
 namespace platform {
 namespace {
 
-using orvanta::test::RawConnection;
-using orvanta::test::RawServer;
 using orvanta::test::TemporaryDirectory;
 using orvanta::test::TestAuthority;
 using orvanta::test::TestIdentity;

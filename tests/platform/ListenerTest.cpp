@@ -26,11 +26,6 @@
 namespace orvanta::test {
 namespace {
 
-using platform::connectToService;
-using platform::Listener;
-using platform::OfferedConnection;
-using platform::ServiceListener;
-using platform::UniqueFd;
 using ::testing::HasSubstr;
 
 const std::string kService = "test.service";
@@ -46,7 +41,7 @@ class ListenerTest : public ConnectionFixture {
     };
   }
   static bool refuse(OfferedConnection&& /*offered*/) { return false; }
-  platform::Result<std::unique_ptr<Listener>> create(Listener::Handler handler) {
+  Result<std::unique_ptr<Listener>> create(Listener::Handler handler) {
     return Listener::create(*_pool, _directory.path(), kService, std::move(handler));
   }
   std::unique_ptr<Listener> listen(Listener::Handler handler) {
@@ -72,7 +67,7 @@ class ListenerTest : public ConnectionFixture {
 
 UniqueFd listeningSocket(const std::string& path, bool listening = true) {
   UniqueFd socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  const auto address = platform::unixAddress(path);
+  const auto address = unixAddress(path);
   EXPECT_EQ(::bind(socket.get(), reinterpret_cast<const sockaddr*>(&*address), sizeof *address), 0);
   if (listening) {
     EXPECT_EQ(::listen(socket.get(), 8), 0);
@@ -100,7 +95,7 @@ TEST_F(ListenerTest, OffersEveryConnectionWithItsPeer) {
   listener->stop();
   const UniqueFd unconnected(::socket(AF_UNIX, SOCK_STREAM, 0));
   const UniqueFd internet(::socket(AF_INET, SOCK_STREAM, 0));
-  for (const int nobody : {unconnected.get(), internet.get(), -1}) EXPECT_FALSE(platform::peerIdentityOf(nobody).ok());
+  for (const int nobody : {unconnected.get(), internet.get(), -1}) EXPECT_FALSE(peerIdentityOf(nobody).ok());
 }
 
 TEST_F(ListenerTest, EverybodyMayConnectWhateverTheMaskButNobodyIsAcceptedBeforeResume) {
@@ -229,7 +224,7 @@ TEST_F(ListenerTest, AHandlerMayStopItsListener) {
 
 TEST_F(ListenerTest, OneUserHasOnlySoManyConnectionsAtATime) {
   LogCapture log;
-  auto socket = platform::openServiceSocket(_directory.path(), kService);
+  auto socket = openServiceSocket(_directory.path(), kService);
   ASSERT_TRUE(socket.ok());
   const auto welcoming = [admit = admitting()](OfferedConnection&& offered) {
     offered.connection->outbox()->send(notification("welcome"));
@@ -290,7 +285,7 @@ TEST_F(ListenerTest, PausesWhenDescriptorsRunOutAndGoesOn) {
 // Back-pressure wants a descriptor of its own; without one it must still get on.
 TEST_F(ListenerTest, RepliesStillGoOutWhenDescriptorsRunOut) {
   auto made = open();
-  const Bytes reply = response(1, platform::Value(std::string(2U << 20U, 'r')));
+  const Bytes reply = response(1, Value(std::string(2U << 20U, 'r')));
   {
     const DescriptorsExhausted exhausted;
     EXPECT_TRUE(made.connection->outbox()->send(reply));

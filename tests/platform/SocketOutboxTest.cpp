@@ -14,13 +14,6 @@
 namespace orvanta::test {
 namespace {
 
-using platform::Connection;
-using platform::ConnectionLimits;
-using platform::Frame;
-using platform::FrameDecoder;
-using platform::Outbox;
-using platform::UniqueFd;
-using platform::Value;
 using namespace std::chrono_literals;
 
 class OutboxTest : public ConnectionFixture {
@@ -125,7 +118,7 @@ TEST_F(OutboxTest, MessagesOfManyThreadsStayWholeAndInOrder) {
     senders.emplace_back([&, sender] {
       for (int i = 0; i < kMessages; ++i) {
         const std::string filling(static_cast<std::size_t>((i * 37 + sender * 11) % 3000), 'a');
-        const Value parameter(platform::Array{Value(i), Value(filling)});
+        const Value parameter(Array{Value(i), Value(filling)});
         EXPECT_TRUE(made.connection->outbox()->send(notification(std::to_string(sender), parameter)));
       }
     });

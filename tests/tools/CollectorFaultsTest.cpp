@@ -7,8 +7,6 @@
 namespace orvanta::collector {
 namespace {
 
-using platform::Dictionary;
-
 const std::string kPost = R"({"events":[{"n":1}]})";
 
 class CollectorFaultsTest : public CollectorFixture {

@@ -17,6 +17,10 @@
 
 namespace orvanta::collector {
 
+using platform::Array;
+using platform::Dictionary;
+using platform::Value;
+
 // A collector in a directory of its own, and HTTP clients for it.
 class CollectorFixture : public testing::Test {
  protected:

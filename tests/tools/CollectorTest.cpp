@@ -12,8 +12,6 @@
 namespace orvanta::collector {
 namespace {
 
-using platform::Array;
-using platform::Dictionary;
 using testing::ElementsAre;
 using testing::Pair;
 

@@ -14,8 +14,6 @@
 namespace orvanta::collector {
 namespace {
 
-using platform::Dictionary;
-
 // A daemon's side: an unconnected socket, so that forged acknowledgements from elsewhere show too.
 class DashboardServerTest : public CollectorFixture {
  protected:

@@ -12,10 +12,6 @@
 namespace orvanta::collector {
 namespace {
 
-using platform::Array;
-using platform::Dictionary;
-using platform::Value;
-
 class StorebagServerTest : public CollectorFixture {
  protected:
   httplib::Result get(const std::string& name, httplib::Headers headers = {}) const {
