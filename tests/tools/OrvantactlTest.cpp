@@ -9,15 +9,11 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
-#include <memory>
-#include <optional>
-#include <stdexcept>
 #include <string>
 #include <thread>
 #include <vector>
 
-#include "client/OrvantaClient.h"
-#include "tests/support/ScriptedDaemon.h"
+#include "tests/client/ClientFixture.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tools/orvantactl/DefaultsValue.h"
 #include "tools/orvantactl/EventJson.h"
@@ -202,29 +198,16 @@ TEST(EventJson, tellsAllOfAnEvent) {
   EXPECT_EQ(watchingLine("a\"b", 2), R"({"watching":{"level":2,"token":"a\"b"}})");
 }
 
-class Pipeline : public testing::Test {
+class Pipeline : public test::ClientFixture {
  protected:
-  Pipeline() {
-    auto connected = OrvantaConnection::connect({.socketDirectory = daemon.directory()});
-    if (!connected) throw std::runtime_error(connected.error().text);
-    connection = std::move(*connected);
-    peer.emplace(daemon.accept());
-  }
-  ~Pipeline() override {
-    connection.reset();
-    std::free(written);
-  }
-
-  test::ScriptedDaemon daemon;
-  std::optional<test::ScriptedPeer> peer;
-  std::unique_ptr<OrvantaConnection> connection;
-  char* written = nullptr;
-  std::size_t size = 0;
+  void TearDown() override { connection.reset(); }
 };
 
 TEST_F(Pipeline, writesAnswersInOrderAndCountsFailures) {
+  char* written = nullptr;
+  std::size_t size = 0;
   std::FILE* out = ::open_memstream(&written, &size);
-  EventPipeline pipeline(connection->session(), 4, out);
+  EventPipeline pipeline(session(), 4, out);
   pipeline.send(1, {.category = 1});
   pipeline.send(2, {.category = 2});
   pipeline.send(4, {.category = 3});
@@ -237,13 +220,14 @@ TEST_F(Pipeline, writesAnswersInOrderAndCountsFailures) {
   EXPECT_STREQ(
       written,
       "{\"event\":1,\"reply\":null}\n{\"event\":2,\"error\":\"no \\\"room\\\"\"}\n{\"event\":4,\"reply\":\"c\"}\n");
+  std::free(written);
   EXPECT_EQ(pipeline.failures(), 1U);
   EXPECT_FALSE(pipeline.lost());
 }
 
 TEST_F(Pipeline, neverHasMoreUnderWayThanItsWindow) {
   constexpr int kEvents = 200, kWindow = 2;
-  EventPipeline pipeline(connection->session(), kWindow, nullptr);
+  EventPipeline pipeline(session(), kWindow, nullptr);
   std::atomic<int> sent = 0;
   std::thread sender([&] {
     for (int i = 1; i <= kEvents; ++i) {
@@ -267,7 +251,7 @@ TEST_F(Pipeline, neverHasMoreUnderWayThanItsWindow) {
 }
 
 TEST_F(Pipeline, tellsThatTheDaemonHasGone) {
-  EventPipeline pipeline(connection->session(), 2, nullptr);
+  EventPipeline pipeline(session(), 2, nullptr);
   pipeline.send(1, {});
   peer->next();
   peer->close();
