@@ -77,10 +77,14 @@ bool UploadBackend::uploadFileAtPath(const UploadFile& file) {
     return false;
   }
 
-  std::optional<UploadBudget::Share> share;
+  std::unique_ptr<UploadBudget::Share> share;
   {
     const platform::BlockingScope waitingForOthers;
-    share.emplace(UploadBudget::of(platform()), UploadBudget::kCopies * *size);
+    share = UploadBudget::Share::take(UploadBudget::of(platform()), UploadBudget::kCopies * *size);
+  }
+  if (!share) {
+    ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): The daemon is ending.");
+    return false;
   }
   std::optional<std::string> body = compressedContent(handle, *size);
   if (!body) return false;

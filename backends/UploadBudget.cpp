@@ -8,14 +8,23 @@ UploadBudget& UploadBudget::of(platform::Platform& platform) {
   return *platform.once<std::unique_ptr<UploadBudget>>([] { return std::make_unique<UploadBudget>(); });
 }
 
-UploadBudget::Share::Share(UploadBudget& budget, std::uint64_t bytes) : _budget(budget), _bytes(bytes) {
-  std::unique_lock lock(_budget._mutex);
-  const std::uint64_t ticket = _budget._nextTicket++;
-  _budget._changed.wait(lock,
-                        [&] { return ticket == _budget._admitting && _budget._taken + bytes <= kMaximumTotalBytes; });
-  _budget._taken += bytes;
-  ++_budget._admitting;
-  _budget._changed.notify_all();
+std::unique_ptr<UploadBudget::Share> UploadBudget::Share::take(UploadBudget& budget, std::uint64_t bytes) {
+  std::unique_lock lock(budget._mutex);
+  const std::uint64_t ticket = budget._nextTicket++;
+  budget._changed.wait(lock, [&] {
+    return budget._closed || (ticket == budget._admitting && budget._taken + bytes <= kMaximumTotalBytes);
+  });
+  if (budget._closed) return nullptr;
+  budget._taken += bytes;
+  ++budget._admitting;
+  budget._changed.notify_all();
+  return std::unique_ptr<Share>(new Share(budget, bytes));
+}
+
+void UploadBudget::close() {
+  const std::lock_guard lock(_mutex);
+  _closed = true;
+  _changed.notify_all();
 }
 
 void UploadBudget::Share::shrinkTo(std::uint64_t bytes) {

@@ -2,6 +2,7 @@
 
 #include <condition_variable>
 #include <cstdint>
+#include <memory>
 #include <mutex>
 
 #include "platform/Platform.h"
@@ -22,19 +23,25 @@ class UploadBudget {
 
   static UploadBudget& of(platform::Platform& platform);
 
-  // Holds `bytes`, at most kMaximumTotalBytes, while it lives. Its making blocks.
+  // Holds `bytes`, at most kMaximumTotalBytes, while it lives.
   class Share {
    public:
-    Share(UploadBudget& budget, std::uint64_t bytes);
+    // Blocks until there is so much. Null once the budget is closed.
+    static std::unique_ptr<Share> take(UploadBudget& budget, std::uint64_t bytes);
     ~Share() { shrinkTo(0); }
     Share(const Share&) = delete;
     Share& operator=(const Share&) = delete;
     void shrinkTo(std::uint64_t bytes);
 
    private:
+    Share(UploadBudget& budget, std::uint64_t bytes) : _budget(budget), _bytes(bytes) {}
+
     UploadBudget& _budget;
     std::uint64_t _bytes;
   };
+
+  // Nobody gets a share any more, those who wait included. For shutting down.
+  void close();
 
  private:
   std::mutex _mutex;
@@ -42,6 +49,7 @@ class UploadBudget {
   std::uint64_t _taken = 0;       // guarded by _mutex, as what follows
   std::uint64_t _nextTicket = 0;  // of who comes next
   std::uint64_t _admitting = 0;   // the ticket whose turn it is
+  bool _closed = false;
 };
 
 }  // namespace orvanta

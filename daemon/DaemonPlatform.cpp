@@ -1,9 +1,11 @@
 #include "daemon/DaemonPlatform.h"
 
+#include <chrono>
 #include <cstdlib>
 #include <filesystem>
 #include <string_view>
 
+#include "backends/UploadBudget.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/JsonLinesPowerLog.h"
@@ -12,8 +14,8 @@
 namespace orvanta {
 
 namespace {
-// Jobs are short, blocked ones get a stand-in, and what computes for long has threads of its own: waking a second thread
-// would cost more than it takes off the first.
+// Jobs are short, blocked ones get a stand-in, and what computes for long has threads of its own: waking a second
+// thread would cost more than it takes off the first.
 constexpr std::size_t kPoolThreads = 1;
 }  // namespace
 
@@ -67,6 +69,19 @@ std::unique_ptr<platform::Sandbox> enterDaemonSandbox(const platform::FileLocati
   }
   ORVANTA_LOG(info, "main: {}", (*entered)->description());
   return std::move(*entered);
+}
+
+void endWaiting(platform::Platform& platform) {
+  platform.http().abortBlockingRequests();
+  UploadBudget::of(platform).close();
+}
+
+void finishDeliveries(platform::Platform& platform) {
+  using std::chrono::milliseconds;
+  // Datagrams and posts are jobs by now; then they are requests in flight.
+  platform.pool().drain(milliseconds(2000));
+  platform.http().shutdown(milliseconds(5000));
+  platform.pool().drain(milliseconds(1000));
 }
 
 }  // namespace orvanta

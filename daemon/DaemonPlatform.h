@@ -18,4 +18,9 @@ std::map<std::string, std::string> sandboxVariables(const platform::FileLocation
 // Enters the service's sandbox, or says why not and returns null. ORVANTA_SANDBOX=off stays outside, with a warning.
 std::unique_ptr<platform::Sandbox> enterDaemonSandbox(const platform::FileLocations& files);
 
+// For ending, on the main thread. Calls that wait for a server or for memory get their errors, now and from now on.
+void endWaiting(platform::Platform& platform);
+// Gives what the sessions' ends made a few seconds to leave, and ends the HTTP client.
+void finishDeliveries(platform::Platform& platform);
+
 }  // namespace orvanta

@@ -1,4 +1,3 @@
-#include <chrono>
 #include <utility>
 
 #include "daemon/DaemonPlatform.h"
@@ -15,7 +14,6 @@
 
 int main() {
   using namespace orvanta;
-  using std::chrono::milliseconds;
 
   platform::enterUtilitySchedulingClass();
   platform::tuneAllocator();
@@ -49,16 +47,12 @@ int main() {
   platform::releaseUnusedMemory();  // what only the start needed
 
   const int signal = platform::waitForTermination();
-
   ORVANTA_LOG(info, "main: Ending on signal {}", signal);
   platform::KeepAlive::stopping();
   listener->stop();
-  device->http().abortBlockingRequests();
+  endWaiting(*device);
   agent.endAllSessions();
-  // Datagrams and posts that the sessions' ends made are jobs by now; then they are requests in flight.
-  device->pool().drain(milliseconds(2000));
-  device->http().shutdown(milliseconds(5000));
-  device->pool().drain(milliseconds(1000));
+  finishDeliveries(*device);
   listener.reset();
   device->pool().stop();
   OrvantaLogging::close();

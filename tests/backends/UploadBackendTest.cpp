@@ -6,7 +6,7 @@
 #include <sys/stat.h>
 
 #include <filesystem>
-#include <thread>
+#include <future>
 
 #include "backends/UploadBudget.h"
 #include "backends/UploadURL.h"
@@ -162,19 +162,25 @@ TEST_F(UploadBackendTest, RequestsThatCannotBeMade) {
   EXPECT_EQ(log.count("<3>UploadBackend(initWithName): can't resolve upload post URL."), 3U);
 }
 
-TEST_F(UploadBackendTest, UploadsShareTheirMemory) {
-  UploadBudget budget;
-  std::optional<UploadBudget::Share> large(std::in_place, budget, UploadBudget::kMaximumTotalBytes);
-  std::atomic<bool> admitted = false;
-  std::thread second([&] {
-    const UploadBudget::Share share(budget, UploadBudget::kMaximumTotalBytes - 1);
-    admitted = true;
-  });
-  large->shrinkTo(2);  // not yet enough
-  EXPECT_FALSE(admitted);
+TEST_F(UploadBackendTest, UploadsShareTheirMemoryUntilTheDaemonEnds) {
+  using Share = UploadBudget::Share;
+  auto& budget = UploadBudget::of(platform);
+  auto large = Share::take(budget, UploadBudget::kMaximumTotalBytes);
+  auto second =
+      std::async(std::launch::async, [&] { return Share::take(budget, UploadBudget::kMaximumTotalBytes - 1); });
+  large->shrinkTo(2);
+  EXPECT_EQ(second.wait_for(std::chrono::milliseconds(20)), std::future_status::timeout) << "not yet enough";
   large.reset();
-  second.join();
-  EXPECT_TRUE(admitted);
+  const auto taken = second.get();
+  EXPECT_NE(taken, nullptr);
+
+  const std::string file = platform.directory.write("file", "content");
+  const UniqueFd fd(::open(file.c_str(), O_RDONLY | O_CLOEXEC));
+  auto waiting = std::async(std::launch::async, [&] { return upload(file, fd.get()); });
+  EXPECT_EQ(waiting.wait_for(std::chrono::milliseconds(20)), std::future_status::timeout);
+  budget.close();
+  EXPECT_FALSE(waiting.get());
+  EXPECT_EQ(log.count("<3>UploadBackend(uploadFileAtPath): The daemon is ending."), 1U);
 }
 
 }  // namespace
