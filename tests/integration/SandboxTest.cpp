@@ -45,6 +45,7 @@ TEST_F(SandboxTest, OnEveryThreadForbiddenActsFailAndAreLoggedOnce) {
     EXPECT_EQ(daemon->stateFile("acts.log"), expected);
     EXPECT_TRUE(daemon->logged("<4>sandbox: Refused system call inotify_init1"));
     EXPECT_EQ(daemon->count("inotify_init1"), 1U);
+#if !defined(__SANITIZE_THREAD__)  // whose own thread is there before the sandbox
     // Whatever thread there is, is filtered.
     for (const auto& task : fs::directory_iterator("/proc/" + std::to_string(daemon->process().pid()) + "/task")) {
       std::stringstream status;
@@ -52,6 +53,7 @@ TEST_F(SandboxTest, OnEveryThreadForbiddenActsFailAndAreLoggedOnce) {
       EXPECT_NE(status.str().find("\nSeccomp:\t2\n"), std::string::npos) << status.str();
       EXPECT_NE(status.str().find("\nNoNewPrivs:\t1\n"), std::string::npos) << status.str();
     }
+#endif
     session.reset();
     EXPECT_EQ(daemon->terminate(), 0);
   }
