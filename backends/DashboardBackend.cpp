@@ -223,6 +223,7 @@ std::optional<std::string> DashboardBackend::sendMessage(const SharedDictionary&
 }
 
 bool DashboardBackend::uploadLogData(const SharedArray& logData) {
+  const platform::BlockingScope blocking;  // archives can be large
   if (!_postURL) {
     ORVANTA_LOG(error, "DashboardBackend(uploadLogData): Post URL for log data array is nil");
     return false;
@@ -238,7 +239,7 @@ bool DashboardBackend::uploadLogData(const SharedArray& logData) {
   request.url = *_postURL;
   request.headers = {{"Content-Type", "application/octet-stream"}};
   request.body.assign(archived->begin(), archived->end());
-  // One request at a time, for which the caller waits: there is nothing to limit.
+  // One request at a time, for which the caller waits; a frame's size bounds it.
   const auto lane = platform().http().makeLane(platform::HttpClient::LaneKind::unrefused);
   platform::HttpResult result = platform().http().perform(lane, std::move(request));
   if (!result.response || result.response->body.empty() || !platform::isValidUtf8(result.response->body)) {

@@ -15,6 +15,8 @@ namespace orvanta {
 namespace {
 
 constexpr std::int32_t kLocalFailure = -1;
+// More than that is milliseconds of work to put into a message.
+constexpr std::size_t kLargeBatch = 512U << 10U;
 
 bool isRealtime(std::int32_t flag) {
   return flag == 1 || flag == 3;
@@ -202,6 +204,8 @@ std::optional<std::string> HTTPSPostBackend::sendDirectly(const EventRecord& rec
 
 std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCompletion completion) {
   if (hasBatched()) {
+    std::optional<platform::BlockingScope> large;
+    if (batchedBytes() > kLargeBatch) large.emplace();
     if (state() == kBackendEnabled) return flushEnabled(std::move(completion));
     EventBatch::Events dropped;
     const std::lock_guard lock(mutex());
@@ -289,6 +293,11 @@ bool HTTPSPostBackend::showsMessages() const {
 bool HTTPSPostBackend::hasBatched() const {
   const std::lock_guard lock(mutex());
   return _batchedEvents.exists();
+}
+
+std::size_t HTTPSPostBackend::batchedBytes() const {
+  const std::lock_guard lock(mutex());
+  return _batchedEvents.footprint();
 }
 
 void HTTPSPostBackend::setCorrelatedSessionID(std::optional<std::string> combined) {

@@ -76,6 +76,7 @@ class HTTPSPostBackend final : public OrvantaBackend {
   PostMessage buildMessage(std::span<const OutgoingEvent> events) const;
   bool showsMessages() const;
   bool hasBatched() const;
+  std::size_t batchedBytes() const;
 
   // HTTPSPostRequest.cpp
   struct EventMap {

@@ -17,44 +17,7 @@ bool isServerError(int status) {
   return status >= 500 && status <= 599;
 }
 
-// Counts a post from the hand-in until it is with the HTTP client, also when the pool drops the job. Owns its share of
-// the count, since a pool that is destroyed drops its jobs after the platform's own values have gone.
-class PendingPost {
- public:
-  explicit PendingPost(std::shared_ptr<PendingPosts> posts) : _posts(std::move(posts)) { _posts->begin(); }
-  PendingPost(PendingPost&& other) noexcept = default;
-  PendingPost& operator=(PendingPost&&) = delete;
-  ~PendingPost() {
-    if (_posts != nullptr) _posts->end();
-  }
-
- private:
-  std::shared_ptr<PendingPosts> _posts;  // null once moved from
-};
-
 }  // namespace
-
-std::shared_ptr<PendingPosts> PendingPosts::of(platform::Platform& platform) {
-  struct Holder {
-    std::shared_ptr<PendingPosts> posts;
-  };
-  return platform.once<Holder>([] { return Holder{std::make_shared<PendingPosts>()}; }).posts;
-}
-
-void PendingPosts::begin() {
-  const std::lock_guard lock(_mutex);
-  ++_count;
-}
-
-void PendingPosts::end() {
-  const std::lock_guard lock(_mutex);
-  if (--_count == 0) _changed.notify_all();
-}
-
-bool PendingPosts::waitUntilHandedIn(std::chrono::milliseconds patience) {
-  std::unique_lock lock(_mutex);
-  return _changed.wait_for(lock, patience, [&] { return _count == 0; });
-}
 
 // What is done when the post has ended. Shared by the two callbacks of the request; if both are dropped uncalled, the
 // completion hears of that.
@@ -113,53 +76,23 @@ PostQueue::PostQueue(platform::Platform& platform, std::weak_ptr<OrvantaBackend>
       _queue(platform.pool().makeComputeQueue()),
       _lane(_http.makeLane()) {}
 
-// A post's share of what may wait, from the hand-in to its compression or until the pool drops it.
-class PostQueue::Room {
- public:
-  Room(PostQueue& queue, std::size_t bytes) : _queue(queue.shared_from_this()), _bytes(bytes) {
-    if (takeIfFree()) return;
-    const platform::BlockingScope blocking;
-    std::unique_lock lock(_queue->_mutex);
-    _queue->_roomMade.wait(lock, [this] { return isFree(); });
-    _queue->_waitingBytes += _bytes;
-  }
-  Room(Room&& other) noexcept = default;
-  Room& operator=(Room&&) = delete;
-  ~Room() {
-    if (_queue == nullptr) return;
-    const std::lock_guard lock(_queue->_mutex);
-    _queue->_waitingBytes -= _bytes;
-    _queue->_roomMade.notify_all();
-  }
-
- private:
-  bool takeIfFree() {
-    const std::lock_guard lock(_queue->_mutex);
-    if (!isFree()) return false;
-    _queue->_waitingBytes += _bytes;
-    return true;
-  }
-  bool isFree() const { return _queue->_waitingBytes == 0 || _queue->_waitingBytes + _bytes <= kMaximumWaitingBytes; }
-
-  std::shared_ptr<PostQueue> _queue;  // null once moved from
-  const std::size_t _bytes;
-};
-
 // A post that waits to be compressed.
 struct PostQueue::Job {
   std::shared_ptr<PostQueue> queue;
-  std::optional<Room> room;
   Post post;
   std::shared_ptr<Outcome> outcome;
-  PendingPost pending;
+  // Also until the pool drops the job, which it may do after the platform's own values have gone.
+  std::unique_ptr<PendingPosts::Place> place;
 };
 
 void PostQueue::post(Post post) {
   auto outcome = std::make_shared<Outcome>(_backend, _backendName, std::move(post.completion));
-  PendingPost pending(_pendingPosts);
-  Room room(*this, post.json.size());
-  auto job = std::make_unique<Job>(
-      Job{shared_from_this(), std::move(room), std::move(post), std::move(outcome), std::move(pending)});
+  auto place = PendingPosts::Place::take(_pendingPosts, _share, post.json.size());
+  if (!place) {
+    outcome->finish({std::nullopt, "too much waits to be posted already"});
+    return;
+  }
+  auto job = std::make_unique<Job>(Job{shared_from_this(), std::move(post), std::move(outcome), std::move(place)});
   _queue->post([job = std::move(job)] { job->queue->compressAndStart(*job); });
 }
 
@@ -176,7 +109,7 @@ void PostQueue::compressAndStart(Job& job) {
   request.headers.push_back({"Content-Length", std::to_string(request.body.size())});
   if (smaller) request.headers.push_back({"Content-Encoding", "gzip"});
   std::string().swap(job.post.json);
-  job.room.reset();
+  job.place->giveRoomBack();
   _http.start(
       _lane, std::move(request),
       [outcome = job.outcome](const platform::HttpResult& result) { return outcome->observe(result); },

@@ -1,37 +1,16 @@
 #pragma once
 
-#include <chrono>
-#include <condition_variable>
-#include <cstddef>
-#include <cstdint>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <vector>
 
 #include "backends/OrvantaBackend.h"
+#include "backends/PendingPosts.h"
 #include "platform/HttpClient.h"
 #include "platform/WorkQueue.h"
 
 namespace orvanta {
-
-// How many posts of all backends have not reached the HTTP client yet. One per platform. Thread-safe.
-class PendingPosts {
- public:
-  static std::shared_ptr<PendingPosts> of(platform::Platform& platform);
-
-  void begin();
-  void end();
-  // Waits until none is left, at most `patience`; whether none is left. Before the HTTP client is shut down, which lets
-  // only those requests end that were handed in.
-  bool waitUntilHandedIn(std::chrono::milliseconds patience);
-
- private:
-  std::mutex _mutex;
-  std::condition_variable _changed;
-  std::size_t _count = 0;  // guarded by _mutex
-};
 
 // Called exactly once with what came of the post: an error or none. Any thread, none of our locks held.
 using PostCompletion = platform::UniqueFunction<void(std::optional<OrvantaError>)>;
@@ -48,9 +27,7 @@ struct Post {
 // since compressing takes most of what an event costs.
 //
 // Owned by its backend and by the posts on their way, which do not need the backend: it is held weakly, to be disabled
-// when the server answers 5xx. At most 16 MiB wait to be compressed: a caller with more waits in a BlockingScope until
-// there is room, so that a program that reports faster than this device compresses is slowed down and loses nothing. A
-// message of any size may wait alone.
+// when the server answers 5xx. A post for which PendingPosts has no room fails like one that the network lost.
 class PostQueue : public std::enable_shared_from_this<PostQueue> {
  public:
   PostQueue(platform::Platform& platform, std::weak_ptr<OrvantaBackend> backend, std::string backendName);
@@ -58,11 +35,8 @@ class PostQueue : public std::enable_shared_from_this<PostQueue> {
   // Any thread, without locks: it may wait, and the completion may run at once.
   void post(Post post);
 
-  static constexpr std::size_t kMaximumWaitingBytes = 16U << 20U;
-
  private:
   class Outcome;
-  class Room;
   struct Job;
   void compressAndStart(Job& job);
 
@@ -73,10 +47,7 @@ class PostQueue : public std::enable_shared_from_this<PostQueue> {
   const std::string _backendName;
   const std::shared_ptr<platform::ComputeQueue> _queue;
   const std::shared_ptr<platform::HttpLane> _lane;
-
-  std::mutex _mutex;
-  std::condition_variable _roomMade;
-  std::size_t _waitingBytes = 0;  // guarded by _mutex
+  const std::shared_ptr<PendingPosts::QueueShare> _share = std::make_shared<PendingPosts::QueueShare>();
 };
 
 }  // namespace orvanta

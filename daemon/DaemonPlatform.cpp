@@ -5,6 +5,7 @@
 #include <filesystem>
 #include <string_view>
 
+#include "backends/PendingPosts.h"
 #include "backends/UploadBudget.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
@@ -74,6 +75,7 @@ std::unique_ptr<platform::Sandbox> enterDaemonSandbox(const platform::FileLocati
 void endWaiting(platform::Platform& platform) {
   platform.http().abortBlockingRequests();
   UploadBudget::of(platform).close();
+  PendingPosts::of(platform)->stopWaiting();
 }
 
 void finishDeliveries(platform::Platform& platform) {

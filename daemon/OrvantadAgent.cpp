@@ -12,7 +12,9 @@ namespace orvanta {
 
 namespace {
 constexpr std::chrono::seconds kBetweenReleases{10};
-}
+// Above that, what a change does to those below it takes milliseconds.
+constexpr std::size_t kLargeGroup = 64;
+}  // namespace
 
 OrvantadAgent::OrvantadAgent(platform::Platform& platform)
     : OrvantadAgent(platform, [&platform](std::int32_t clientType, StorebagFetch& fetch) {
@@ -170,7 +172,10 @@ void OrvantadAgent::updateDownstreamSessions(OrvantadSession& session) {
     session.shutdownSessionAggregation();
     aggregatedAbove = true;
   }
-  for (const auto& deeper : _registry.downstreamOf(session)) {
+  const auto downstream = _registry.downstreamOf(session);
+  std::optional<platform::BlockingScope> large;
+  if (downstream.size() > kLargeGroup) large.emplace();
+  for (const auto& deeper : downstream) {
     ORVANTA_LOG(debug,
                 "updateDownstreamSessions: Updating combined session ID and syncing reporting states for session {}",
                 deeper->sessionID());

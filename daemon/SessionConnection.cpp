@@ -29,6 +29,7 @@ void SessionConnection::received(platform::Frame&& frame) {
   const bool carriesDescriptor =
       frame.method == "uploadFileAtPath" && frame.params.size() > 1 && !frame.params[1].isNull();
   if (!dispatchCall(std::move(frame), *_session, _connection->outbox()) && carriesDescriptor) {
+    const platform::BlockingScope blocking;  // whatever it is: closing it may take a while
     _connection->takeDescriptor();
   }
 }

@@ -16,10 +16,15 @@ void ComputeThreads::start() {
   {
     const std::lock_guard lock(_mutex);
     _started = true;
-    _running = !_line.empty();
-    if (!_running) return;
+    if (_line.empty()) return;
   }
-  _threads.start();
+  serve();
+}
+
+void ComputeThreads::serve() {
+  if (_threads.start()) return;
+  while (runOne(std::chrono::milliseconds(0))) {
+  }
 }
 
 void ComputeThreads::stop() {
@@ -38,7 +43,6 @@ void ComputeThreads::stop() {
 }
 
 void ComputeThreads::post(ComputeQueue& queue, Job job) {
-  bool startThreads = false;
   {
     const std::lock_guard lock(_mutex);
     if (_stopped) return;  // the parameter goes after the lock
@@ -48,9 +52,9 @@ void ComputeThreads::post(ComputeQueue& queue, Job job) {
       _line.push_back(queue.shared_from_this());
       _changed.notify_one();
     }
-    startThreads = _started && !std::exchange(_running, _started);
+    if (!_started) return;
   }
-  if (startThreads) _threads.start();
+  serve();
 }
 
 void ComputeThreads::runUntilStopped() {

@@ -58,6 +58,8 @@ class ComputeThreads final : PoolThreads::Loop {
   void post(ComputeQueue& queue, Job job);
   void runUntilStopped() override;
   bool runOne(std::chrono::milliseconds patience) override;
+  // Starts the threads unless they run. When the system has none to give, the caller's does the work.
+  void serve();
   void serveFirst(std::unique_lock<std::mutex>& lock);
 
   JobCount& _count;
@@ -67,7 +69,6 @@ class ComputeThreads final : PoolThreads::Loop {
   // Guarded by _mutex.
   std::deque<std::shared_ptr<ComputeQueue>> _line;  // with jobs and not being served, the longest waiting first
   bool _started = false;
-  bool _running = false;  // the threads have been started
   bool _stopped = false;
 
   PoolThreads _threads;

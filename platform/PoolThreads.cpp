@@ -41,16 +41,16 @@ PoolThreads* PoolThreads::current() {
   return tCurrent;
 }
 
-void PoolThreads::start() {
+bool PoolThreads::start() {
   const std::lock_guard lock(_mutex);
-  if (_started || _closed) return;
-  _started = true;
-  for (std::size_t i = 0; i < _wanted; ++i) launch(false);
+  if (_started || _closed) return true;
+  for (std::size_t i = 0; i < _wanted && launch(false); ++i) _started = true;
+  return _started;
 }
 
-void PoolThreads::launch(bool extra) {
+bool PoolThreads::launch(bool extra) {
   const AllSignalsBlocked blocked;
-  _threads.emplace_back([this, extra] {
+  const auto run = [this, extra] {
     ::pthread_setname_np(::pthread_self(), _name);
     tCurrent = this;
     if (extra) {
@@ -58,8 +58,16 @@ void PoolThreads::launch(bool extra) {
     } else {
       _loop.runUntilStopped();
     }
-  });
+  };
+  try {
+    _threads.emplace_back(run);
+  } catch (const std::system_error& error) {
+    PLATFORM_LOG(warning, "WorkPool: No thread can be started beside {}, {} of them blocked: {}", _running, _blocked,
+                 error.what());
+    return false;
+  }
   ++_running;
+  return true;
 }
 
 void PoolThreads::serveAsExtra() {
@@ -130,11 +138,7 @@ void PoolThreads::blockingBegins() {
     _needed.notify_one();
     return;
   }
-  try {
-    launch(true);
-  } catch (const std::system_error& error) {
-    PLATFORM_LOG(warning, "WorkPool: No thread can be started beside {} blocked ones: {}", _blocked, error.what());
-  }
+  launch(true);
 }
 
 void PoolThreads::blockingEnds() {

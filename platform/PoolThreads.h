@@ -33,7 +33,8 @@ class PoolThreads {
   PoolThreads& operator=(const PoolThreads&) = delete;
   ~PoolThreads() = default;  // after join()
 
-  void start();
+  // False when not one thread can be started; it may be tried again.
+  bool start();
   // From now on no thread starts. The loop is to be stopped between this and join().
   void closeDown();
   void join();
@@ -48,7 +49,7 @@ class PoolThreads {
   static PoolThreads* current();
 
  private:
-  void launch(bool extra);   // with _mutex held
+  bool launch(bool extra);   // with _mutex held; whether the system had a thread to give
   bool superfluous() const;  // with _mutex held
   void serveAsExtra();
   // Whether the calling extra thread has to go on; returns when it is needed, or is to end.

@@ -13,8 +13,11 @@ namespace {
 constexpr std::size_t kReadSize = 64U << 10U;
 // A frame that arrives over many reads must not hold a thread for all of them.
 constexpr int kReadsPerTurn = 16;
+// Nor must calls that take long one by one. Asked at every so many.
+constexpr std::chrono::milliseconds kTurn{2};
+constexpr int kFramesBetweenLooks = 8;
 // With so much to carry out the thread is away for milliseconds.
-constexpr std::size_t kLargeFrame = 256U << 10U;
+constexpr std::size_t kLargeFrame = 32U << 10U;
 // A peer that broke the protocol still gets the replies to what came before.
 constexpr std::chrono::milliseconds kDrainAfterProtocolError{1000};
 
@@ -118,8 +121,9 @@ void SocketConnection::takeTurn() {
 
 SocketConnection::Pause SocketConnection::carryOut() {
   int frames = 0;
+  const auto end = std::chrono::steady_clock::now() + kTurn;
   for (int reads = 0; reads < kReadsPerTurn; ++reads) {
-    if (const auto pause = carryOutFrames(frames)) return *pause;
+    if (const auto pause = carryOutFrames(frames, end)) return *pause;
     if (_protocolError) return Pause::protocolError;
     if (_endOfInput) return Pause::endOfInput;
     if (std::exchange(_socketEmpty, false)) return Pause::readable;
@@ -129,9 +133,12 @@ SocketConnection::Pause SocketConnection::carryOut() {
 }
 
 // Until no whole frame is left, or something stands in the way.
-std::optional<SocketConnection::Pause> SocketConnection::carryOutFrames(int& carriedOut) {
+std::optional<SocketConnection::Pause> SocketConnection::carryOutFrames(int& carriedOut,
+                                                                        std::chrono::steady_clock::time_point end) {
   for (;;) {
     if (carriedOut == kFramesPerTurn) return Pause::turnUsedUp;
+    const bool look = carriedOut > 0 && carriedOut % kFramesBetweenLooks == 0;
+    if (look && std::chrono::steady_clock::now() >= end) return Pause::turnUsedUp;
     if (_outbox->pending() > _limits.maximumUnreadReplies) return Pause::repliesUnread;
     std::optional<BlockingScope> large;
     if (_decoder.pending() > kLargeFrame) large.emplace();
@@ -245,6 +252,8 @@ void SocketConnection::end() {
   _drainTimer.reset();
   if (const auto delegate = std::move(_delegate)) delegate->invalidated(_protocolError);
   _outbox->close();
+  // Closing what a peer passed, or left unread in the socket, takes as long as the peer likes.
+  const BlockingScope blocking;
   _descriptors.clear();
   _decoder = FrameDecoder(_limits.frame);
   _socket.reset();

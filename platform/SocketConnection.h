@@ -53,7 +53,7 @@ class SocketConnection final : public Connection, public SocketOutbox::Observer 
   void begin(std::shared_ptr<ConnectionDelegate> delegate);
   void takeTurn();
   Pause carryOut();
-  std::optional<Pause> carryOutFrames(int& carriedOut);
+  std::optional<Pause> carryOutFrames(int& carriedOut, std::chrono::steady_clock::time_point end);
   void readOnce();
   void eased();
   void inputEnded();

@@ -14,6 +14,7 @@
 #include "platform/Log.h"
 #include "platform/PropertyList.h"
 #include "platform/UniqueFd.h"
+#include "platform/WorkQueue.h"
 
 namespace platform {
 
@@ -62,15 +63,23 @@ class UserDefaults::DirectoryLock {
 UserDefaults::UserDefaults(std::string directory, std::string domain)
     : _directory(std::move(directory)), _fileName(std::move(domain) + ".plist"), _path(_directory + "/" + _fileName) {}
 
+std::unique_lock<std::mutex> UserDefaults::guard() {
+  std::unique_lock lock(_mutex, std::try_to_lock);
+  if (lock.owns_lock()) return lock;
+  const BlockingScope blocking;
+  lock.lock();
+  return lock;
+}
+
 std::optional<Value> UserDefaults::value(std::string_view key) {
-  const std::lock_guard guard(_mutex);
+  const auto locked = guard();
   const Value* found = current().find(key);
   if (found == nullptr) return std::nullopt;
   return *found;
 }
 
 std::optional<std::string> UserDefaults::text(std::string_view key) {
-  const std::lock_guard guard(_mutex);
+  const auto locked = guard();
   const Value* found = current().find(key);
   if (found == nullptr) return std::nullopt;
   if (const std::string* text = found->string()) return *text;
@@ -78,12 +87,13 @@ std::optional<std::string> UserDefaults::text(std::string_view key) {
 }
 
 Dictionary UserDefaults::all() {
-  const std::lock_guard guard(_mutex);
+  const auto locked = guard();
   return current();
 }
 
 Result<bool> UserDefaults::set(std::string_view key, Value value) {
-  const std::lock_guard guard(_mutex);
+  const BlockingScope blocking;
+  const auto locked = guard();
   const auto lock = DirectoryLock::take(_directory);
   if (!lock) return Failure{lock.error()};
   if (auto loaded = load(&*lock); !loaded) return loaded;
@@ -91,7 +101,8 @@ Result<bool> UserDefaults::set(std::string_view key, Value value) {
 }
 
 Value UserDefaults::storeIfAbsent(std::string_view key, Value fresh) {
-  const std::lock_guard guard(_mutex);
+  const BlockingScope blocking;
+  const auto locked = guard();
   std::string problem;
   if (const auto lock = DirectoryLock::take(_directory); !lock) {
     problem = lock.error();
@@ -128,6 +139,7 @@ Result<bool> UserDefaults::load(const DirectoryLock* lock) {
       const std::string why = parsed ? "it is not a dictionary" : parsed.error();
       if (lock != nullptr) return keepAside(content->stamp, why);
       // Moving it is a change as well: under the lock, after looking again, since a writer may have repaired it.
+      const BlockingScope blocking;
       const auto taken = DirectoryLock::take(_directory);
       return taken ? load(&*taken) : leaveInPlace(content->stamp, why, taken.error());
     }

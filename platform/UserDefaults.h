@@ -42,6 +42,8 @@ class UserDefaults {
  private:
   class DirectoryLock;
 
+  // Waits in a BlockingScope: who has the lock may be waiting for a disk or another process.
+  std::unique_lock<std::mutex> guard();
   Value storeIfAbsent(std::string_view key, Value fresh);
   // These are called under _mutex.
   const Dictionary& current();

@@ -9,6 +9,7 @@
 #include <asio/strand.hpp>
 #include <cstdint>
 #include <mutex>
+#include <stdexcept>
 #include <utility>
 
 #include "platform/JobCount.h"
@@ -179,7 +180,7 @@ WorkPool::~WorkPool() {
 }
 
 void WorkPool::start() {
-  _implementation->threads.start();
+  if (!_implementation->threads.start()) throw std::runtime_error("the pool has no thread");
   _implementation->compute->start();
 }
 

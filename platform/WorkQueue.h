@@ -27,7 +27,8 @@ class WorkPool {
   WorkPool& operator=(const WorkPool&) = delete;
   ~WorkPool();  // stops and joins; jobs not yet begun are destroyed uncalled
 
-  // Threads start here, not in the constructor, so that a process can enter its sandbox while it has only one.
+  // Throws std::runtime_error when the system has no thread to give. Threads start here, not in the constructor, so
+  // that a process can enter its sandbox while it has only one.
   void start();
   // Lets running jobs end, joins every thread. Must not be called from a job. Idempotent.
   void stop();

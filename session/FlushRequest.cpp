@@ -32,10 +32,13 @@ void FlushRequest::finished(const std::string& key, const std::string& backendNa
   ORVANTA_LOG(debug, "internalFlushMessagesWithCompletion: {}", backendName);
   if (result) writeToLogFile(_platform, fmt::format("[{} -> flushMessages] {}", key, *result));
 
-  const std::lock_guard lock(*_lock);
-  --_pending;
-  if (!_completion || (!error && _pending > 0)) return;
-  auto completion = std::move(_completion);
+  FlushReply completion;
+  {
+    const std::lock_guard lock(*_lock);
+    --_pending;
+    if (!_completion || (!error && _pending > 0)) return;
+    completion = std::move(_completion);
+  }
   completion(std::move(result), std::move(error));
 }
 

@@ -11,6 +11,7 @@ namespace orvanta {
 
 void OrvantadSession::uploadFileAtPath(std::string fileURL, std::optional<std::string> extensionToken,
                                        UploadReply completion) {
+  const platform::BlockingScope blocking;  // a descriptor may take long to be looked at, and even to be closed
   ORVANTA_LOG(debug, "uploadFileAtPath: Uploading file for session {}", _sessionID);
   OrvantaBackend::UploadFile file;
   file.path = pathOfFileURL(fileURL).value_or(fileURL);

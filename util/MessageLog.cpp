@@ -18,6 +18,8 @@ namespace {
 using Entry = MessageLogDirectory::Entry;
 
 constexpr double kMaximumAgeSeconds = 86400;
+// The text of a large flush, which takes milliseconds to write.
+constexpr std::size_t kLargeMessage = 256U << 10U;
 
 std::string describeCreation(const MessageLogDirectory::CreationDate& created) {
   return created ? platform::describeDate(*created) : "(null)";
@@ -73,6 +75,8 @@ bool appendLine(const platform::UniqueFd& file, double now, std::string_view mes
 }  // namespace
 
 void writeToLogFile(platform::Platform& platform, std::string_view message) {
+  std::optional<platform::BlockingScope> large;
+  if (message.size() > kLargeMessage) large.emplace();
   const double now = platform.clock().wallSeconds();
   MessageLogDirectory directory(platform.files().stateDirectory + "/Logs/Faultline/Retired");
   auto chosen = chooseFile(directory, listOrCreate(directory), now);

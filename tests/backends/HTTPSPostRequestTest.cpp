@@ -3,6 +3,7 @@
 #include <future>
 
 #include "tests/backends/HTTPSFixture.h"
+#include "tests/platform/Waiting.h"
 
 namespace orvanta::test {
 namespace {
@@ -188,6 +189,35 @@ TEST_F(HTTPSPostRequestTest, ADroppedPostIsReported) {
   EXPECT_TRUE(pending.answer->error);
 }
 
+TEST(PendingPostsTest, AllQueuesShareTheRoomAndFewMayWaitForIt) {
+  using Place = PendingPosts::Place;
+  const auto posts = std::make_shared<PendingPosts>();
+  std::vector<std::shared_ptr<PendingPosts::QueueShare>> queues;
+  std::vector<std::unique_ptr<Place>> places;
+  for (int i = 0; i < 5; ++i) {
+    queues.push_back(std::make_shared<PendingPosts::QueueShare>());
+    places.push_back(Place::take(posts, queues.back(), PendingPosts::kMaximumQueueBytes - 1));
+    ASSERT_NE(places.back(), nullptr) << "a queue's only post";
+  }
+  std::atomic<int> refused = 0, admitted = 0;
+  std::vector<std::future<std::unique_ptr<Place>>> waiting;
+  for (std::size_t i = 0; i <= PendingPosts::kMaximumWaiters; ++i) {
+    waiting.push_back(std::async(std::launch::async, [&, i] {
+      auto place = Place::take(posts, queues[i % queues.size()], 1);
+      ++(place ? admitted : refused);
+      return place;
+    }));
+  }
+  ASSERT_TRUE(eventually([&] { return refused == 1; }));
+  // With the first queue's place there is room in all again.
+  places[0]->giveRoomBack();
+  ASSERT_TRUE(eventually([&] { return admitted > 0; }));
+  posts->stopWaiting();
+  for (auto& each : waiting) each.get();
+  EXPECT_EQ(refused, 1);
+  EXPECT_EQ(admitted, static_cast<int>(PendingPosts::kMaximumWaiters));
+}
+
 TEST_F(HTTPSPostRequestTest, WhoHasMoreThanMayWaitWaitsForRoomAndLosesNothing) {
   std::promise<void> release;
   const std::shared_future<void> released = release.get_future().share();
@@ -196,7 +226,7 @@ TEST_F(HTTPSPostRequestTest, WhoHasMoreThanMayWaitWaitsForRoomAndLosesNothing) {
   const auto backend = makeBackend(batching());
   Pending first, second;
   // A message of any size may wait alone; then there is room for none.
-  send(*backend, 1, 0, shared({{"filler", std::string(PostQueue::kMaximumWaitingBytes + 1, 'x')}}));
+  send(*backend, 1, 0, shared({{"filler", std::string(PendingPosts::kMaximumQueueBytes + 1, 'x')}}));
   backend->flushMessagesWithCompletion(first.completion());
   auto sender = std::async(std::launch::async, [&] {
     send(*backend, 1);

@@ -31,7 +31,7 @@ class RelatedSessionsTest : public IntegrationFixture {
     program.write(std::to_string(number) + "\n");
     EXPECT_TRUE(program.waitForLine("sent " + std::to_string(number))) << program.allLines();
   }
-  static std::vector<std::string> receivedBy(const ChildProcess& program) {
+  static std::vector<std::string> receivedBy(ChildProcess& program) {
     auto lines = program.lines();
     std::erase_if(lines, [](const std::string& line) { return line.find("received 20/") != 0; });
     return lines;

@@ -1,6 +1,7 @@
 #include "tests/support/ChildProcess.h"
 
 #include <fcntl.h>
+#include <poll.h>
 #include <signal.h>
 #include <spawn.h>
 #include <sys/wait.h>
@@ -89,29 +90,34 @@ ChildProcess::~ChildProcess() {
 }
 
 void ChildProcess::read(int fd, bool isError) {
-  std::string partial;
-  char buffer[65536];
+  pollfd ready{fd, POLLIN, 0};
   for (;;) {
-    const ssize_t length = ::read(fd, buffer, sizeof buffer);
-    if (length < 0 && errno == EINTR) continue;
-    if (length <= 0) break;
+    ::poll(&ready, 1, -1);
     const std::lock_guard lock(_mutex);
-    if (!isError) {
-      _outputText.append(buffer, static_cast<std::size_t>(length));
-      continue;
-    }
-    partial.append(buffer, static_cast<std::size_t>(length));
-    for (std::size_t end; (end = partial.find('\n')) != std::string::npos; partial.erase(0, end + 1)) {
-      _lines.push_back(partial.substr(0, end));
-    }
-    _changed.notify_all();
+    if (!readWhatIsThere(fd, isError)) break;
   }
   const std::lock_guard lock(_mutex);
   if (isError) {
-    if (!partial.empty()) _lines.push_back(partial);
+    if (!_partialLine.empty()) _lines.push_back(_partialLine);
     _errorEnded = true;
     _changed.notify_all();
   }
+}
+
+bool ChildProcess::readWhatIsThere(int fd, bool isError) {
+  char buffer[65536];
+  for (pollfd ready{fd, POLLIN, 0}; ::poll(&ready, 1, 0) > 0;) {
+    const ssize_t length = ::read(fd, buffer, sizeof buffer);
+    if (length < 0 && errno == EINTR) continue;
+    if (length <= 0) return false;
+    (isError ? _partialLine : _outputText).append(buffer, static_cast<std::size_t>(length));
+  }
+  if (!isError) return true;
+  for (std::size_t end; (end = _partialLine.find('\n')) != std::string::npos; _partialLine.erase(0, end + 1)) {
+    _lines.push_back(_partialLine.substr(0, end));
+  }
+  _changed.notify_all();
+  return true;
 }
 
 bool ChildProcess::waitForLine(const std::string& text, std::size_t wanted) {
@@ -127,18 +133,20 @@ bool ChildProcess::waitForLine(const std::string& text, std::size_t wanted) {
   return enough();
 }
 
-std::vector<std::string> ChildProcess::lines() const {
+std::vector<std::string> ChildProcess::lines() {
   const std::lock_guard lock(_mutex);
+  if (!_errorEnded) readWhatIsThere(_error.get(), true);
   return _lines;
 }
 
-std::size_t ChildProcess::count(const std::string& text) const {
+std::size_t ChildProcess::count(const std::string& text) {
   const std::lock_guard lock(_mutex);
+  if (!_errorEnded) readWhatIsThere(_error.get(), true);
   return static_cast<std::size_t>(std::count_if(
       _lines.begin(), _lines.end(), [&](const auto& line) { return line.find(text) != std::string::npos; }));
 }
 
-std::string ChildProcess::allLines() const {
+std::string ChildProcess::allLines() {
   std::string all;
   for (const auto& line : lines()) all += line + "\n";
   return all;

@@ -39,9 +39,10 @@ class ChildProcess {
   // Whether a line that holds `text` has come, now or within the patience; false at once when the program ended without
   // it.
   bool waitForLine(const std::string& text, std::size_t count = 1);
-  std::vector<std::string> lines() const;
-  std::size_t count(const std::string& text) const;
-  std::string allLines() const;
+  // These hold everything that the program had written when they were called.
+  std::vector<std::string> lines();
+  std::size_t count(const std::string& text);
+  std::string allLines();
   std::string output();  // after the program has ended
   // With holdInput, while the program runs.
   void write(const std::string& input);
@@ -53,6 +54,7 @@ class ChildProcess {
 
  private:
   void read(int fd, bool isError);
+  bool readWhatIsThere(int fd, bool isError);  // with _mutex held; false at the end
 
   pid_t _pid = -1;
   std::optional<int> _status;
@@ -61,6 +63,7 @@ class ChildProcess {
   mutable std::mutex _mutex;
   std::condition_variable _changed;
   std::vector<std::string> _lines;  // guarded by _mutex
+  std::string _partialLine;         // guarded by _mutex
   std::string _outputText;          // guarded by _mutex
   bool _errorEnded = false;         // guarded by _mutex
 };

@@ -45,7 +45,7 @@ class DaemonProcess {
   ChildProcess& process() { return *_process; }
   // Shorthands on the log.
   bool logged(const std::string& text, std::size_t count = 1) { return _process->waitForLine(text, count); }
-  std::size_t count(const std::string& text) const { return _process->count(text); }
+  std::size_t count(const std::string& text) { return _process->count(text); }
 
   std::string runtimeDirectory() const { return _directory / "run"; }
   std::string stateDirectory() const { return _directory / "state"; }
