@@ -53,6 +53,7 @@ TEST_F(HttpLaneTest, ALaneKeepsItsOrderToTheLastCompletion) {
     auto& lane = lanes[path[1]];
     if (!lane) lane = client().makeLane();
     client().start(lane, post(server.url(path)), {}, [&, path](HttpResult) {
+      if (path == "/0/0") server.waitForRequests(kLanes * kRequests);  // none of its lane overtakes it meanwhile
       const std::lock_guard lock(mutex);
       completed[path[1]].push_back(path);
       if (--left == 0) done.set_value();
@@ -150,12 +151,12 @@ TEST_F(HttpLaneTest, LimitsOnWaitingBytes) {
   const auto other = client().makeLane();
   const auto free = client().makeLane(HttpClient::LaneKind::unrefused);
   std::vector<std::future<HttpResult>> accepted;
+  for (int i = 0; i < 5; ++i) accepted.push_back(start(free, post(server.url("/held/free"), body + body)));
   accepted.push_back(start(lane, post(server.url("/held"), body)));
   accepted.push_back(start(lane, post(server.url("/held"), body)));
   auto laneFull = start(lane, post(server.url("/refused"), ""));
   accepted.push_back(start(other, post(server.url("/held"), body)));
   auto allFull = start(other, post(server.url("/refused"), ""));
-  for (int i = 0; i < 5; ++i) accepted.push_back(start(free, post(server.url("/held/free"), body + body)));
   EXPECT_EQ(await(laneFull).error, "Refused: 10000 bytes wait in this lane, 1024 more would exceed its limit of 10000");
   EXPECT_EQ(await(allFull).error, "Refused: 15000 bytes wait in all lanes, 1024 more would exceed the limit of 15000");
   gate.add();
