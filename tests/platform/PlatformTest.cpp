@@ -68,15 +68,19 @@ using Ends = std::vector<std::string>;
 
 class TellingHttpClient final : public HttpClient {
  public:
-  explicit TellingHttpClient(Ends& ends) : _ends(ends) {}
+  TellingHttpClient(WorkPool& pool, Ends& ends) : _pool(pool), _ends(ends) {}
   ~TellingHttpClient() override { _ends.emplace_back("client destroyed"); }
   std::shared_ptr<HttpLane> makeLane(LaneKind) override { return std::make_shared<HttpLane>(); }
   void start(const std::shared_ptr<HttpLane>&, HttpRequest, Observer, Completion) override {}
   HttpResult perform(const std::shared_ptr<HttpLane>&, HttpRequest) override { return {}; }
   void abortBlockingRequests() override {}
-  void shutdown(std::chrono::milliseconds) override { _ends.emplace_back("client shut down"); }
+  void shutdown(std::chrono::milliseconds) override {
+    EXPECT_EQ(_pool.threadCount(), 1U) << "nobody would run the last completions";
+    _ends.emplace_back("client shut down");
+  }
 
  private:
+  WorkPool& _pool;
   Ends& _ends;
 };
 
@@ -87,10 +91,16 @@ TEST(Platform, endsItsPartsInOrder) {
     Platform::Parts parts;
     parts.pool = std::make_unique<WorkPool>(1);
     parts.pool->start();
-    parts.http = std::make_unique<TellingHttpClient>(ends);
+    parts.http = std::make_unique<TellingHttpClient>(*parts.pool, ends);
     Platform platform(std::move(parts));
     using Telling = std::shared_ptr<void>;
-    platform.once<Telling>([&] { return Telling(nullptr, [&](void*) { ends.emplace_back("once-value destroyed"); }); });
+    platform.once<Telling>([&] {
+      return Telling(nullptr, [&](void*) {
+        EXPECT_EQ(platform.pool().threadCount(), 0U) << "a job may still use it";
+        ends.emplace_back("once-value destroyed");
+        platform.pool().post([last = Telling(nullptr, [&](void*) { ends.emplace_back("pool destroyed"); })] {});
+      });
+    });
     std::promise<void> ran;
     platform.pool().post([&] {
       ends.emplace_back("job");
@@ -98,7 +108,7 @@ TEST(Platform, endsItsPartsInOrder) {
     });
     ran.get_future().get();
   }
-  EXPECT_EQ(ends, (Ends{"job", "client shut down", "once-value destroyed", "client destroyed"}));
+  EXPECT_EQ(ends, (Ends{"job", "client shut down", "once-value destroyed", "client destroyed", "pool destroyed"}));
 }
 
 }  // namespace
