@@ -169,6 +169,10 @@ TEST_F(RemoteCallsTest, ADroppedReplyReachesTheCallerAsAnError) {
   session.fate = NotedSession::dropped;
   dispatch("fetchDisplayURL", {});
   EXPECT_EQ(answer().error, Value("the reply was dropped without being given"));
+  session.fate = NotedSession::kept;
+  dispatch("fetchDisplayURL", {});
+  dispatch("fetchDisplayURL", {});  // its reply takes the place of the one before
+  EXPECT_EQ(answer().error, Value("the reply was dropped without being given"));
 }
 
 TEST_F(RemoteCallsTest, RepliesOutliveTheirConnection) {
