@@ -112,13 +112,21 @@ std::optional<std::string> HTTPSFixture::send(OrvantaBackend& backend, std::uint
 
 FlushAnswer HTTPSFixture::flush(HTTPSPostBackend& backend) {
   auto answer = std::make_shared<FlushAnswer>();
-  backend.flushMessagesWithCompletion([answer](std::optional<std::string> text, std::optional<OrvantaError> error) {
+  backend.flushMessagesWithCompletion([&, answer](std::optional<std::string> text, std::optional<OrvantaError> error) {
+    backend.samplingThreshold();  // takes the backend's lock, which must not be held here
     ++answer->calls;
     answer->text = std::move(text);
     answer->error = std::move(error);
   });
   settle();
   return *answer;
+}
+
+std::promise<void> HTTPSFixture::holdCompressing() {
+  std::promise<void> release;
+  const std::shared_future<void> released = release.get_future().share();
+  for (int i = 0; i < 2; ++i) platform.get().pool().makeComputeQueue()->post([released] { released.wait(); });
+  return release;
 }
 
 void HTTPSFixture::settle() {

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <chrono>
+#include <future>
 #include <memory>
 #include <optional>
 #include <string>
@@ -76,6 +77,8 @@ class HTTPSFixture : public ::testing::Test {
                                   const SharedDictionary& payload = nullptr, std::uint16_t respCode = 1);
   // Flushes and, once every post has ended, gives what the completion got.
   FlushAnswer flush(HTTPSPostBackend& backend);
+  // Occupies every thread that compresses until the promise is kept.
+  std::promise<void> holdCompressing();
   // Waits until every post has been handed to the HTTP client (which answers at once unless it holds).
   void settle();
   std::vector<platform::HttpRequest> requests();

@@ -126,13 +126,15 @@ TEST_F(HTTPSPostBackendTest, RealtimeEventsForceAFlushFirst) {
 
 TEST_F(HTTPSPostBackendTest, OrderStaysThoughPostsAreCompressedElsewhere) {
   const auto backend = makeBackend(batching());
+  std::promise<void> release = holdCompressing();  // so that all wait for a thread
   Posts expected;
   for (std::uint16_t i = 0; i < 60; i += 2) {
-    send(*backend, i, 0, shared({{"filler", std::string(std::size_t{200} * (60U - i), 'x')}}));
+    send(*backend, i, 0, shared({{"filler", std::string(std::size_t{10'000} * (60U - i), 'x')}}));
     send(*backend, i + 1, 1);
     expected.push_back(std::to_string(i));
     expected.push_back(std::to_string(i + 1));
   }
+  release.set_value();
   EXPECT_EQ(categories(), expected);
 }
 

@@ -219,20 +219,21 @@ TEST(PendingPostsTest, AllQueuesShareTheRoomAndFewMayWaitForIt) {
 }
 
 TEST_F(HTTPSPostRequestTest, WhoHasMoreThanMayWaitWaitsForRoomAndLosesNothing) {
-  std::promise<void> release;
-  const std::shared_future<void> released = release.get_future().share();
-  // As many as the pool has threads to compress.
-  for (int i = 0; i < 2; ++i) platform.get().pool().makeComputeQueue()->post([released] { released.wait(); });
+  std::promise<void> release = holdCompressing();
   const auto backend = makeBackend(batching());
   Pending first, second;
   // A message of any size may wait alone; then there is room for none.
   send(*backend, 1, 0, shared({{"filler", std::string(PendingPosts::kMaximumQueueBytes + 1, 'x')}}));
   backend->flushMessagesWithCompletion(first.completion());
+  Counter waiting;
   auto sender = std::async(std::launch::async, [&] {
+    platform::BlockingScope::setBeforeBlocking({[](void* count) { static_cast<Counter*>(count)->add(); }, &waiting});
     send(*backend, 1);
     backend->flushMessagesWithCompletion(second.completion());
   });
-  EXPECT_EQ(sender.wait_for(std::chrono::milliseconds(50)), std::future_status::timeout);
+  ASSERT_TRUE(waiting.waitFor(1)) << "in a BlockingScope";
+  const auto other = std::async(std::launch::async, [&] { backend->setCorrelatedSessionID("root.own"); });
+  EXPECT_EQ(other.wait_for(kHangGuard), std::future_status::ready) << "it waits with the backend's lock held";
   EXPECT_FALSE(PendingPosts::of(platform)->waitUntilHandedIn(std::chrono::milliseconds(0)));
   release.set_value();
   sender.get();
