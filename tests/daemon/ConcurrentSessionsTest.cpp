@@ -15,12 +15,41 @@
 namespace orvanta::test {
 namespace {
 
+// Remembers whom it was given, and plays the peer that comes and goes.
+struct Peer final : public RecordingConnection {
+  using RecordingConnection::RecordingConnection;
+  ~Peer() override {
+    if (whenDestroyed) whenDestroyed();
+  }
+  void resume(std::shared_ptr<platform::ConnectionDelegate> given) override { delegate = std::move(given); }
+  void cancel(std::chrono::milliseconds) override { delegate.reset(); }
+  void call(const char* method, Array params) const {
+    platform::Frame frame;
+    frame.kind = platform::Frame::Kind::request;
+    frame.method = method;
+    frame.params = std::move(params);
+    delegate->received(std::move(frame));
+  }
+  void leave() { std::exchange(delegate, nullptr)->invalidated(std::nullopt); }
+  std::shared_ptr<platform::ConnectionDelegate> delegate;
+  std::function<void()> whenDestroyed;
+};
+
 class ConcurrentSessionsTest : public SessionFixture {
  protected:
   ConcurrentSessionsTest() {
+    device.directory.write("etc/entitlements.d/all.plist",
+                           *platform::writeXmlPropertyList(
+                               Dictionary{{"user", std::to_string(::getuid())},
+                                          {"entitlements", Dictionary{{std::string(kOrvantaEntitlement), true}}}}));
     const Dictionary client{{"post_url", "http://127.0.0.1/post"}, {"event_threshold", 5}};
-    storebag = shared({{"http_post", Dictionary{{"clients", Array{client}}}}});
+    storebag = shared({{"http_post", Dictionary{{"clients", Array{client}}}}, {"voltmark", Dictionary{}}});
     platform::setLogLevel(platform::LogLevel::error);
+  }
+  bool admits(const std::shared_ptr<Peer>& peer) {
+    platform::PeerIdentity identity;
+    identity.uid = ::getuid();
+    return agent.listenerShouldAcceptNewConnection({peer, identity});
   }
 };
 
@@ -60,26 +89,8 @@ class SilentServerTest : public ConcurrentSessionsTest {
   std::future<void> _waiting;
 };
 
-// Remembers whom it was given, and plays the peer that comes and goes.
-struct Peer final : public RecordingConnection {
-  using RecordingConnection::RecordingConnection;
-  void resume(std::shared_ptr<platform::ConnectionDelegate> given) override { delegate = std::move(given); }
-  void call(const char* method, Array params) const {
-    platform::Frame frame;
-    frame.kind = platform::Frame::Kind::request;
-    frame.method = method;
-    frame.params = std::move(params);
-    delegate->received(std::move(frame));
-  }
-  std::shared_ptr<platform::ConnectionDelegate> delegate;
-};
-
 TEST_F(SilentServerTest, OnlySessionsWithSomebodyAboveWaitForIt) {
   maxAge = 0;
-  device.directory.write("etc/entitlements.d/all.plist",
-                         *platform::writeXmlPropertyList(
-                             Dictionary{{"user", std::to_string(::getuid())},
-                                        {"entitlements", Dictionary{{std::string(kOrvantaEntitlement), true}}}}));
   const auto related = makeSession();
   configure(*related, 4, hierarchy("t", 0));
   // An aggregating root, a session below it without user info, and one outside all groups.
@@ -100,12 +111,10 @@ TEST_F(SilentServerTest, OnlySessionsWithSomebodyAboveWaitForIt) {
   EXPECT_EQ(rootClient->aggregated().back().type, 9);
   EXPECT_TRUE(passes([this] {
     const auto peer = std::make_shared<Peer>(device.get().pool());
-    platform::PeerIdentity identity;
-    identity.uid = ::getuid();
-    EXPECT_TRUE(agent.listenerShouldAcceptNewConnection({peer, identity}));
+    EXPECT_TRUE(admits(peer));
     peer->call("setSessionInfo", {Dictionary{{"sessionID", 2}, {"clientType", 7}}, nullptr, nullptr, true});
     peer->call("sendMessageWithDictionary", {Dictionary{{"category", 1}, {"type", 2}}});
-    std::exchange(peer->delegate, nullptr)->invalidated(std::nullopt);
+    peer->leave();
   }));
   EXPECT_TRUE(passes([this] { EXPECT_EQ(agent.sessionCount(), 0U); }));
   release();
@@ -127,6 +136,27 @@ TEST_F(SilentServerTest, SessionsThatWaitForTheAgentLeaveTheThreadsOfThePoolToOt
     device.get().pool().post([&] { ran.add(); });
     EXPECT_TRUE(ran.waitFor(1));
   }));
+}
+
+// Some clients leave while the daemon ends the sessions of all.
+TEST_F(ConcurrentSessionsTest, AllHaveEndedAndWhatGoesWithThemMayAskTheAgent) {
+  platform::setLogLevel(platform::LogLevel::debug);
+  constexpr int kSessions = 50;
+  Counter destroyed;
+  for (int i = 0; i < kSessions; ++i) {
+    const auto peer = std::make_shared<Peer>(device.get().pool());
+    peer->whenDestroyed = [&] {
+      agent.sessionCount();  // takes the session list's lock
+      destroyed.add();
+    };
+    ASSERT_TRUE(admits(peer));
+    if (i % 2 == 0) peer->queue()->post([peer] { peer->leave(); });
+  }
+  agent.endAllSessions();
+  EXPECT_EQ(log.count("<7>dealloc: OrvantadSession dealloc: "), std::size_t{kSessions});
+  EXPECT_TRUE(destroyed.waitFor(kSessions));
+  EXPECT_FALSE(admits(std::make_shared<Peer>(device.get().pool())));
+  EXPECT_FALSE(log.contains("was dropped before it ended"));
 }
 
 std::ptrdiff_t endNotices(const std::vector<AggregatedEvent>& events) {
