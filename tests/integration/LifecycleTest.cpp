@@ -58,6 +58,17 @@ TEST_F(LifecycleTest, SIGTERMEndsSessionsWhileTheirClientsAreConnected) {
             5);
 }
 
+TEST_F(LifecycleTest, SIGTERMWaitsFiveSecondsForASilentEventServer) {
+  startDaemon();
+  auto session = openSession({.sessionID = 1});
+  server->setFault("/events", collector::ConnectionFault::silent);
+  send(*session, event(9, 9));
+  const auto begin = std::chrono::steady_clock::now();
+  EXPECT_EQ(daemon->terminate(), 0);
+  EXPECT_GE(std::chrono::steady_clock::now() - begin, std::chrono::seconds(5));
+  EXPECT_TRUE(daemon->logged("post error: Aborted: the HTTP client is shutting down", 2)) << "the event and the end";
+}
+
 TEST_F(LifecycleTest, AfterSIGKILLAStaleSocketIsReplacedAndTheDefaultsAreWhole) {
   startDaemon();
   openSession({.sessionID = 1, .clientType = 5, .requireUserInfo = true}, UserInfo{"c", "s", {}});
