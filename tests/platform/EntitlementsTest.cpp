@@ -51,14 +51,12 @@ TEST(EntitlementsTest, ReadsOneFile) {
       {true,
        nullptr,
        {grant(kUser), grant(text("user", "4711")), grant(number("group", "4712")), grant(text("group", "4713")),
-        grant(text("group", "daemon")), grant(text("label", "trusted_t")), grant(kUser, "<integer>2</integer>"),
-        grant(kUser, "<string>YES</string>")}},
+        grant(text("group", "daemon")), grant(text("label", "trusted_t")), grant(kUser, "<string>YES</string>")}},
       // What matches nobody here, or says no.
       {false,
        nullptr,
        {grant(number("user", "4712")), grant(number("group", "4711")), grant(text("user", "root")),
-        grant(text("label", "trusted")), grant(kUser, "<false/>"), grant(kUser, "<integer>0</integer>"),
-        grant(kUser, "<string>NO</string>"), grant(kUser, "<array><true/></array>")}},
+        grant(text("label", "trusted")), grant(kUser, "<false/>"), grant(kUser, "<array><true/></array>")}},
       // What makes no sense.
       {false, "<4>", {"user: 4711"}},
       {false, "no dictionary", {"<plist><array/></plist>"}},

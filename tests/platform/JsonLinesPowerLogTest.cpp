@@ -41,10 +41,6 @@ TEST_F(JsonLinesPowerLogTest, writesOneLineOfJsonPerRecord) {
   EXPECT_THAT(lines(), ElementsAre(R"({"event":28,"sender":"Vesperd-ORV","time":1795532645.5,"record":)"
                                    R"({"list":[true,null],"text \"in quotes\"":"two\nlines","x":1}})",
                                    R"({"event":-1,"sender":"","time":1795532645.5,"record":{}})"));
-  // A file that is removed begins anew.
-  std::filesystem::remove(path);
-  log.registeredEvent(2, "s", {});
-  EXPECT_THAT(lines(), ElementsAre(testing::StartsWith(R"({"event":2)")));
 }
 
 TEST_F(JsonLinesPowerLogTest, keepsTwoGenerations) {
@@ -62,15 +58,6 @@ TEST_F(JsonLinesPowerLogTest, keepsTwoGenerations) {
   EXPECT_EQ(eventsAfter(1, 2), " 12 ");
   EXPECT_EQ(eventsAfter(3, 5), "34 5 ");
   EXPECT_EQ(eventsAfter(6, 7), "56 7 ");
-}
-
-TEST_F(JsonLinesPowerLogTest, aRecordLargerThanAGenerationIsWrittenAlone) {
-  JsonLinesPowerLog log(path, clock, 100);
-  log.registeredEvent(1, "s", {{"filler", std::string(400, 'f')}});
-  EXPECT_FALSE(std::filesystem::exists(path + ".1")) << "there was nothing to keep";
-  log.registeredEvent(2, "s", {{"filler", std::string(400, 'f')}});
-  EXPECT_EQ(lines("powerlog.jsonl.1").size(), 1);
-  EXPECT_EQ(lines().size(), 1);
 }
 
 TEST_F(JsonLinesPowerLogTest, saysOnceThatRecordsAreLost) {
