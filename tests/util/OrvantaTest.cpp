@@ -19,8 +19,6 @@ TEST(Orvanta, readsTheBundlesVersion) {
       {nullptr, "8.0", 0},
       {"<plist><dict><key>Version</key><string>9</string></dict></plist>", "8.0", 1},
       {"<plist><dict><key>version</key><array/></dict></plist>", "8.0", 1},
-      {"<plist><string>8.1</string></plist>", "8.0", 1},
-      {"<plist><dict><key>version", "8.0", 1},
       {"", "8.0", 1},
   };
   for (const auto& [file, version, lines] : rows) {
