@@ -41,9 +41,7 @@ TEST(EventFilters, FilterEvent) {
       {"first match: hashed", inCategory3, {{"_method", 3}, {"a", "Anna's"}}, {{"_method", 3}, {"a", sha("Anna's")}}},
       {"first match: removed", inCategory3, {{"_method", 4}, {"a", "Anna's"}}, {{"_method", 4}}},
       {"an unknown action shields from later rules", {rule("a", "Remove"), removeA}, {{"a", 1}}, {{"a", 1}}},
-      {"an absent action too", {Dictionary{{"key", "a"}}, removeA}, {{"a", 1}}, {{"a", 1}}},
       {"no key never matches", {Dictionary{{"action", "remove"}}}, {{"", 1}, {"a", 1}}, {{"", 1}, {"a", 1}}},
-      {"an empty key is a key", {rule("", "remove")}, {{"", 1}, {"a", 1}}, {{"a", 1}}},
       {"another status",
        {rule("a", "remove", {{"status", 2}})},
        {{"a", 1}, {"_status", 3}},
@@ -51,7 +49,6 @@ TEST(EventFilters, FilterEvent) {
       {"the status", {rule("a", "remove", {{"status", 2}})}, {{"a", 1}, {"_status", 2}}, {{"_status", 2}}},
       {"absent numbers are 0", {rule("a", "remove", {{"method", 0}, {"status", 0}})}, {{"a", 1}}, {}},
       {"a negative is any", {rule("a", "remove", {{"method", -7}})}, {{"a", 1}, {"_method", 5}}, {{"_method", 5}}},
-      {"numbers as text", {rule("a", "remove", {{"method", "5"}})}, {{"a", 1}, {"_method", "5"}}, {{"_method", "5"}}},
       {"a rule may take what the rules look at",
        {rule("_METHOD", "remove", {{"method", 5}}), rule("a", "remove", {{"method", 5}})},
        {{"a", 1}, {"_method", 5}},
@@ -71,9 +68,6 @@ TEST(EventFilters, FilterEvent) {
 TEST(EventFilters, DigestsOfEveryType) {
   const std::pair<Value, Value> rows[] = {
       {"abc", "ba7816bf8f01cfea414140de5dae2223b00361a396177a9cb410ff61f20015ad"},
-      {"", sha("")},
-      {"na\xC3\xAFve", sha("na\xC3\xAFve")},
-      {-7, sha("-7")},
       {0.5, sha("0.5")},
       {true, sha("1")},
       {std::numeric_limits<std::uint64_t>::max(), sha("18446744073709551615")},

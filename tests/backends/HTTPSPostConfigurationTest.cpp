@@ -65,8 +65,6 @@ TEST_F(HTTPSPostConfigurationTest, LinesOfRefusals) {
   const std::tuple<const char*, Value, std::string> rows[] = {
       {"override_dnu", nullptr, "<7>|reporting disabled by DNU: 0."},
       {"locale_whitelist", Array{"FR"}, "<7>|(DE) isn't in country code list " + Value(Array{"FR"}).description()},
-      {"device_blacklist", Array{"3,2"}, "<7>|(Parva3,2) is in device blacklist " + Value(Array{"3,2"}).description()},
-      {"filters", nullptr, "<4>|filters are required."},
       {"filters", "none", "<4>|client section 0 is malformed: \"filters\" is no list."},
   };
   for (const auto& [key, value, line] : rows) {
@@ -142,7 +140,6 @@ TEST_F(HTTPSPostConfigurationTest, ClientIdentifiers) {
     std::string key;  // of the user default that holds the identifier; empty: the device's own
   } rows[] = {
       {"consent respected", true, 0, false, 0, false, "uuid-respect-dnu"},
-      {"overridden, not given", false, 1, false, 0, false, "uuid-override-dnu"},
       {"overridden, given", true, 1, false, 0, false, "uuid-override-dnu"},
       {"custom", true, 0, true, 0, false, "uuid:Mail:imap"},
       {"custom, overridden", false, 1, true, 0, false, "uuid:Mail:imap"},
@@ -162,16 +159,6 @@ TEST_F(HTTPSPostConfigurationTest, ClientIdentifiers) {
               row.key.empty() ? setup.identity.udid : platform.get().defaults().text(row.key).value_or("(none)"))
         << row.what;
   }
-}
-
-TEST_F(HTTPSPostConfigurationTest, EvaluationFollowsTheUserInfo) {
-  Setup setup = requiring();
-  setup.userInfo = nullptr;
-  const auto backend = makeBackend(setup);
-  EXPECT_EQ(backend->state(), kBackendWaiting);
-  backend->setUserInfoDict(shared({}));
-  backend->updateState();
-  EXPECT_EQ(backend->state(), kBackendEnabled) << "empty user info is user info";
 }
 
 }  // namespace

@@ -89,7 +89,6 @@ TEST(ReportingDecision, Sections) {
       {"no sections", {}, noSectionMatches},
       {"user info not required, no consent, no match", {Dictionary{{"client", "x"}}}, userInfoNotRequired, notRequired},
       {"user info missing", {open()}, waitingForUserInfo, noUserInfo},
-      {"elements that are no sections", {"text", 5}, noSectionMatches},
       {"one of them a section", {"text", open()}, sampledIn},
       {"the first that matches decides",
        {open({{"client", "News"}}), open({{"sampling_threshold", 0.1}}), open()},
@@ -104,7 +103,6 @@ TEST(ReportingDecision, Sections) {
       decide({Dictionary{{"client", "x"}}, open({{"enabledSince", "3.1"}}), open({{"enabledSince", "4"}})}).reason;
   EXPECT_EQ(reason.section, 1U);
   EXPECT_EQ(reason.subject, "3.1");
-  EXPECT_EQ(decide({open({{"enabledSince", "3"}}), open()}).reason.section, 1U);
 }
 
 TEST(ReportingDecision, SectionForTheClient) {
@@ -114,21 +112,16 @@ TEST(ReportingDecision, SectionForTheClient) {
       {"any client, client unknown", {}, sampledIn, noClient},
       {"client without case", {{"client", "News,mAIL"}}, sampledIn},
       {"client as a whole", {{"client", "Mai"}}, noSectionMatches},
-      {"blank before the name", {{"client", "News, Mail"}}, noSectionMatches},
       {"blank before the client's own name", {{"client", "News, Mail"}}, sampledIn, blankClient},
       {"client unknown", {{"client", "Mail"}}, noSectionMatches, noClient},
-      {"empty client list", {{"client", ""}}, noSectionMatches},
       {"empty client list, empty client", {{"client", ""}}, sampledIn, emptyClient},
       {"client of a wrong type", {{"client", Array{"Mail"}}}, noSectionMatches},
       {"fragment of the service", {{"service", "x,IMAP"}}, sampledIn},
       {"fragment too long", {{"service", "imap.service2"}}, noSectionMatches},
       {"empty fragment, service unknown", {{"service", ""}}, noSectionMatches, noService},
-      {"service of a wrong type", {{"service", 1}}, noSectionMatches},
       {"client fits, service does not", {{"client", "Mail"}, {"service", "pop"}}, noSectionMatches},
       {"version equal", {{"enabledSince", "2.1.5"}}, sampledIn},
-      {"version a number", {{"enabledSince", 2.1}}, sampledIn},
       {"last part of the version too high", {{"enabledSince", "2.1.6"}}, versionTooLow},
-      {"middle part decides", {{"enabledSince", "2.2.0"}}, versionTooLow},
       {"eight bits each", {{"enabledSince", "258"}}, sampledIn},
       {"version of a wrong type", {{"enabledSince", Array{"1"}}}, versionTooLow},
   });
@@ -137,23 +130,18 @@ TEST(ReportingDecision, SectionForTheClient) {
 TEST(ReportingDecision, ConsentCountryDeviceAndFilters) {
   check({
       {"consent missing", {}, consentMissing, noConsent},
-      {"missing, override 0", {{"override_dnu", 0}}, consentMissing, noConsent},
       {"missing, nearly overridden", {{"override_dnu", 1.5}}, consentMissing, noConsent},
       {"missing, overridden", {{"override_dnu", 1}}, sampledIn, noConsent},
-      {"missing, overridden by true", {{"override_dnu", true}}, sampledIn, noConsent},
       {"missing, override of a wrong type", {{"override_dnu", "1"}}, consentMissing, noConsent},
       {"country fragment without case", {{"locale_whitelist", Array{"x", "d"}}}, sampledIn},
       {"country not listed", {{"locale_whitelist", Array{"FR"}}}, countryNotListed},
       {"no country list", {{"locale_whitelist", nullptr}}, countryNotListed},
-      {"empty country list", {{"locale_whitelist", Array{}}}, countryNotListed},
       {"country unknown", {{"locale_whitelist", Array{"FR"}}}, sampledIn, noCountry},
       {"country unknown, empty list", {{"locale_whitelist", Array{}}}, countryNotListed, noCountry},
       {"family listed", {{"device_whitelist", Array{"arv"}}}, sampledIn},
       {"family not listed", {{"device_whitelist", Array{"Magna"}}}, familyNotListed},
-      {"empty family list", {{"device_whitelist", Array{}}}, sampledIn},
       {"model blacklisted", {{"device_blacklist", Array{"abc"}}}, modelBlacklisted},
       {"model not blacklisted", {{"device_blacklist", Array{"abd"}}}, sampledIn},
-      {"empty blacklist", {{"device_blacklist", Array{}}}, sampledIn},
       {"model unknown", {{"device_blacklist", Array{"abd"}}}, modelBlacklisted, noModel},
       {"model unknown, empty blacklist", {{"device_blacklist", Array{}}}, sampledIn, noModel},
       {"no filters", {{"filters", nullptr}}, filtersMissing},
@@ -162,8 +150,8 @@ TEST(ReportingDecision, ConsentCountryDeviceAndFilters) {
       {"consent, country", {{"locale_whitelist", Array{}}}, consentMissing, noConsent},
       {"country, family", {{"locale_whitelist", Array{}}, {"device_whitelist", Array{"Magna"}}}, countryNotListed},
       {"family, model", {{"device_whitelist", Array{"x"}}, {"device_blacklist", Array{"abc"}}}, familyNotListed},
-      {"model, filters", {{"device_blacklist", Array{"abc"}}, {"filters", nullptr}}, modelBlacklisted},
       {"filters, sampling", {{"filters", nullptr}, {"sampling_threshold", nullptr}}, filtersMissing},
+      {"model, filters", {{"device_blacklist", Array{"abc"}}, {"filters", nullptr}}, modelBlacklisted},
   });
   const auto typeOf = [](const Dictionary& more, const Change& change) {
     return decide({open(more)}, change).settings.dnuType;
@@ -171,7 +159,6 @@ TEST(ReportingDecision, ConsentCountryDeviceAndFilters) {
   EXPECT_EQ(typeOf({{"override_dnu", 1}}, {}), 2);
   EXPECT_EQ(typeOf({{"override_dnu", 1}, {"locale_whitelist", Array{"FR"}}}, noConsent), 1);
   EXPECT_EQ(typeOf({}, {}), 0);
-  EXPECT_EQ(typeOf({}, noConsent), 0);
 }
 
 TEST(ReportingDecision, Sampling) {
@@ -199,7 +186,6 @@ TEST(ReportingDecision, Sampling) {
       {"exactly the override", {{"override_sampling", 0.3}}, held, draw(0.3)},
       {"above the override", {{"override_sampling", 0.2}}, sampledOut, draw(0.3)},
       {"threshold 0, draw 0", {{"sampling_threshold", 0}}, sampledIn, draw(0)},
-      {"threshold as text", {{"sampling_threshold", "0.25"}}, sampledIn},
       {"the first entry for the country", perCountry, sampledIn, draw(0.4)},
       {"country codes are exact", perCountry, held, smallLetters},
       {"country unknown", perCountry, held, nowhere},
@@ -212,16 +198,13 @@ TEST(ReportingDecision, MalformedSectionsReportNothing) {
   const std::pair<const char*, Value> rows[] = {
       {"locale_whitelist", "DE"},
       {"locale_whitelist", Array{Value(Array{})}},
-      {"device_whitelist", "Parva"},
       {"device_blacklist", "abd"},
       {"device_blacklist", Array{nullptr}},
       {"filters", "remove everything"},
-      {"filters", Array{"userName"}},
       {"filters", Array{Dictionary{{"key", 7}}}},
       {"sampling_threshold", Array{1}},
       {"override_sampling", Dictionary{}},
       {"per_country_sampling_thresholds", 0.5},
-      {"per_country_sampling_thresholds", Array{0.5}},
       {"per_country_sampling_thresholds", Array{Dictionary{{"country", "DE"}}}},
       {"per_country_sampling_thresholds", Array{Dictionary{{"threshold", Array{}}}}},
       {"event_whitelist", 3},
@@ -271,7 +254,6 @@ TEST(ReportingDecision, Expedite) {
   } rows[] = {
       {{open({{"expedite", 1}})}, false},
       {{open({{"expedite", 0}})}, true},
-      {{open({{"expedite", "0"}})}, true},
       {{open({{"expedite", Array{}}})}, std::nullopt},
       {{open(), open({{"expedite", 1}})}, std::nullopt},  // the first match decides
       {{open({{"client", "x"}, {"expedite", 1}}), open({{"expedite", 0}})}, true},
@@ -327,7 +309,6 @@ TEST(ReportingDecision, SettingsOfAChosenSection) {
   EXPECT_EQ(settings.linkSections.size(), 1U);
   EXPECT_EQ(settings.eventWhitelist->categories, (std::vector<std::int32_t>{3, 12}));
   EXPECT_TRUE(settings.eventBlacklist->categories.empty());
-  EXPECT_FALSE(decide({section}, draw(0.1)).settings.overrideSampling) << "left as it was";
   EXPECT_FALSE(decide({open({{"filters", Array{}}})}).settings.filters) << "an empty list keeps the earlier filters";
 
   const auto refused = decide({section}, [](auto& facts) { facts.countryCode = "FR"; }).settings;
