@@ -103,7 +103,7 @@ class TestAuthority {
  private:
   TestIdentity write(const Material& material) const {
     const std::string base = _directory + "/certificate" + std::to_string(_serial);
-    const TestIdentity identity{base + ".pem", base + ".key"};
+    TestIdentity identity{base + ".pem", base + ".key"};
     std::FILE* file = std::fopen(identity.certificateFile.c_str(), "w");
     require(file != nullptr && PEM_write_X509(file, material.certificate) == 1, "writing a certificate");
     std::fclose(file);

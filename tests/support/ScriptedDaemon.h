@@ -110,7 +110,7 @@ class ScriptedPeer {
   // False at the end of what the client sends.
   bool readMore() {
     await(_socket.get(), POLLIN, "the client's bytes");
-    std::array<std::uint8_t, 64 * 1024> buffer;
+    std::array<std::uint8_t, 65'536> buffer;
     alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof(int) * 16)> control;
     iovec bytes{buffer.data(), buffer.size()};
     msghdr header{};
