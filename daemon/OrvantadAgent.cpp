@@ -12,6 +12,7 @@ namespace orvanta {
 
 namespace {
 constexpr std::chrono::seconds kBetweenReleases{10};
+constexpr std::chrono::seconds kEndOfSessions{10};
 // Above that, what a change does to those below it takes milliseconds.
 constexpr std::size_t kLargeGroup = 64;
 }  // namespace
@@ -95,7 +96,7 @@ void OrvantadAgent::releaseMemoryWhenIdle() {
   });
 }
 
-void OrvantadAgent::endAllSessions() {
+bool OrvantadAgent::endAllSessions() {
   std::vector<Entry> entries;
   {
     const std::lock_guard lock(_sessionListLock);
@@ -111,7 +112,9 @@ void OrvantadAgent::endAllSessions() {
   }
   // Also those whose clients have just left by themselves and that are no longer in the list.
   std::unique_lock lock(_sessionListLock);
-  _allEnded.wait(lock, [this] { return _unended == 0; });
+  if (_allEnded.wait_for(lock, kEndOfSessions, [this] { return _unended == 0; })) return true;
+  ORVANTA_LOG(error, "main: {} sessions are still busy and are left behind", _unended);
+  return false;
 }
 
 std::size_t OrvantadAgent::sessionCount() const {

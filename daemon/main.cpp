@@ -1,3 +1,4 @@
+#include <cstdlib>
 #include <utility>
 
 #include "daemon/DaemonPlatform.h"
@@ -51,8 +52,9 @@ int main() {
   platform::KeepAlive::stopping();
   listener->stop();
   endWaiting(*device);
-  agent.endAllSessions();
+  const bool ended = agent.endAllSessions();
   finishDeliveries(*device);
+  if (!ended) std::_Exit(0);  // a thread that is stuck in a call cannot be joined
   listener.reset();
   device->pool().stop();
   OrvantaLogging::close();

@@ -2,6 +2,7 @@
 // counted from 1; its type is 0 for the session's own thread, 1 for a thread that the plug-in starts. What came of it
 // is appended to acts.log in the daemon's state directory.
 
+#include <chrono>
 #include <cstdlib>
 #include <cstring>
 #include <fstream>
@@ -18,6 +19,7 @@ using orvanta::test::kForbiddenActs;
 
 void sendMessage(void* /*instance*/, std::uint16_t method, std::uint16_t respCode, const std::uint8_t* /*payload*/,
                  std::size_t /*payloadLength*/) {
+  while (method == orvanta::test::kActThatNeverEnds) std::this_thread::sleep_for(std::chrono::hours(1));
   if (method == 0 || method > std::size(kForbiddenActs)) return;  // 0: the session's own records
   const auto& act = kForbiddenActs[method - 1];
   const std::string state = std::getenv("STATE_DIRECTORY");

@@ -73,6 +73,16 @@ TEST_F(SandboxTest, ActsThatOnlyAnIntruderTriesEndTheDaemon) {
   }
 }
 
+TEST_F(SandboxTest, APlugInThatNeverReturnsNeitherHoldsUpOthersNorTheEnd) {
+  startDaemon();
+  auto stuck = openSession({.sessionID = 1, .clientType = 7});
+  stuck->session().sendMessageWithCategory(kActThatNeverEnds, 0, nullptr, {});
+  auto other = openSession({.sessionID = 2, .clientType = 7});
+  send(*other, act(0, 0));
+  EXPECT_EQ(daemon->terminate(), 0);
+  EXPECT_EQ(daemon->count("<3>main: 1 sessions are still busy and are left behind"), 1U);
+}
+
 TEST_F(SandboxTest, AKernelWithoutLandlockIsAFailureThatSaysWhatToDo) {
   options.wrapper = WITHOUT_LANDLOCK;
   daemon = std::make_unique<DaemonProcess>(options);

@@ -91,4 +91,7 @@ inline const ForbiddenAct kForbiddenActs[] = {
     {"mount", [](auto&, auto& at) { return outcome(::mount("none", at.c_str(), "tmpfs", 0, nullptr) == 0); }, nullptr},
 };
 
+// The event of this category keeps the plug-in busy for ever.
+inline constexpr std::uint16_t kActThatNeverEnds = 1000;
+
 }  // namespace orvanta::test
