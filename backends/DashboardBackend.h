@@ -55,7 +55,7 @@ class DashboardBackend final : public OrvantaBackend {
   std::chrono::milliseconds period() const { return _period; }
 
   // Waits until every datagram handed to a network queue of this platform has had its first transmission, at most
-  // `patience`. For shutting down. Not from a job of the pool.
+  // `patience`. For tests. Not from a job of the pool.
   static bool waitUntilSent(platform::Platform& platform, std::chrono::milliseconds patience);
 
   static constexpr std::chrono::milliseconds kDefaultPeriod{500};

@@ -53,6 +53,7 @@ class PendingPosts : public std::enable_shared_from_this<PendingPosts> {
   // For ending: nobody waits for room from now on, there is room for whatever comes.
   void stopWaiting();
   // Waits until no post is left that the HTTP client has not got, at most `patience`; whether none is left.
+  // For tests.
   bool waitUntilHandedIn(std::chrono::milliseconds patience);
 
  private:

@@ -12,8 +12,8 @@ namespace platform {
 // The threads of a WorkPool: a fixed number, and extra ones that stand in for threads that block.
 //
 // Owned by its pool. An extra thread steps in when fewer than the fixed number would be left to run jobs. It steps
-// aside as soon as it is superfluous, since threads that share a loop wake each other, and ends when it has not been
-// needed for kLinger. All operations may be called from any thread.
+// aside with the first job, or after kLinger, that finds it superfluous, since threads that share a loop wake each
+// other, and ends when it has not been needed for as long again. All operations may be called from any thread.
 class PoolThreads {
  public:
   static constexpr std::chrono::milliseconds kLinger{1000};
