@@ -37,9 +37,9 @@ class OrvantadAgent final : public OrvantadSessionDelegate {
   void invalidated(const std::shared_ptr<OrvantadSession>& session);
   // An admitted session's end() has run. On the session's queue.
   void sessionEnded();
-  // Ends every session while its connection is still open, and returns when all have ended, or after ten seconds: false,
-  // with a log line, when the call of one takes longer still. Sessions admitted meanwhile are refused. Not on a pool
-  // thread.
+  // Ends every session while its connection is still open, and returns when all have ended, or after ten seconds:
+  // false, with a log line, when the call of one takes longer still. Sessions admitted meanwhile are refused. Not on a
+  // pool thread.
   bool endAllSessions();
 
   std::size_t sessionCount() const;
