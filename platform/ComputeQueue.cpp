@@ -39,6 +39,7 @@ void ComputeThreads::stop() {
   std::deque<std::shared_ptr<ComputeQueue>> line;
   const std::lock_guard lock(_mutex);
   line.swap(_line);
+  dropped.reserve(line.size());
   for (const auto& queue : line) dropped.push_back(std::exchange(queue->_jobs, {}));
 }
 
