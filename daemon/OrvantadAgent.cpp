@@ -12,7 +12,8 @@ namespace orvanta {
 
 namespace {
 constexpr std::chrono::seconds kBetweenReleases{10};
-constexpr std::chrono::seconds kEndOfSessions{10};
+constexpr std::chrono::milliseconds kTimeToRead{1000};
+constexpr std::chrono::seconds kEndOfSessions{8};
 // Above that, what a change does to those below it takes milliseconds.
 constexpr std::size_t kLargeGroup = 64;
 }  // namespace
@@ -48,6 +49,7 @@ bool OrvantadAgent::listenerShouldAcceptNewConnection(platform::OfferedConnectio
       _sessionList.push_back({session, handler});
       _status.changed(_sessionList.size());
       ++_unended;
+      ++_connected;
       admitted = true;
     }
   }
@@ -85,6 +87,11 @@ void OrvantadAgent::sessionEnded() {
   if (!_ending) releaseMemoryWhenIdle();
 }
 
+void OrvantadAgent::connectionEnded() {
+  const std::lock_guard lock(_sessionListLock);
+  if (--_connected == 0) _allEnded.notify_all();
+}
+
 // Nobody is here: what the sessions used may go. Not at each of many short visits.
 void OrvantadAgent::releaseMemoryWhenIdle() {
   const auto now = std::chrono::steady_clock::now();
@@ -107,7 +114,7 @@ bool OrvantadAgent::endAllSessions() {
     entry.connection->connection()->queue()->post([handler = entry.connection] {
       handler->endSession();
       // What the client has still to hear, such as the end of its aggregation, may take it a moment to read.
-      handler->connection()->cancel(std::chrono::milliseconds(500));
+      handler->connection()->cancel(kTimeToRead);
     });
   }
   // Also those whose clients have just left by themselves and that are no longer in the list.
@@ -115,6 +122,11 @@ bool OrvantadAgent::endAllSessions() {
   if (_allEnded.wait_for(lock, kEndOfSessions, [this] { return _unended == 0; })) return true;
   ORVANTA_LOG(error, "main: {} sessions are still busy and are left behind", _unended);
   return false;
+}
+
+void OrvantadAgent::waitForClients() {
+  std::unique_lock lock(_sessionListLock);
+  _allEnded.wait_for(lock, kTimeToRead + std::chrono::milliseconds(500), [this] { return _connected == 0; });
 }
 
 std::size_t OrvantadAgent::sessionCount() const {

@@ -37,10 +37,14 @@ class OrvantadAgent final : public OrvantadSessionDelegate {
   void invalidated(const std::shared_ptr<OrvantadSession>& session);
   // An admitted session's end() has run. On the session's queue.
   void sessionEnded();
-  // Ends every session while its connection is still open, and returns when all have ended, or after ten seconds:
+  // An admitted connection has ended: its client has read everything, or had its time. On the connection's queue.
+  void connectionEnded();
+  // Ends every session while its connection is still open, and returns when all have ended, or after eight seconds:
   // false, with a log line, when the call of one takes longer still. Sessions admitted meanwhile are refused. Not on a
   // pool thread.
   bool endAllSessions();
+  // Afterwards: waits until the clients have read what their sessions' ends told them, a second and a half at most.
+  void waitForClients();
 
   std::size_t sessionCount() const;
 
@@ -70,6 +74,7 @@ class OrvantadAgent final : public OrvantadSessionDelegate {
   bool _ending = false;             // guarded by _sessionListLock
   std::size_t _unended = 0;         // guarded by _sessionListLock: admitted, and end() has not run to its end
   std::chrono::steady_clock::time_point _memoryReleased;  // guarded by _sessionListLock
+  std::size_t _connected = 0;  // guarded by _sessionListLock: admitted, and connectionEnded() not called
   std::condition_variable _allEnded;
 
   AgentLock _lock;

@@ -44,6 +44,7 @@ void SessionConnection::invalidated(const std::optional<std::string>& protocolEr
   }
   ORVANTA_LOG(debug, "listener: Vyx connection to {} was invalidated", _session->description());
   endSession();
+  _agent.connectionEnded();
 }
 
 void SessionConnection::endSession() {

@@ -20,7 +20,7 @@ int main() {
   platform::tuneAllocator();
   OrvantaLogging::startLogging("orvantad", "Daemon");
   const auto files = platform::FileLocations::fromEnvironment();
-  const auto sandbox = enterDaemonSandbox(files);
+  auto sandbox = enterDaemonSandbox(files);
   if (!sandbox) return -1;
 
   platform::blockTerminationSignals();
@@ -54,9 +54,11 @@ int main() {
   endWaiting(*device);
   const bool ended = agent.endAllSessions();
   finishDeliveries(*device);
+  agent.waitForClients();
   if (!ended) std::_Exit(0);  // a thread that is stuck in a call cannot be joined
   listener.reset();
   device->pool().stop();
+  sandbox.reset();  // its watcher logs, too
   OrvantaLogging::close();
   return 0;
 }
