@@ -1,9 +1,11 @@
 #include "interface/OrvantaLogging.h"
 
+#include <fmt/format.h>
 #include <syslog.h>
 #include <unistd.h>
 
 #include <cstdlib>
+#include <iterator>
 #include <memory>
 #include <string_view>
 
@@ -30,14 +32,10 @@ class SyslogSink final : public platform::LogSink {
 class StandardErrorSink final : public platform::LogSink {
  public:
   void write(platform::LogLevel level, std::string_view line) override {
-    std::string text;
-    text.reserve(line.size() + 5);
-    text += '<';
-    text += std::to_string(static_cast<int>(level));
-    text += '>';
-    text += line;
-    text += '\n';
-    std::string_view rest = text;
+    // Most lines fit without allocating, on which the watcher of refused system calls relies.
+    fmt::memory_buffer text;
+    fmt::format_to(std::back_inserter(text), "<{}>{}\n", static_cast<int>(level), line);
+    std::string_view rest(text.data(), text.size());
     while (!rest.empty()) {
       const ssize_t written = ::write(STDERR_FILENO, rest.data(), rest.size());
       if (written <= 0) return;

@@ -25,6 +25,11 @@
 
 namespace platform {
 
+namespace {
+constexpr int kNamedCalls = 512;
+}
+
+// While it runs it allocates nothing: a thread that forks holds the allocator's locks until its call has been answered.
 struct RefusedCalls::Watch {
   std::set<int> limited;  // allowed with other arguments; constant after construction
   UniqueFd stop{::eventfd(0, EFD_CLOEXEC)};
@@ -41,7 +46,9 @@ struct RefusedCalls::Watch {
   // Owned by the watcher. Of the kernel's sizes, which may be larger than those that we were built with.
   std::vector<std::uint8_t> _request;
   std::vector<std::uint8_t> _response;
-  std::set<int> _logged;
+  // By the call's number; the last place is for all that have no name.
+  std::vector<std::string> _names;
+  std::vector<bool> _logged;
 };
 
 // Before the thread is confined, as it takes a call that it will not have.
@@ -53,6 +60,13 @@ Result<bool> RefusedCalls::Watch::prepare() {
   }
   _request.resize(std::max<std::size_t>(sizes.seccomp_notif, sizeof(seccomp_notif)));
   _response.resize(std::max<std::size_t>(sizes.seccomp_notif_resp, sizeof(seccomp_notif_resp)));
+  for (int call = 0; call < kNamedCalls; ++call) {
+    char* const name = ::seccomp_syscall_resolve_num_arch(SCMP_ARCH_NATIVE, call);
+    _names.emplace_back(name == nullptr ? "unknown" : name);
+    std::free(name);  // NOLINT(cppcoreguidelines-no-malloc): the library's own
+  }
+  _names.emplace_back("unknown");
+  _logged.resize(_names.size());
   return filterWatcherCalls();
 }
 
@@ -83,11 +97,11 @@ bool RefusedCalls::Watch::answer(int fd) {
   std::memcpy(_response.data(), &response, sizeof response);
   // First of all, as the thread may hold what logging needs. When this fails, the thread has ended.
   ::ioctl(fd, SECCOMP_IOCTL_NOTIF_SEND, _response.data());
-  if (!_logged.insert(call).second) return true;
-  char* const name = ::seccomp_syscall_resolve_num_arch(request.data.arch, call);
+  const auto place = static_cast<std::size_t>(call >= 0 && call < kNamedCalls ? call : kNamedCalls);
+  if (_logged[place]) return true;
+  _logged[place] = true;
   PLATFORM_LOG(warning, "sandbox: Refused system call {} ({}){} in thread {}; further ones are not logged",
-               name == nullptr ? "unknown" : name, call, isLimited ? " with such arguments" : "", request.pid);
-  std::free(name);  // NOLINT(cppcoreguidelines-no-malloc): the library's own
+               _names[place], call, isLimited ? " with such arguments" : "", request.pid);
   return true;
 }
 
