@@ -14,8 +14,8 @@ std::shared_ptr<PendingPosts> PendingPosts::of(platform::Platform& platform) {
 }
 
 bool PendingPosts::hasRoom(const QueueShare& queue, std::size_t bytes) const {
-  if (_ending || queue.bytes == 0) return true;
-  return queue.bytes + bytes <= kMaximumQueueBytes && _bytes + bytes <= kMaximumTotalBytes;
+  const auto fits = [bytes](std::size_t used, std::size_t limit) { return used == 0 || used + bytes <= limit; };
+  return _ending || (fits(queue.bytes, kMaximumQueueBytes) && fits(_bytes, kMaximumTotalBytes));
 }
 
 std::unique_ptr<PendingPosts::Place> PendingPosts::Place::take(std::shared_ptr<PendingPosts> posts,

@@ -14,8 +14,8 @@ namespace orvanta {
 // shared with the posts, some of which go after it. Thread-safe.
 //
 // Who brings more than there is room for waits, so that a program that reports faster than this device compresses is
-// slowed down; when kMaximumWaiters wait already, or the daemon ends, nobody waits.
-class PendingPosts : public std::enable_shared_from_this<PendingPosts> {
+// slowed down. When kMaximumWaiters wait already it is refused instead; when the daemon ends there is room for all.
+class PendingPosts {
  public:
   static constexpr std::size_t kMaximumQueueBytes = 16U << 20U;
   static constexpr std::size_t kMaximumTotalBytes = 64U << 20U;
@@ -31,7 +31,7 @@ class PendingPosts : public std::enable_shared_from_this<PendingPosts> {
   // One post, counted while it lives.
   class Place {
    public:
-    // Null when there is no room and no waiting for it. A post of any size may be a queue's only one. Called without
+    // Null when there is no room and no waiting for it. A post of any size may wait alone. Called without
     // locks, since it may wait in a BlockingScope.
     static std::unique_ptr<Place> take(std::shared_ptr<PendingPosts> posts, std::shared_ptr<QueueShare> queue,
                                        std::size_t bytes);

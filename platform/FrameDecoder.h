@@ -56,6 +56,10 @@ class FrameDecoder {
 
   // Bytes appended and not yet given out as frames.
   std::size_t pending() const { return _buffer.size() - _start; }
+  // Whether next() may give a frame of more than `bytes` that took several appends.
+  bool mayHoldMoreThan(std::size_t bytes) const {
+    return _scan.active && _scan.offset > bytes && _scan.offset <= pending();
+  }
 
  private:
   // How far an incomplete frame has been looked through. Only its structure is followed: a frame that is whole on

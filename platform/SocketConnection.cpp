@@ -141,7 +141,7 @@ std::optional<SocketConnection::Pause> SocketConnection::carryOutFrames(int& car
     if (look && std::chrono::steady_clock::now() >= end) return Pause::turnUsedUp;
     if (_outbox->pending() > _limits.maximumUnreadReplies) return Pause::repliesUnread;
     std::optional<BlockingScope> large;
-    if (_decoder.pending() > kLargeFrame) large.emplace();
+    if (_decoder.mayHoldMoreThan(kLargeFrame)) large.emplace();
     FrameDecoder::Outcome outcome = _decoder.next();
     if (std::holds_alternative<FrameDecoder::NeedMore>(outcome)) return std::nullopt;
     if (auto* const error = std::get_if<FrameDecoder::ProtocolError>(&outcome)) {
@@ -149,7 +149,9 @@ std::optional<SocketConnection::Pause> SocketConnection::carryOutFrames(int& car
       return Pause::protocolError;
     }
     ++carriedOut;
-    _delegate->received(std::get<Frame>(std::move(outcome)));
+    auto& frame = std::get<Frame>(outcome);
+    if (!large && frame.wireSize > kLargeFrame) large.emplace();
+    _delegate->received(std::move(frame));
   }
 }
 

@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <atomic>
 #include <thread>
 
 #include "tests/platform/ConnectionFixture.h"
@@ -222,6 +224,24 @@ TEST_F(ConnectionTest, LetsGoOfItsDelegateAndDescriptors) {
     EXPECT_TRUE(eventually([&] { return connection.expired() && made.delegate.use_count() == 1; }));
   }
   EXPECT_EQ(openDescriptors(), before);
+}
+
+TEST_F(ConnectionTest, OnlyLargeFramesAreCarriedOutBesideTheLoop) {
+  startPool(1);
+  std::atomic<std::size_t> most = 0;  // threads that there were
+  auto made = open([&](Connection&, Frame& frame) {
+    if (frame.method != "end") most = std::max(most.load(), _pool->threadCount());
+  });
+  ASSERT_TRUE(made.peer.write(repeated(notification("small"), 20'000)));  // fills each read
+  ASSERT_TRUE(made.delegate->waitForFrames(20'000));
+  EXPECT_EQ(most, 1U);
+  std::size_t frames = 20'000;
+  for (const std::size_t size : {40'000, 400'000}) {  // whole in one read, and not
+    most = 0;
+    ASSERT_TRUE(made.peer.write(notification("large", Value(std::string(size, 'x'))) + notification("end")));
+    ASSERT_TRUE(made.delegate->waitForFrames(frames += 2));
+    EXPECT_EQ(most, 2U) << size;
+  }
 }
 
 TEST_F(ConnectionTest, GoesWithItsPool) {
