@@ -87,9 +87,9 @@ class DashboardBackendTest : public ::testing::Test {
     return eventually([&] { return weak.expired(); });
   }
 
+  test::LogCapture log;  // outlives the platform's threads
   test::TestPlatform platform;
   test::UdpServer server;
-  test::LogCapture log;
 };
 
 TEST_F(DashboardBackendTest, SetUpFailuresLeaveOneLineAndNoSocket) {

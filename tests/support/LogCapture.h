@@ -17,7 +17,10 @@ class LogCapture final : public platform::LogSink {
     platform::installLogSink(this);
     platform::setLogLevel(level);
   }
-  ~LogCapture() override { platform::installLogSink(_before); }
+  ~LogCapture() override {
+    platform::installLogSink(_before);
+    const std::lock_guard lock(_mutex);  // behind whoever wrote last
+  }
   LogCapture(const LogCapture&) = delete;
   LogCapture& operator=(const LogCapture&) = delete;
 
