@@ -160,14 +160,15 @@ FrameDecoder::Progress FrameDecoder::scanStructure() {
       fail(fmt::format("a byte that begins no MessagePack value at byte {}", _scan.offset));
       return Progress::failed;
     }
-    if ((head.kind == Kind::array || head.kind == Kind::map) && _scan.remaining.size() > _limits.maximumDepth) {
-      fail(fmt::format("nesting deeper than {} at byte {}", _limits.maximumDepth, _scan.offset));
-      return Progress::failed;
-    }
+    // Limits are looked at in the reader's order: the same error comes out however the bytes arrive.
     _scan.charge += memoryCharge(head);
     if (_scan.charge > _limits.maximumCharge) {
       fail(
           fmt::format("values that take more than {} bytes in memory at byte {}", _limits.maximumCharge, _scan.offset));
+      return Progress::failed;
+    }
+    if ((head.kind == Kind::array || head.kind == Kind::map) && _scan.remaining.size() > _limits.maximumDepth) {
+      fail(fmt::format("nesting deeper than {} at byte {}", _limits.maximumDepth, _scan.offset));
       return Progress::failed;
     }
     _scan.offset += head.size + (head.hasBody() ? head.argument : 0);

@@ -137,6 +137,8 @@ TEST(FrameDecoder, BoundsDepthCountingTheFrame) {
   Bytes open = fromHex("93 02 a1 'f'");
   open.insert(open.end(), 64, 0x92);
   EXPECT_NE(decodeBothWays(open).front().find("deeper than 64"), std::string::npos);
+  // Too deep and too large at once.
+  EXPECT_NE(decodeBothWays(fromHex("93 02 a1 'f' 91 9f"), {64, 300, 2}).front().find("in memory"), std::string::npos);
 }
 
 TEST(FrameDecoder, BoundsTheFrameOnTheWire) {
