@@ -32,6 +32,17 @@ void awaitPosts(const PostSink& sink, std::uint64_t wanted) {
   }
 }
 
+// Round trips of a session whose events are batched: every fiftieth one makes a post, which is built, compressed and
+// sent beside the next calls.
+void benchLatencyBesidePosts() {
+  const PostSink sink;
+  const BenchDaemon daemon(batchingSection(sink), false);
+  CallDriver driver(daemon.process().socketPath());
+  driver.configure(true);
+  const auto trips = driver.roundTrips(sampleCall(), kNilAnswer, 20'000);
+  printRatio("  and while batches are posted", percentile(trips, 0.99), median(trips), 3.0);
+}
+
 }  // namespace
 
 void benchCallPath() {
@@ -65,6 +76,7 @@ void benchCallPath() {
   const auto trips = driver.roundTrips(call, kNilAnswer, kRoundTrips);
   printRatio("one at a time, median, against echo", median(trips), median(echoTrips), 1.6);
   printRatio("one at a time, p99, against the median", percentile(trips, 0.99), median(trips), 3.0);
+  benchLatencyBesidePosts();
   fmt::print("  {:<58} {:>9} KiB (goal 9216 KiB)\n", "resident memory", daemon.process().residentKiB());
 }
 
