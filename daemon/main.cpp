@@ -50,9 +50,9 @@ int main() {
   const int signal = platform::waitForTermination();
   ORVANTA_LOG(info, "main: Ending on signal {}", signal);
   platform::KeepAlive::stopping();
-  listener->stop();
+  bool ended = listener->stop();
   endWaiting(*device);
-  const bool ended = agent.endAllSessions();
+  ended = agent.endAllSessions() && ended;
   finishDeliveries(*device);
   agent.waitForClients();
   if (!ended) std::_Exit(0);  // a thread that is stuck in a call cannot be joined

@@ -3,6 +3,7 @@
 #include <dlfcn.h>
 
 #include <filesystem>
+#include <system_error>
 
 #include "platform/Log.h"
 
@@ -22,6 +23,13 @@ const LoadedBundle* BundleLoader::load(const std::string& bundleDirectory) {
   if (slot) return slot.get();
 
   const std::string library = bundleDirectory + "/" + std::filesystem::path(bundleDirectory).stem().string() + ".so";
+  // The linker would open a FIFO, too, and wait in it with its lock held, which every new thread needs.
+  std::error_code ignored;
+  const auto status = std::filesystem::status(library, ignored);
+  if (std::filesystem::exists(status) && !std::filesystem::is_regular_file(status)) {
+    PLATFORM_LOG(error, "BundleLoader(load): Could not load {}: not a regular file", library);
+    return nullptr;
+  }
   void* const handle = ::dlopen(library.c_str(), RTLD_NOW | RTLD_LOCAL);
   if (handle == nullptr) {
     const char* const reason = ::dlerror();

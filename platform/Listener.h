@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <functional>
 #include <memory>
 #include <string>
@@ -36,8 +37,11 @@ class Listener {
   static std::unique_ptr<Listener> create(WorkPool& pool, ServiceSocket socket, Handler handler);
   virtual ~Listener() = default;
   virtual void resume() = 0;
-  // No handler runs after this returns, unless called from one. The socket file that create() made is removed.
-  virtual void stop() = 0;
+  // Accepts no more; the socket file that create() made is removed. True: no handler runs any more, but one that calls
+  // this. False: one still did after kPatience, as one that waits for something that never comes does; it is left
+  // alone. The destructor waits for it without limit.
+  virtual bool stop() = 0;
+  static constexpr std::chrono::seconds kPatience{2};
   // The most connections of one uid at a time; see docs/operation.md.
   static constexpr std::size_t kMaximumConnectionsPerUser = 4096;
 };

@@ -119,7 +119,7 @@ void Acceptor::offer(UniqueFd socket, PeerIdentity peer, std::shared_ptr<void> p
   _idle.notify_all();
 }
 
-void Acceptor::stop() {
+bool Acceptor::stop(std::optional<std::chrono::seconds> limit) {
   {
     const std::lock_guard lock(_mutex);
     if (!_stopped) {
@@ -130,11 +130,14 @@ void Acceptor::stop() {
   }
   const std::size_t own = tOffering == this ? 1 : 0;
   std::unique_lock lock(_mutex);
-  if (_offering <= own) return;
+  const auto ended = [&] { return _offering <= own; };
+  if (ended()) return true;
   lock.unlock();
   const BlockingScope blocking;
   lock.lock();
-  _idle.wait(lock, [&] { return _offering <= own; });
+  if (limit) return _idle.wait_for(lock, *limit, ended);
+  _idle.wait(lock, ended);
+  return true;
 }
 
 void Acceptor::close() {

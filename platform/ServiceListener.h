@@ -22,7 +22,8 @@ class Acceptor final : public std::enable_shared_from_this<Acceptor> {
   Acceptor(WorkPool& pool, ServiceSocket socket, Listener::Handler handler, std::size_t maximumPerUser);
 
   void start();
-  void stop();
+  // Waits for the handlers under way at most so long; without a limit when there is none. Whether all have ended.
+  bool stop(std::optional<std::chrono::seconds> limit);
 
  private:
   using Instant = std::chrono::steady_clock::time_point;
@@ -64,10 +65,10 @@ class ServiceListener final : public Listener {
  public:
   ServiceListener(WorkPool& pool, ServiceSocket socket, Handler handler, std::size_t maximumPerUser)
       : _acceptor(std::make_shared<Acceptor>(pool, std::move(socket), std::move(handler), maximumPerUser)) {}
-  ~ServiceListener() override { _acceptor->stop(); }
+  ~ServiceListener() override { _acceptor->stop(std::nullopt); }
 
   void resume() override { _acceptor->start(); }
-  void stop() override { _acceptor->stop(); }
+  bool stop() override { return _acceptor->stop(kPatience); }
 
  private:
   const std::shared_ptr<Acceptor> _acceptor;

@@ -1,6 +1,7 @@
 #include "backends/BriskBackend.h"
 
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
 #include <filesystem>
 #include <tuple>
@@ -12,6 +13,7 @@ namespace orvanta {
 namespace {
 
 constexpr const char* kLibrary = "/Tamberline.bundle/Bundles/HQXPerformance.bundle/HQXPerformance.so";
+constexpr const char* kFifo = "a FIFO";
 constexpr const char* kNotResponding = " does not respond to forwarding selector sendMessageWithMethod:respCode:dict:";
 
 class BriskBackendTest : public ::testing::Test {
@@ -19,7 +21,11 @@ class BriskBackendTest : public ::testing::Test {
   static std::string libraryPath(test::TestPlatform& on) { return on.get().files().plugInsDirectory + kLibrary; }
   static void install(test::TestPlatform& on, const std::string& library) {
     std::filesystem::create_directories(std::filesystem::path(libraryPath(on)).parent_path());
-    std::filesystem::copy_file(library, libraryPath(on));
+    if (library == kFifo) {
+      ASSERT_EQ(::mkfifo(libraryPath(on).c_str(), 0600), 0);
+    } else {
+      std::filesystem::copy_file(library, libraryPath(on));
+    }
   }
   static std::shared_ptr<BriskBackend> make(test::TestPlatform& on, std::int32_t clientType) {
     return BriskBackend::create(on, "brisk", nullptr, "Parva", clientType);
@@ -47,6 +53,7 @@ TEST_F(BriskBackendTest, EveryFaultyBundleIsExplainedOnceAndEachEventLeavesALine
       // library, reason, adaptor
       {"", "cannot open shared object file", "(null)"},
       {platform.directory.write("text", "no shared object"), "Could not load ", "(null)"},
+      {kFifo, "not a regular file", "(null)"},  // opening it would wait for a writer
       {faults + "/faulty_adaptor_0.so", "exports no orvantaPluginBundle", "(null)"},
       {faults + "/faulty_adaptor_1.so", "has plug-in interface version 2, this daemon has 1", "(null)"},
       {faults + "/faulty_adaptor_2.so", "has no class BriskAdaptor", "(null)"},
