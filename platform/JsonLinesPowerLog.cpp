@@ -55,15 +55,26 @@ void JsonLinesPowerLog::registeredEvent(std::int32_t event, std::string_view sen
 
 bool JsonLinesPowerLog::openFile() {
   struct stat status {};
-  // A file that somebody removed or replaced would take lines that nobody reads.
-  if (_file && ::fstat(_file.get(), &status) == 0 && status.st_nlink > 0) return true;
-  _file.reset(::open(_path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_NOFOLLOW | O_CLOEXEC, kFileMode));
+  // A file that somebody removed, renamed or replaced would take lines that nobody reads.
+  if (_file && ::lstat(_path.c_str(), &status) == 0 && status.st_dev == _device && status.st_ino == _inode) return true;
+  _file.reset(::open(_path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, kFileMode));
   if (!_file || ::fstat(_file.get(), &status) != 0) return false;
+  if (!S_ISREG(status.st_mode)) {
+    _file.reset();
+    errno = EINVAL;
+    return false;
+  }
+  _device = status.st_dev;
+  _inode = status.st_ino;
   _size = static_cast<std::size_t>(status.st_size);
   return true;
 }
 
 bool JsonLinesPowerLog::append(std::string_view line) {
+  if (line.size() > _generationBytes) {
+    errno = EFBIG;
+    return false;
+  }
   if (!openFile()) return false;
   if (_size > 0 && _size + line.size() > _generationBytes) {
     if (std::rename(_path.c_str(), _olderPath.c_str()) != 0) return false;

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <sys/types.h>
+
 #include <cstdint>
 #include <mutex>
 #include <string>
@@ -36,6 +38,8 @@ class JsonLinesPowerLog final : public PowerLog {
   const std::size_t _generationBytes;
   std::mutex _mutex;
   UniqueFd _file;         // guarded by _mutex: kept open between records
+  dev_t _device = 0;      // guarded by _mutex: which file that is
+  ino_t _inode = 0;       // guarded by _mutex
   std::size_t _size = 0;  // guarded by _mutex: of the open file
   bool _failing = false;  // guarded by _mutex: the last record was lost
 };

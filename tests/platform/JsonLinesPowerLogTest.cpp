@@ -1,6 +1,8 @@
 #include "platform/JsonLinesPowerLog.h"
 
+#include <fcntl.h>
 #include <gmock/gmock.h>
+#include <sys/stat.h>
 
 #include <filesystem>
 #include <fstream>
@@ -58,17 +60,33 @@ TEST_F(JsonLinesPowerLogTest, keepsTwoGenerations) {
   EXPECT_EQ(eventsAfter(1, 2), " 12 ");
   EXPECT_EQ(eventsAfter(3, 5), "34 5 ");
   EXPECT_EQ(eventsAfter(6, 7), "56 7 ");
+  // Somebody takes the file away while it is written: the next record makes a new one.
+  JsonLinesPowerLog log(path, clock, 1000);
+  log.registeredEvent(8, "s", {});
+  std::filesystem::rename(path, directory / "moved");
+  log.registeredEvent(9, "s", {{"more than a generation holds", std::string(1000, 'f')}});
+  log.registeredEvent(9, "s", {});
+  EXPECT_EQ(lines("moved").size(), 2U);
+  EXPECT_EQ(lines().size(), 1U);
 }
 
 TEST_F(JsonLinesPowerLogTest, saysOnceThatRecordsAreLost) {
   std::filesystem::create_directory(path);
-  const orvanta::test::LogCapture captured;
+  orvanta::test::LogCapture captured;
   JsonLinesPowerLog log(path, clock);
   for (int round = 0; round < 3; ++round) log.registeredEvent(1, "s", {});
   EXPECT_THAT(captured.lines(), ElementsAre("<4>registeredEvent: cannot write to " + path + ": Is a directory"));
   std::filesystem::remove(path);
   log.registeredEvent(2, "s", {});
   EXPECT_EQ(lines().size(), 1);
+  // Nor does a FIFO, with a reader or without, hold up those who write.
+  std::filesystem::remove(path);
+  ASSERT_EQ(::mkfifo(path.c_str(), 0600), 0);
+  log.registeredEvent(3, "s", {});
+  const UniqueFd reader(::open(path.c_str(), O_RDONLY | O_NONBLOCK));
+  captured.clear();
+  JsonLinesPowerLog(path, clock).registeredEvent(3, "s", {});
+  EXPECT_THAT(captured.lines(), ElementsAre("<4>registeredEvent: cannot write to " + path + ": Invalid argument"));
 }
 
 TEST_F(JsonLinesPowerLogTest, followsNoLink) {
