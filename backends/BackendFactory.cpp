@@ -55,7 +55,8 @@ std::shared_ptr<OrvantaBackend> newBackendWithName(platform::Platform& platform,
   for (const BackendClass& row : kBackendClasses) {
     if (row.name != name) continue;
     if (row.isSupported != nullptr && !row.isSupported(platform)) break;
-    return row.create({platform, name, profile, productFamily, clientType});
+    if (auto backend = row.create({platform, name, profile, productFamily, clientType})) return backend;
+    break;
   }
   ORVANTA_LOG(error, "OrvantaBackend(newBackendWithName): {}", name);
   return nullptr;

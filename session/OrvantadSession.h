@@ -95,6 +95,8 @@ class OrvantadSession final : public ClientSessionInterface, public std::enable_
 
   // Setup.
   void createBackendsWithStorebag(const SharedDictionary& storebag);
+  // Lets go of the earlier ones.
+  void replaceBackends(std::optional<BackendSet> backends);
   void sendStartMessage();
   void receivedUserInfo(SharedDictionary userInfo);
   void updateUserInfoForBackends();

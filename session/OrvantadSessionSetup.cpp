@@ -59,6 +59,7 @@ void OrvantadSession::startConfigWithCompletionHandler(BackendNamesReply complet
   ORVANTA_LOG(debug, "startConfigWithCompletionHandler: Starting configuration for session {}", _sessionID);
   const SharedDictionary storebag = _delegate.storebagForSession(*this);
   if (!storebag) {
+    replaceBackends(std::nullopt);
     completion(std::nullopt);
     return;
   }
@@ -75,6 +76,10 @@ void OrvantadSession::createBackendsWithStorebag(const SharedDictionary& storeba
   if (backends) {
     for (const auto& [key, backend] : *backends) backend->setCombinedSessionIDString(_sessionIDString);
   }
+  replaceBackends(std::move(backends));
+}
+
+void OrvantadSession::replaceBackends(std::optional<BackendSet> backends) {
   {
     const auto lock = lockSharedFields();
     _backends.swap(backends);
