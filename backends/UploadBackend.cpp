@@ -12,6 +12,9 @@ namespace orvanta {
 
 namespace {
 
+// Files of /proc and /sys do not tell their size. So much of one is read.
+constexpr std::uint64_t kUnsizedBytes = 1U << 20U;
+
 std::optional<std::string> textAt(const SharedDictionary& dictionary, std::string_view key) {
   const platform::Value* value = dictionary ? dictionary->find(key) : nullptr;
   const std::string* text = value == nullptr ? nullptr : value->string();
@@ -77,16 +80,17 @@ bool UploadBackend::uploadFileAtPath(const UploadFile& file) {
     return false;
   }
 
+  const std::uint64_t expected = *size > 0 ? *size : kUnsizedBytes;
   std::unique_ptr<UploadBudget::Share> share;
   {
     const platform::BlockingScope waitingForOthers;
-    share = UploadBudget::Share::take(UploadBudget::of(platform()), UploadBudget::kCopies * *size);
+    share = UploadBudget::Share::take(UploadBudget::of(platform()), UploadBudget::kCopies * expected);
   }
   if (!share) {
     ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): The daemon is ending.");
     return false;
   }
-  std::optional<std::string> body = compressedContent(handle, *size);
+  std::optional<std::string> body = compressedContent(handle, expected);
   if (!body) return false;
   share->shrinkTo(body->size());
 
