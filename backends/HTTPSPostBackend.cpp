@@ -10,6 +10,7 @@
 #include "util/Environment.h"
 #include "util/Orvanta.h"
 #include "util/Storebag.h"
+#include "util/UserDefaultKeys.h"
 
 namespace orvanta {
 namespace {
@@ -33,7 +34,7 @@ void completeWithError(FlushCompletion& completion, const char* description) {
 }
 
 bool forcesEventLogging(platform::Platform& platform) {
-  const auto text = userDefaultStringForKey(platform, "forceEventLogging");
+  const auto text = userDefaultStringForKey(platform, kForceEventLoggingKey);
   return text && platform::Value(*text).boolValue();
 }
 
@@ -57,8 +58,8 @@ HTTPSPostBackend::HTTPSPostBackend(platform::Platform& platform, std::string nam
       _forceEventLogging(forcesEventLogging(platform)),
       _clientIdentity{Orvanta::of(platform).getPersistentIdentifierForDNU(true),
                       Orvanta::of(platform).getPersistentIdentifierForDNU(false)},
-      _realtimePostURL(userDefaultStringForKey(platform, "httpsRealtimePostURL")),
-      _postURL(userDefaultStringForKey(platform, "httpsPostURL")) {
+      _realtimePostURL(userDefaultStringForKey(platform, kRealtimePostURLKey)),
+      _postURL(userDefaultStringForKey(platform, kPostURLKey)) {
   if (_postURL) {
     _useDefaultPostURL = true;
     ORVANTA_LOG(debug, "HTTPSPostBackend(initWithName): Using user default '{}' for postURL", *_postURL);
@@ -152,7 +153,9 @@ std::optional<std::string> HTTPSPostBackend::batchEvent(PreparedEvent event) {
   };
   look();
   const bool reached = count > _eventThreshold;
-  const bool tooLarge = waitingBytes != 0 && waitingBytes + footprint > kMaximumBatchBytes;
+  // Held back events cannot be flushed; what that costs them is told below.
+  const bool tooLarge =
+      waitingBytes != 0 && waitingBytes + footprint > kMaximumBatchBytes && state() == kBackendEnabled;
   std::optional<std::string> flushed;
   if (reached || tooLarge) {
     if (reached) {

@@ -3,13 +3,38 @@
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/Entitlements.h"
+#include "platform/NearestWord.h"
 #include "util/Orvanta.h"
+#include "util/UserDefaultKeys.h"
 
 namespace orvanta {
 
+namespace {
+
+void warnOfUnknownUserDefaults(platform::Platform& platform) {
+  static constexpr std::string_view kKeys[] = {kStorebagURLKey,     kEnvironmentTypeKey,   kPostURLKey,
+                                               kRealtimePostURLKey, kForceEventLoggingKey, kRespectConsentKey,
+                                               kOverrideConsentKey};
+  const std::string identifiers = std::string(kIdentifierPrefix) + ":";
+  platform::Dictionary settings;
+  for (auto& [key, value] : platform.defaults().all()) {
+    if (key.rfind(identifiers, 0) != 0) settings.set(key, true);
+  }
+  if (const std::string unknown = platform::describeUnknownKeys(settings, kKeys); !unknown.empty()) {
+    ORVANTA_LOG(warning, "main: {} in {}", unknown, platform.defaults().path());
+  }
+}
+
+}  // namespace
+
 void warnOfUselessConfiguration(platform::Platform& platform) {
-  // Whoever reads a file logs the keys in it that nothing reads: these two read theirs here.
+  // Whoever reads a file logs the keys in it that nothing reads: the device and the framework read theirs here.
   platform.device().productVersion();
+  warnOfUnknownUserDefaults(platform);
+  if (!platform.device().deviceName()) {
+    ORVANTA_LOG(warning, "main: The device has no \"DeviceName\" in {}/device.plist, no session will report by https",
+                platform.files().configurationDirectory);
+  }
   if (const auto key = Orvanta::of(platform).readPublicKey(); !key) {
     ORVANTA_LOG(warning, "main: The framework bundle has no usable verification key, no storebag will be accepted: {}",
                 key.error());

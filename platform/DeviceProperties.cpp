@@ -9,6 +9,8 @@
 #include <string_view>
 #include <vector>
 
+#include <fmt/format.h>
+
 #include "platform/FileStamp.h"
 #include "platform/Log.h"
 #include "platform/NearestWord.h"
@@ -33,20 +35,20 @@ bool contains(const std::array<std::string_view, Count>& keys, std::string_view 
   return std::find(keys.begin(), keys.end(), key) != keys.end();
 }
 
-// What of a device.plist makes sense. A misspelt key or a wrong type would else look like a setting that has no effect.
-Dictionary understood(const Dictionary& content, const std::string& path) {
+// What of a device.plist makes sense, with remarks on the rest: a misspelt key or a wrong type would else look like a
+// setting that has no effect.
+Dictionary understood(const Dictionary& content, const std::string& path, std::vector<std::string>& remarks) {
   Dictionary result;
   for (const auto& [key, value] : content) {
     if (contains(kTextKeys, key) ? value.string() != nullptr : contains(kBooleanKeys, key) && value.isBool()) {
       result.set(key, value);
     } else if (contains(kTextKeys, key) || contains(kBooleanKeys, key)) {
-      PLATFORM_LOG(warning, "DeviceProperties: {} is not a {} in {} and does not count", key,
-                   contains(kTextKeys, key) ? "string" : "boolean", path);
+      remarks.push_back(fmt::format("{} is not a {} in {} and does not count", key,
+                                    contains(kTextKeys, key) ? "string" : "boolean", path));
     } else {
       std::vector<std::string_view> known(kTextKeys.begin(), kTextKeys.end());
       known.insert(known.end(), kBooleanKeys.begin(), kBooleanKeys.end());
-      PLATFORM_LOG(warning, "DeviceProperties: unknown key {} in {}, did you mean {}?", key, path,
-                   nearestWord(key, known));
+      remarks.push_back(fmt::format("unknown key {} in {}, did you mean {}?", key, path, nearestWord(key, known)));
     }
   }
   return result;
@@ -80,9 +82,10 @@ struct LinuxDeviceProperties::State {
   void reject(const FileStamp& stamp, const std::string& problem);
 
   std::mutex _mutex;
-  Dictionary _content;   // guarded by _mutex
-  FileStamp _stamp;      // guarded by _mutex: of the file that _content came from
-  std::string _problem;  // guarded by _mutex: the last one logged, until the file reads well again
+  Dictionary _content;                // guarded by _mutex
+  FileStamp _stamp;                   // guarded by _mutex: of the file that _content came from
+  std::string _problem;               // guarded by _mutex: the last one logged, until the file reads well again
+  std::vector<std::string> _remarks;  // guarded by _mutex: on what the file last held, logged
 };
 
 const Dictionary& LinuxDeviceProperties::State::current() {
@@ -100,7 +103,14 @@ const Dictionary& LinuxDeviceProperties::State::current() {
       reject(file->stamp, path + " counts as empty: " + (parsed ? "it is not a dictionary" : parsed.error()));
       return _content;
     }
-    _content = understood(*parsed->dictionary(), path);
+    std::vector<std::string> remarks;
+    _content = understood(*parsed->dictionary(), path, remarks);
+    for (const std::string& remark : remarks) {
+      if (std::find(_remarks.begin(), _remarks.end(), remark) == _remarks.end()) {
+        PLATFORM_LOG(warning, "DeviceProperties: {}", remark);
+      }
+    }
+    _remarks = std::move(remarks);
   }
   _stamp = file->stamp;
   _problem.clear();

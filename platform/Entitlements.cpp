@@ -80,7 +80,7 @@ Result<Grant> readGrant(const Value& file, const PeerIdentity* peer) {
   const Dictionary* const content = file.dictionary();
   if (content == nullptr) return Failure{"it holds no dictionary"};
   static constexpr std::string_view kKeys[] = {"user", "group", "label", "entitlements"};
-  if (std::string unknown = describeUnknownKey(*content, kKeys); !unknown.empty()) return Failure{std::move(unknown)};
+  if (std::string unknown = describeUnknownKeys(*content, kKeys); !unknown.empty()) return Failure{std::move(unknown)};
   Grant grant;
   int subjects = 0;
   for (const auto& [key, value] : *content) {
@@ -154,6 +154,10 @@ bool Entitlements::isGranted(const PeerIdentity* peer, std::string_view entitlem
     const Result<Grant> grant = readGrant(*file, peer);
     tell(path, grant ? std::string() : path + " grants nothing: " + grant.error());
     if (!grant || !grant->matches) continue;
+    if (peer == nullptr) {
+      const std::string unknown = describeUnknownKeys(*grant->entitlements, {&entitlement, 1});
+      if (!unknown.empty()) PLATFORM_LOG(warning, "Entitlements: {} in {}", unknown, path);
+    }
     const Value* const value = grant->entitlements->find(entitlement);
     held = held || (value != nullptr && value->booleanReading().value_or(false));
   }

@@ -23,7 +23,8 @@ class Entitlements {
 
   // True when any grant that matches the peer gives `entitlement` a value that reads as true.
   bool holds(const PeerIdentity& peer, std::string_view entitlement);
-  // True when there is anybody at all for whom that is so.
+  // True when there is anybody at all for whom that is so. Logs, as a warning, what else is granted: nothing asks for
+  // it.
   bool isHeldByAnybody(std::string_view entitlement);
 
  private:

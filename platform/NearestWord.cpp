@@ -37,12 +37,14 @@ std::string_view nearestWord(std::string_view word, std::span<const std::string_
   });
 }
 
-std::string describeUnknownKey(const Dictionary& dictionary, std::span<const std::string_view> known) {
+std::string describeUnknownKeys(const Dictionary& dictionary, std::span<const std::string_view> known) {
+  std::string text;
   for (const auto& [key, value] : dictionary) {
     if (std::find(known.begin(), known.end(), key) != known.end()) continue;
-    return fmt::format("unknown key \"{}\", did you mean \"{}\"?", key, nearestWord(key, known));
+    if (!text.empty()) text += "; ";
+    text += fmt::format("unknown key \"{}\", did you mean \"{}\"?", key, nearestWord(key, known));
   }
-  return {};
+  return text;
 }
 
 }  // namespace platform

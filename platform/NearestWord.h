@@ -11,8 +11,8 @@ namespace platform {
 // The one of `known` (at least one) that takes the fewest changes to become `word`: what was probably meant.
 std::string_view nearestWord(std::string_view word, std::span<const std::string_view> known);
 
-// The first key of `dictionary` that is not among `known`, as `unknown key "acess", did you mean "access"?`; empty when
-// all are known.
-std::string describeUnknownKey(const Dictionary& dictionary, std::span<const std::string_view> known);
+// The keys of `dictionary` that are not among `known`, as `unknown key "acess", did you mean "access"?`; empty when all
+// are known.
+std::string describeUnknownKeys(const Dictionary& dictionary, std::span<const std::string_view> known);
 
 }  // namespace platform

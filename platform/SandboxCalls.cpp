@@ -141,7 +141,7 @@ class Reader {
     const Dictionary* const entry = value.dictionary();
     if (entry == nullptr) return Failure{place + " must be a dictionary"};
     static constexpr std::string_view kKeys[] = {"call", "argument", "bits", "is"};
-    if (const std::string unknown = describeUnknownKey(*entry, kKeys); !unknown.empty()) {
+    if (const std::string unknown = describeUnknownKeys(*entry, kKeys); !unknown.empty()) {
       return Failure{place + ": " + unknown};
     }
     const Value* const name = entry->find("call");
@@ -180,7 +180,7 @@ Result<SandboxCalls> SandboxCalls::fromPropertyList(const Value& section) {
   const Dictionary* const content = section.dictionary();
   if (content == nullptr) return Failure{"\"calls\" must be a dictionary"};
   static constexpr std::string_view kKeys[] = {"allow", "allowWith", "untilStarted", "refuse", "end"};
-  if (const std::string unknown = describeUnknownKey(*content, kKeys); !unknown.empty()) {
+  if (const std::string unknown = describeUnknownKeys(*content, kKeys); !unknown.empty()) {
     return Failure{"calls: " + unknown};
   }
   SandboxCalls calls;

@@ -78,7 +78,7 @@ Result<SandboxProfile::FileRule> readFileRule(const Value& value, const std::str
   const Dictionary* entry = value.dictionary();
   if (entry == nullptr) return Failure{place + " must be a dictionary"};
   static constexpr std::string_view kKeys[] = {"paths", "directoriesOf", "access", "optional"};
-  if (const std::string unknown = describeUnknownKey(*entry, kKeys); !unknown.empty()) {
+  if (const std::string unknown = describeUnknownKeys(*entry, kKeys); !unknown.empty()) {
     return Failure{place + ": " + unknown};
   }
   SandboxProfile::FileRule rule;
@@ -107,7 +107,7 @@ Result<SandboxProfile> SandboxProfile::fromPropertyList(const Value& document) {
   const Dictionary* content = document.dictionary();
   if (content == nullptr) return Failure{"a profile must be a dictionary"};
   static constexpr std::string_view kKeys[] = {"version", "files", "calls", "landlockABI"};
-  if (const std::string unknown = describeUnknownKey(*content, kKeys); !unknown.empty()) {
+  if (const std::string unknown = describeUnknownKeys(*content, kKeys); !unknown.empty()) {
     return Failure{"the profile: " + unknown};
   }
   const Value* version = content->find("version");

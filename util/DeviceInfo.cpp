@@ -5,6 +5,7 @@
 
 #include "interface/OrvantaLogging.h"
 #include "platform/Digest.h"
+#include "util/UserDefaultKeys.h"
 
 namespace orvanta {
 
@@ -44,7 +45,8 @@ bool isInternalBuild(platform::Platform& platform) {
 std::string getPersistentIdentifierForCustomClientIDSuffix(platform::Platform& platform,
                                                            const std::optional<std::string>& first,
                                                            const std::optional<std::string>& second) {
-  const std::string key = "uuid:" + first.value_or("") + ":" + second.value_or("");
+  std::string key(kIdentifierPrefix);
+  key.append(":").append(first.value_or("")).append(":").append(second.value_or(""));
   platform::Value value =
       platform.defaults().valueOrStore(key, [] { return platform::Value(platform::uuidText(platform::randomUuid())); });
   std::string identifier = value.string() != nullptr ? std::move(*value.string()) : value.description();

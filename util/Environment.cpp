@@ -2,6 +2,7 @@
 
 #include "interface/OrvantaLogging.h"
 #include "util/DeviceInfo.h"
+#include "util/UserDefaultKeys.h"
 
 namespace orvanta {
 
@@ -15,7 +16,7 @@ struct Environment {
 
 EnvironmentType userDefaultsEnvironment(platform::Platform& platform) {
   EnvironmentType type = EnvironmentType::none;
-  if (const auto setting = platform.defaults().value("environmentType")) {
+  if (const auto setting = platform.defaults().value(kEnvironmentTypeKey)) {
     const std::int64_t number = setting->integerValue();
     if (number >= 0 && number < kEnvironmentTypeCount) {
       type = static_cast<EnvironmentType>(number);

@@ -14,14 +14,13 @@
 #include "platform/NearestWord.h"
 #include "platform/PropertyList.h"
 #include "platform/UniqueFd.h"
+#include "util/UserDefaultKeys.h"
 
 namespace orvanta {
 
 namespace {
 
 constexpr const char* kVersionWithoutBundle = "8.0";
-constexpr const char* kRespectConsentKey = "uuid-respect-dnu";
-constexpr const char* kOverrideConsentKey = "uuid-override-dnu";
 constexpr std::size_t kLargestKeyFile = 64U << 10U;  // a 16,384-bit key takes 2 KiB
 
 // Not the object itself, which cannot be moved into the platform's keeping.
@@ -43,7 +42,7 @@ std::string readVersion(const std::string& frameworkDirectory) {
     return kVersionWithoutBundle;
   }
   static constexpr std::string_view kKeys[] = {"version"};
-  if (const std::string unknown = platform::describeUnknownKey(*content, kKeys); !unknown.empty()) {
+  if (const std::string unknown = platform::describeUnknownKeys(*content, kKeys); !unknown.empty()) {
     ORVANTA_LOG(warning, "bundleVersion: {} in {}", unknown, path);
   }
   const platform::Value* version = content->find("version");

@@ -13,6 +13,7 @@
 #include "util/DeviceInfo.h"
 #include "util/Environment.h"
 #include "util/Orvanta.h"
+#include "util/UserDefaultKeys.h"
 
 namespace orvanta {
 
@@ -23,7 +24,6 @@ using platform::Value;
 
 namespace {
 
-constexpr const char* kServerOverrideKey = "orvanta_storebag_url";
 constexpr const char* kInternalServer = "https://internal-bags.kovalt.com/storebags/tamrel";
 constexpr const char* kPublicServer = "https://bags.kovalt.com/bags/tamrel";
 constexpr std::chrono::seconds kRequestTimeout{15};
@@ -107,7 +107,7 @@ std::optional<std::string> userDefaultStringForKey(platform::Platform& platform,
 const std::string& storebagServerURL(platform::Platform& platform) {
   return platform
       .once<StorebagServer>([&] {
-        auto url = userDefaultStringForKey(platform, kServerOverrideKey);
+        auto url = userDefaultStringForKey(platform, kStorebagURLKey);
         if (!url) url = isInternalBuild(platform) ? kInternalServer : kPublicServer;
         return StorebagServer{std::move(*url)};
       })

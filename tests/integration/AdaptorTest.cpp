@@ -7,6 +7,7 @@
 #include <sstream>
 
 #include "platform/Connect.h"
+#include "platform/UserDefaults.h"
 #include "tests/integration/IntegrationFixture.h"
 #include "tests/support/ServiceManager.h"
 
@@ -137,6 +138,10 @@ TEST_F(AdaptorTest, AConfigurationThatIsOfNoUseIsToldOnceAtTheStart) {
   fs::create_directory(daemon->configurationDirectory() + "/entitlements.d");
   std::ofstream(daemon->configurationDirectory() + "/entitlements.d/a.plist")
       << "<plist><dict><key>usr</key><string>root</string></dict></plist>";
+  std::ofstream(daemon->configurationDirectory() + "/entitlements.d/b.plist")
+      << "<plist><dict><key>user</key><integer>0</integer><key>entitlements</key><dict>"
+         "<key>com.kovalt.private.orvantd</key><true/></dict></dict></plist>";
+  platform::UserDefaults(daemon->stateDirectory(), "com.kovalt.orvanta").set("environment", 1);
   ASSERT_TRUE(daemon->start());
   for (int i = 0; i < 3; ++i) platform::connectToService(daemon->runtimeDirectory(), "com.kovalt.orvantad");
   ASSERT_TRUE(daemon->logged("does not have required orvanta entitlement", 3));
@@ -147,11 +152,14 @@ TEST_F(AdaptorTest, AConfigurationThatIsOfNoUseIsToldOnceAtTheStart) {
            "<4>main: The framework bundle has no usable verification key, no storebag will be accepted: ",
            "/publicKey.der holds no RSA public key",
            "/etc/entitlements.d/a.plist grants nothing: unknown key \"usr\", did you mean \"user\"?",
+           "<4>Entitlements: unknown key \"com.kovalt.private.orvantd\", did you mean \"com.kovalt.private.orvantad\"? "
+           "in ",
+           "<4>main: unknown key \"environment\", did you mean \"environmentType\"? in ",
            "<4>main: The entitlement com.kovalt.private.orvantad is granted to nobody in ",
        }) {
     EXPECT_EQ(daemon->count(line), 1U) << line;
   }
-  EXPECT_EQ(daemon->count("<4>"), 5U) << daemon->process().allLines();
+  EXPECT_EQ(daemon->count("<4>"), 7U) << daemon->process().allLines();
 }
 
 }  // namespace
