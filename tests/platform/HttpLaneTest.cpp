@@ -44,8 +44,7 @@ TEST_F(HttpLaneTest, ALaneKeepsItsOrderToTheLastCompletion) {
   using Order = std::map<char, std::vector<std::string>>;  // by lane
   std::mutex mutex;
   Order completed, arrived, expected;
-  int left = kLanes * kRequests;
-  std::promise<void> done;
+  Counter ended;
   std::map<char, std::shared_ptr<HttpLane>> lanes;
   for (int i = 0; i < kLanes * kRequests; ++i) {
     const std::string path = "/" + std::to_string(i % kLanes) + "/" + std::to_string(i);
@@ -54,13 +53,15 @@ TEST_F(HttpLaneTest, ALaneKeepsItsOrderToTheLastCompletion) {
     if (!lane) lane = client().makeLane();
     client().start(lane, post(server.url(path)), {}, [&, path](HttpResult) {
       if (path == "/0/0") server.waitForRequests(kLanes * kRequests);  // none of its lane overtakes it meanwhile
-      const std::lock_guard lock(mutex);
-      completed[path[1]].push_back(path);
-      if (--left == 0) done.set_value();
+      {
+        const std::lock_guard lock(mutex);
+        completed[path[1]].push_back(path);
+      }
+      ended.add();
     });
   }
   lanes.clear();  // nobody holds them any more
-  ASSERT_EQ(done.get_future().wait_for(std::chrono::seconds(30)), std::future_status::ready);
+  ended.waitFor(kLanes * kRequests);
   for (const std::string& path : paths(server)) arrived[path[1]].push_back(path);
   EXPECT_EQ(arrived, expected);
   EXPECT_EQ(completed, expected);
@@ -100,10 +101,11 @@ TEST_F(HttpLaneTest, AFailureLetsTheNextGo) {
   EXPECT_EQ(statusOf(await(good)), 500);
 }
 
-TEST_F(HttpLaneTest, TheObserverComesFirstOnAThreadOfTheClient) {
+// Of what is refused at once the caller's thread tells the observer.
+TEST_F(HttpLaneTest, TheObserverComesFirstAndTheCompletionOnThePool) {
   RawServer server(answering("503 Off"));
-  for (const std::string& url : {server.url(), std::string("http://127.0.0.1:1/")}) {
-    std::atomic<bool> observed{false};
+  for (const std::string& url : {server.url(), std::string("http://127.0.0.1:1/"), std::string("ftp://127.0.0.1/")}) {
+    const bool refused = url.starts_with("ftp");
     std::thread::id observer;
     std::promise<std::thread::id> completer;
     client().start(
@@ -111,32 +113,18 @@ TEST_F(HttpLaneTest, TheObserverComesFirstOnAThreadOfTheClient) {
         [&](const HttpResult& result) {
           EXPECT_EQ(result.response.has_value(), result.error.empty());
           observer = std::this_thread::get_id();
-          observed = true;
           return true;
         },
-        [&](HttpResult) {
-          EXPECT_TRUE(observed);
+        [&](HttpResult result) {
+          EXPECT_NE(observer, std::thread::id());
+          EXPECT_EQ(has(result.error, "neither http nor https"), refused);
           completer.set_value(std::this_thread::get_id());
         });
     auto future = completer.get_future();
     ASSERT_EQ(future.wait_for(std::chrono::seconds(30)), std::future_status::ready);
     EXPECT_NE(future.get(), observer);
-    EXPECT_NE(observer, std::this_thread::get_id());
+    EXPECT_EQ(observer == std::this_thread::get_id(), refused);
   }
-}
-
-TEST_F(HttpLaneTest, ARefusalIsObservedAtOnceAndCompletesOnThePool) {
-  std::thread::id observer;
-  std::promise<std::string> error;
-  client().start(
-      client().makeLane(), post("ftp://127.0.0.1/"),
-      [&](const HttpResult&) {
-        observer = std::this_thread::get_id();
-        return true;
-      },
-      [&](HttpResult result) { error.set_value(result.error); });
-  EXPECT_EQ(observer, std::this_thread::get_id());
-  EXPECT_TRUE(has(error.get_future().get(), "neither http nor https"));
 }
 
 TEST_F(HttpLaneTest, LimitsOnWaitingBytes) {
@@ -204,16 +192,18 @@ TEST_F(HttpLaneTest, TimeSpentWaitingInTheLaneCounts) {
 TEST_F(HttpLaneTest, BlockedCallersLeaveThePoolAlive) {
   Counter gate;
   RawServer server(holding(gate));
-  std::promise<HttpResult> results[4];
-  for (auto& result : results) _pool.post([&] { result.set_value(perform(get(server.url("/held")))); });
+  Counter answered;
+  for (int i = 0; i < 4; ++i) {
+    _pool.post([&] {
+      EXPECT_EQ(statusOf(perform(get(server.url("/held")))), 200);
+      answered.add();
+    });
+  }
   ASSERT_TRUE(server.waitForRequests(4));
   auto opener = start(client().makeLane(), post(server.url("/free")));
   EXPECT_EQ(statusOf(await(opener)), 200);
   gate.add();
-  for (auto& result : results) {
-    auto future = result.get_future();
-    EXPECT_EQ(statusOf(await(future)), 200);
-  }
+  answered.waitFor(4);
 }
 
 // How often each thread called "http" has been given up or taken off a processor.

@@ -76,7 +76,7 @@ TEST_F(HttpRedirectTest, GetsAreFollowedAndPostsRepeatedWhole) {
 }
 
 // Each answer sends one step further: /5 -> /4 -> ... -> /0.
-TEST_F(HttpRedirectTest, FiveAreFollowedAndNoMore) {
+TEST_F(HttpRedirectTest, FiveAreFollowedAndNoMoreAndNoOtherProtocol) {
   RawServer chain([](RawConnection& connection) {
     while (const auto request = connection.readRequest()) {
       const int left = request->at(5) - '0';
@@ -86,16 +86,8 @@ TEST_F(HttpRedirectTest, FiveAreFollowedAndNoMore) {
   EXPECT_EQ(statusOf(perform(get(chain.url("/5")))), 200);
   EXPECT_EQ(perform(get(chain.url("/6"))).error, "More than 5 redirects");
   EXPECT_EQ(chain.requests().size(), 12U);
-}
-
-TEST_F(HttpRedirectTest, OtherProtocolsAndNothingAreErrors) {
-  const std::pair<const char*, const char*> rows[] = {{"ftp://127.0.0.1/x", "neither http nor https"},
-                                                      {"file:///etc/passwd", "neither http nor https"},
-                                                      {"http://127.0.0.1:1/", "connect"}};
-  for (const auto& [target, error] : rows) {
-    RawServer first(RawServer::answering(redirect(302, target)));
-    expectError(perform(get(first.url())), error);
-  }
+  RawServer elsewhere(RawServer::answering(redirect(302, "file:///etc/passwd")));
+  expectError(perform(get(elsewhere.url())), "neither http nor https");
 }
 
 }  // namespace
