@@ -17,7 +17,6 @@
 #include <ctime>
 #include <filesystem>
 #include <functional>
-#include <thread>
 
 #include "platform/Landlock.h"
 #include "platform/PropertyList.h"
@@ -30,7 +29,6 @@ namespace {
 
 namespace fs = std::filesystem;
 using namespace orvanta::test;
-using Variables = std::map<std::string, std::string>;
 
 constexpr const char* kProfile = "com.kovalt.test";
 constexpr const char* kFile = "profiles/com.kovalt.test.plist";
@@ -165,8 +163,7 @@ TEST_F(SandboxTest, saysWhatWasEnteredAndWhatIsNotThere) {
   writeUsualProfile();
   EXPECT_THAT(inChild([&] { return enter().value()->description(); }),
               testing::MatchesRegex("sandbox profile com.kovalt.test: 2 file rules, Landlock ABI [0-9]+, [0-9]+ system "
-                                    "calls, not present: "
-                                    "\\$.ABSENT. /no/such/directory"));
+                                    "calls, not present: \\$.ABSENT. /no/such/directory"));
   EXPECT_EQ(entered([] { return std::to_string(::prctl(PR_GET_NO_NEW_PRIVS, 0, 0, 0, 0)); }), "1");
 }
 
@@ -183,29 +180,16 @@ TEST_F(SandboxTest, holdsForProcessesThatComeLaterAndNotForDescriptorsFromBefore
 }
 
 TEST_F(SandboxTest, aFilesRealDirectoryIsOpenedSoThatItsReplacementIsReadable) {
-  directory.write("real/resolv.conf", "old");
+  const std::string file = directory.write("real/resolv.conf", "old"), fresh = directory.write("real/fresh", "new");
   fs::create_directory(directory / "etc");
-  fs::create_symlink(directory / "real/resolv.conf", directory / "etc/resolv.conf");
-  writeProfile({Dictionary{{"directoriesOf", Array{directory / "etc/resolv.conf"}}, {"access", Array{"read"}}}});
-  // The child tells when it has entered; the file is then replaced by renaming before the child reads it.
-  int ends[2];
-  ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM, 0, ends), 0);
-  const UniqueFd ours(ends[0]);
-  const UniqueFd theirs(ends[1]);
-  const pid_t child = ::fork();
-  char byte = 0;
-  if (child == 0) {
-    byte = enter() ? 'e' : 'f';
-    if (::write(theirs.get(), &byte, 1) != 1 || ::read(theirs.get(), &byte, 1) != 1) ::_exit(2);
-    ::_exit(opening(directory / "etc/resolv.conf", O_RDONLY) == "done" ? 0 : 1);
-  }
-  ASSERT_EQ(::read(ours.get(), &byte, 1), 1);
-  EXPECT_EQ(byte, 'e');
-  fs::rename(directory.write("real/fresh", "new"), directory / "real/resolv.conf");
-  ASSERT_EQ(::write(ours.get(), "g", 1), 1);
-  int status = 0;
-  ::waitpid(child, &status, 0);
-  EXPECT_EQ(status, 0);
+  fs::create_symlink(file, directory / "etc/resolv.conf");
+  const Array access{"read", "create", "remove"};
+  writeProfile({Dictionary{{"directoriesOf", Array{directory / "etc/resolv.conf"}}, {"access", access}}});
+  EXPECT_EQ(entered([&] {
+              fs::rename(fresh, file);
+              return opening(directory / "etc/resolv.conf", O_RDONLY);
+            }),
+            "done");
 }
 
 TEST_F(SandboxTest, failsWithTheStepAndTheReason) {
@@ -213,8 +197,6 @@ TEST_F(SandboxTest, failsWithTheStepAndTheReason) {
   const auto failure = [&] { return entered([] { return "entered"; }); };
   EXPECT_THAT(failure(), testing::AllOf(testing::StartsWith(start), testing::HasSubstr(kFile),
                                         testing::HasSubstr("No such file or directory")));
-  directory.write(kFile, "<plist><dict><key>");
-  EXPECT_THAT(failure(), testing::AllOf(testing::StartsWith(start), testing::HasSubstr(kFile)));
   writeProfile({Dictionary{{"paths", Array{"/"}}, {"acess", Array{"read"}}}});
   EXPECT_EQ(failure(),
             "sandbox profile " + directory / kFile + ": files[0]: unknown key \"acess\", did you mean \"access\"?");
@@ -239,27 +221,24 @@ TEST_F(SandboxTest, failsWithTheStepAndTheReason) {
   }
 }
 
-// The profile as it is shipped, for a daemon whose directories are below the test's.
+// The profile as it is shipped, for a daemon whose directories are below the test's. What it forbids is tried inside
+// the real daemon.
 class ShippedSandboxTest : public SandboxTest {
  protected:
   void SetUp() override {
     SandboxTest::SetUp();
-    for (const char* name : {"run", "state", "share"}) fs::create_directory(directory / name);
-    directory.write("etc/device.plist", "x");
-    writeShippedProfile(Landlock::kAnyAbi);
-  }
-  void writeShippedProfile(int abi) {
-    Dictionary profile = shippedProfile();
-    profile.set("landlockABI", abi);
-    directory.write(kFile, *writeXmlPropertyList(profile));
+    for (const char* name : {"run", "state", "etc", "share"}) fs::create_directory(directory / name);
+    directory.write(kFile, *writeXmlPropertyList(shippedProfile()));
   }
   std::string work(const std::function<std::string()>& body) const {
-    const Variables variables = {
-        {"RUNTIME_DIRECTORY", directory / "run"},       {"STATE_DIRECTORY", directory / "state"},
-        {"CONFIGURATION_DIRECTORY", directory / "etc"}, {"ORVANTA_FRAMEWORK", directory / "share"},
-        {"ORVANTA_PLUGINS", directory / "PlugIns"},     {"ORVANTA_CA_DIRECTORY", ""}};
     return inChild([&] {
-      const auto sandbox = Sandbox::enter(directory / "profiles", kProfile, variables);
+      const auto sandbox = Sandbox::enter(directory / "profiles", kProfile,
+                                          {{"RUNTIME_DIRECTORY", directory / "run"},
+                                           {"STATE_DIRECTORY", directory / "state"},
+                                           {"CONFIGURATION_DIRECTORY", directory / "etc"},
+                                           {"ORVANTA_FRAMEWORK", directory / "share"},
+                                           {"ORVANTA_PLUGINS", directory / "PlugIns"},
+                                           {"ORVANTA_CA_DIRECTORY", ""}});
       if (!sandbox) return sandbox.error();
       const auto started = (*sandbox)->started();
       return started ? body() : started.error();
@@ -287,24 +266,6 @@ TEST_F(ShippedSandboxTest, letsTheDaemonWork) {
               return failed;
             }),
             "");
-}
-
-// Whoever the daemon runs as, on every thread, whatever this kernel's Landlock leaves to the system calls' filter.
-TEST_F(ShippedSandboxTest, nothingForbiddenWorks) {
-  for (const int abi : {Landlock::kAnyAbi, 2}) {
-    writeShippedProfile(abi);
-    for (const ForbiddenAct& act : kForbiddenActs) {
-      const auto attempt = [&] { return act.attempt(directory / "etc/device.plist", directory / "closed"); };
-      const char* const expected = act.result == nullptr ? "Bad system call" : act.result;
-      const auto attemptLater = [&] {
-        std::string result;
-        std::thread([&] { result = attempt(); }).join();
-        return result;
-      };
-      EXPECT_EQ(work(attempt), expected) << act.name << ", on the first thread";
-      EXPECT_EQ(work(attemptLater), expected) << act.name << ", on a later thread";
-    }
-  }
 }
 
 TEST_F(ShippedSandboxTest, tcpPortsCannotBeBoundWhereTheKernelKnowsHow) {
