@@ -76,19 +76,6 @@ TEST(WorkPoolTest, DrainWaitsForTheJobsOfEveryQueueToEnd) {
 
 // What jobs own may post when it goes, and holds queues of both kinds.
 TEST(ComputeQueueTest, DropsWhatHasNotBegunWhenThePoolStops) {
-  struct PostsWhenDropped {
-    explicit PostsWhenDropped(std::shared_ptr<ComputeQueue> computeQueue, std::shared_ptr<WorkQueue> workQueue,
-                              std::atomic<int>& count)
-        : compute(std::move(computeQueue)), queue(std::move(workQueue)), dropped(count) {}
-    ~PostsWhenDropped() {
-      ++dropped;
-      compute->post([] { ADD_FAILURE(); });
-      queue->post([] { ADD_FAILURE(); });
-    }
-    const std::shared_ptr<ComputeQueue> compute;
-    const std::shared_ptr<WorkQueue> queue;
-    std::atomic<int>& dropped;
-  };
   std::atomic<int> dropped = 0;
   std::shared_ptr<ComputeQueue> survivor;
   {
@@ -96,23 +83,35 @@ TEST(ComputeQueueTest, DropsWhatHasNotBegunWhenThePoolStops) {
     const auto compute = pool.makeComputeQueue(), other = pool.makeComputeQueue();
     const auto queue = pool.makeQueue();
     survivor = other;
+    const auto makeOwned = [&] {
+      return std::shared_ptr<void>(nullptr, [&dropped, compute, queue](void*) {
+        ++dropped;
+        compute->post([] { ADD_FAILURE(); });
+        queue->post([] { ADD_FAILURE(); });
+      });
+    };
     Counter begun;
     std::promise<void> release;
     compute->post([&begun, released = release.get_future()] {
       begun.add();
       released.wait();
     });
-    for (const auto& each : {compute, other}) {
-      each->post([owned = std::make_unique<PostsWhenDropped>(compute, queue, dropped)] { ADD_FAILURE(); });
-    }
+    for (const auto& each : {compute, other}) each->post([owned = makeOwned()] { ADD_FAILURE(); });
     pool.start();
     begun.waitFor(1);
     auto stopped = std::async(std::launch::async, [&pool] { pool.stop(); });
-    EXPECT_EQ(stopped.wait_for(20ms), std::future_status::timeout) << "a running job ends first";
+    EXPECT_TRUE(eventually([&] {
+      const auto probe = std::make_shared<int>();
+      other->post([probe] {});
+      return probe.use_count() == 1;
+    }));
+    EXPECT_EQ(stopped.wait_for(0ms), std::future_status::timeout) << "a running job ends first";
     release.set_value();
     stopped.get();
     EXPECT_EQ(dropped, 2);
+    queue->post([owned = makeOwned()] { ADD_FAILURE(); });
   }
+  EXPECT_EQ(dropped, 3);
   const auto owned = std::make_shared<int>();
   survivor->post([owned] { ADD_FAILURE(); });
   EXPECT_EQ(owned.use_count(), 1) << "destroyed at once";
