@@ -107,8 +107,7 @@ TEST_F(Calls, whatTheDaemonSaysUnaskedIsIgnored) {
   peer->notify("removeFile", {"a token of nobody's"});
   peer->notify("removeFile", {});
   peer->notify("sendMessageToClient", {1, 2, 3});
-  const std::uint8_t request[] = {0x94, 0x00, 0x01, 0xa1, 'x', 0x90};
-  peer->sendBytes(request);
+  peer->write(request(1, "x"));
   EXPECT_FALSE(reply.isReady());
   peer->answer(call, {"at last"});
   EXPECT_EQ(textOf(reply.get()), "at last");

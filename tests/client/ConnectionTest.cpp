@@ -72,7 +72,7 @@ TEST_F(Connection, endsWhenTheDaemonWillSayNothingMore) {
   peer->next();
   peer->shutdownSending();
   EXPECT_FALSE(reply.get().values);
-  EXPECT_FALSE(peer->nextUntilClosed());
+  EXPECT_FALSE(peer->nextFrame());
 }
 
 TEST_F(Connection, endsOverWhatIsNoFrame) {
@@ -82,8 +82,7 @@ TEST_F(Connection, endsOverWhatIsNoFrame) {
   const Frame first = peer->next();
   peer->next();
   peer->answer(first, {"whole"});
-  const std::uint8_t garbage[] = {0xc1, 0xff, 0x00};
-  peer->sendBytes(garbage);
+  peer->write({0xc1, 0xff, 0x00});
   EXPECT_EQ(textOf(answered.get()), "whole");
   const auto outcome = failed.get();
   EXPECT_EQ(outcome.error.kind, CallErrorKind::connectionLost);
@@ -121,7 +120,7 @@ TEST_F(Connection, mayBeDestroyedInItsOwnCallbackOrLostHandler) {
   auto done = destroyed.get_future();
   within(done);
   EXPECT_EQ(pending.get().error.kind, CallErrorKind::connectionLost);
-  EXPECT_FALSE(peer->nextUntilClosed());
+  EXPECT_FALSE(peer->nextFrame());
 
   connect();
   std::promise<void> lost;
@@ -139,7 +138,7 @@ TEST_F(Connection, closingLetsWhatWasSentGoOut) {
   for (int i = 0; i < 30; ++i) session().sendMessageWithCategory(1, 1, payload, {});
   auto closed = std::async(std::launch::async, [this] { connection.reset(); });
   int arrived = 0;
-  while (peer->nextUntilClosed()) ++arrived;
+  while (peer->nextFrame()) ++arrived;
   EXPECT_EQ(arrived, 30);
   within(closed);
 }
@@ -236,7 +235,7 @@ TEST_F(Connection, bringsEachAnswerOnceUnderStress) {
   constexpr int kThreads = 4, kCalls = 500;
   std::atomic<int> answered = 0, wrong = 0;
   std::thread server([this] {
-    while (auto frame = peer->nextUntilClosed()) {
+    while (auto frame = peer->nextFrame()) {
       if (frame->kind == Frame::Kind::request) peer->answer(*frame, {std::to_string(frame->params[0].integerValue())});
     }
   });

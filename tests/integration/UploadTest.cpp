@@ -220,8 +220,8 @@ TEST_F(UploadTest, WithoutTokenAndDescriptorNothingIsRead) {
   client.write(request(2, "startConfigWithCompletionHandler"));
   client.write(request(3, "uploadFileAtPath", {"file://" + path, nullptr}));
   client.write(request(4, "uploadFileAtPath", {"file://" + path, "a token"}));
-  client.writeWithDescriptor(request(5, "uploadFileAtPath", {"file://" + path, "a token"}), zero.get());
-  client.writeWithDescriptor(request(6, "uploadFileAtPath", {"file://" + path, "a token"}), file.get());
+  client.writeWithDescriptors(request(5, "uploadFileAtPath", {"file://" + path, "a token"}), {zero.get()});
+  client.writeWithDescriptors(request(6, "uploadFileAtPath", {"file://" + path, "a token"}), {file.get()});
   for (std::uint32_t id = 1; id <= 5; ++id) {
     const auto answer = client.answer();
     ASSERT_TRUE(answer);

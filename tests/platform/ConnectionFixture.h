@@ -1,62 +1,34 @@
 #pragma once
 
 #include <gtest/gtest.h>
-#include <poll.h>
 #include <sys/socket.h>
-#include <sys/time.h>
 
-#include <condition_variable>
-#include <cstring>
+#include <atomic>
 #include <filesystem>
 #include <functional>
 #include <memory>
 #include <mutex>
 #include <optional>
-#include <span>
 #include <string>
 #include <utility>
 #include <vector>
 
 #include "platform/Connection.h"
-#include "platform/MessagePack.h"
-#include "platform/UniqueFd.h"
 #include "platform/WorkQueue.h"
 #include "tests/platform/Waiting.h"
+#include "tests/support/Peer.h"
 
 namespace orvanta::test {
 
 using namespace platform;
-using Bytes = std::vector<std::uint8_t>;
-
 inline Bytes operator+(Bytes left, const Bytes& right) {
-  left.insert(left.end(), right.begin(), right.end());
+  append(left, right);
   return left;
 }
 inline Bytes repeated(const Bytes& bytes, std::size_t times) {
   Bytes result;
-  for (std::size_t i = 0; i < times; ++i) result = std::move(result) + bytes;
+  for (std::size_t i = 0; i < times; ++i) append(result, bytes);
   return result;
-}
-
-// Whole messages.
-inline Bytes notification(std::string_view method, const Value& parameter = nullptr) {
-  Bytes bytes;
-  appendNotificationHeader(bytes, method, 1);
-  MessagePackWriter(bytes).value(parameter);
-  return bytes;
-}
-inline Bytes request(std::uint32_t id, std::string_view method) {
-  Bytes bytes;
-  appendRequestHeader(bytes, id, method, 0);
-  return bytes;
-}
-inline Bytes response(std::uint32_t id, const Value& result) {
-  Bytes bytes;
-  appendResponseHeader(bytes, id);
-  MessagePackWriter writer(bytes);
-  writer.nil();
-  writer.value(result);
-  return bytes;
 }
 
 // Keeps what a connection delivers, and hands each frame to `onFrame` on the way. Thread-safe.
@@ -67,127 +39,50 @@ class RecordingDelegate final : public ConnectionDelegate {
 
   void received(Frame&& frame) override {
     if (onFrame) onFrame(frame);
-    change([&] { _methods.push_back(frame.method); });
+    if (_invalidations.value() > 0) _calledAfterTheEnd = true;
+    {
+      const std::lock_guard lock(_mutex);
+      _methods.push_back(frame.method);
+    }
+    _frames.add();
   }
   void interrupted() override {
-    change([&] { ++_interruptions; });
+    if (_invalidations.value() > 0) _calledAfterTheEnd = true;
+    _interruptions.add();
   }
   void invalidated(const std::optional<std::string>& protocolError) override {
     if (onInvalidated) onInvalidated();
-    const std::lock_guard lock(_mutex);
-    ++_invalidations;
-    _protocolError = protocolError;
-    _changed.notify_all();
+    {
+      const std::lock_guard lock(_mutex);
+      _protocolError = protocolError;
+    }
+    _invalidations.add();
   }
 
-  bool waitForFrames(std::size_t count) {
-    return waitFor([&] { return _methods.size() >= count; });
-  }
-  bool waitForInterruption() {
-    return waitFor([&] { return _interruptions > 0; });
-  }
+  bool waitForFrames(int count) { return _frames.waitFor(count); }
+  bool waitForInterruption() { return _interruptions.waitFor(1); }
   // And whether nothing came behind it.
-  bool waitForInvalidation() {
-    return waitFor([&] { return _invalidations > 0; }) && !_calledAfterTheEnd;
-  }
+  bool waitForInvalidation() { return _invalidations.waitFor(1) && !_calledAfterTheEnd; }
 
   // So far.
-  std::vector<std::string> methods() const { return locked(_methods); }
-  std::size_t frameCount() const { return methods().size(); }
-  int interruptions() const { return locked(_interruptions); }
-  int invalidations() const { return locked(_invalidations); }
-  std::optional<std::string> protocolError() const { return locked(_protocolError); }
+  int frameCount() const { return _frames.value(); }
+  int interruptions() const { return _interruptions.value(); }
+  int invalidations() const { return _invalidations.value(); }
+  std::vector<std::string> methods() const {
+    const std::lock_guard lock(_mutex);
+    return _methods;
+  }
+  std::optional<std::string> protocolError() const {
+    const std::lock_guard lock(_mutex);
+    return _protocolError;
+  }
 
  private:
-  template <class Step>
-  void change(Step step) {
-    const std::lock_guard lock(_mutex);
-    _calledAfterTheEnd = _calledAfterTheEnd || _invalidations > 0;
-    step();
-    _changed.notify_all();
-  }
-  template <class Condition>
-  bool waitFor(Condition condition) {
-    std::unique_lock lock(_mutex);
-    if (!_changed.wait_for(lock, kHangGuard, condition)) hung("a call of the delegate");
-    return true;
-  }
-  template <class T>
-  T locked(const T& value) const {
-    const std::lock_guard lock(_mutex);
-    return value;
-  }
-
+  Counter _frames, _interruptions, _invalidations;
+  std::atomic<bool> _calledAfterTheEnd = false;
   mutable std::mutex _mutex;
-  std::condition_variable _changed;
-  // Guarded by _mutex.
-  std::vector<std::string> _methods;  // of the frames
-  int _interruptions = 0;
-  int _invalidations = 0;
-  bool _calledAfterTheEnd = false;
-  std::optional<std::string> _protocolError;
-};
-
-// The other end of a connection under test, with blocking calls that give up when something hangs.
-class Peer {
- public:
-  Peer() = default;
-  explicit Peer(UniqueFd socket) : _socket(std::move(socket)) {
-    const timeval patience{kHangGuard.count(), 0};
-    ::setsockopt(fd(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
-    ::setsockopt(fd(), SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience);
-  }
-
-  int fd() const { return _socket.get(); }
-  UniqueFd takeSocket() { return std::move(_socket); }
-  bool write(std::span<const std::uint8_t> bytes) const {
-    while (!bytes.empty()) {
-      const ssize_t size = ::send(fd(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
-      if (size <= 0) return false;
-      bytes = bytes.subspan(static_cast<std::size_t>(size));
-    }
-    return true;
-  }
-  bool write(const Bytes& bytes) const { return write(std::span(bytes)); }
-  bool writeWithDescriptors(const Bytes& bytes, const std::vector<int>& descriptors) const {
-    std::vector<char> control(CMSG_SPACE(sizeof(int) * descriptors.size()));
-    iovec vector{const_cast<std::uint8_t*>(bytes.data()), bytes.size()};
-    msghdr message{};
-    message.msg_iov = &vector;
-    message.msg_iovlen = 1;
-    message.msg_control = control.data();
-    message.msg_controllen = control.size();
-    *CMSG_FIRSTHDR(&message) = {CMSG_LEN(sizeof(int) * descriptors.size()), SOL_SOCKET, SCM_RIGHTS};
-    std::memcpy(CMSG_DATA(CMSG_FIRSTHDR(&message)), descriptors.data(), sizeof(int) * descriptors.size());
-    return ::sendmsg(fd(), &message, MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
-  }
-  // Fewer at the end of the stream.
-  Bytes read(std::size_t count) const {
-    Bytes bytes(count);
-    std::size_t filled = 0;
-    for (ssize_t size = 1; size > 0 && filled<count; filled += size> 0 ? static_cast<std::size_t>(size) : 0) {
-      size = ::recv(fd(), bytes.data() + filled, count - filled, 0);
-    }
-    bytes.resize(filled);
-    return bytes;
-  }
-  Bytes readToEnd() const { return read(16U << 20U); }  // more than any test sends
-  // Waits for the end of the stream; false when bytes come instead.
-  bool atEnd() const {
-    std::uint8_t byte = 0;
-    const ssize_t size = ::recv(fd(), &byte, 1, 0);
-    return size == 0 || (size < 0 && errno == ECONNRESET);
-  }
-  bool hasBytes() const {
-    pollfd entry{fd(), POLLIN, 0};
-    return ::poll(&entry, 1, 0) == 1;
-  }
-  void shutdownSending() const { ::shutdown(fd(), SHUT_WR); }
-  void shutdownReceiving() const { ::shutdown(fd(), SHUT_RD); }
-  void close() { _socket.reset(); }
-
- private:
-  UniqueFd _socket;
+  std::vector<std::string> _methods;          // guarded by _mutex: of the frames
+  std::optional<std::string> _protocolError;  // guarded by _mutex
 };
 
 // A running pool, and connections whose other ends the test holds.

@@ -16,52 +16,24 @@ using namespace std::chrono_literals;
 
 using ConnectionTest = ConnectionFixture;
 
-TEST_F(ConnectionTest, TakesAFrameOfMegabytes) {
-  auto made = open();
-  const Bytes large = notification("large", Value(std::string(8U << 20U, 'x')));
-  ASSERT_TRUE(made.peer.write(notification("before") + large + notification("after")));
-  ASSERT_TRUE(made.delegate->waitForFrames(3));
-  EXPECT_EQ(made.delegate->methods(), (std::vector<std::string>{"before", "large", "after"}));
-}
-
 TEST_F(ConnectionTest, ABrokenStreamEndsItAfterTheFramesBefore) {
   LogCapture log;
-  const Bytes streams[] = {{0xc1},                                           // no MessagePack
-                           {0x91, 0x01},                                     // no frame
-                           {0x93, 0x02, 0xdb, 0xff, 0xff, 0xff, 0xff, 'x'},  // 4 GiB of text
-                           Bytes{0x93, 0x02, 0xa1, 'm'} + Bytes(64, 0x91)};  // too deep
-  for (const Bytes& stream : streams) {
-    startPool(2);
-    auto made = open(
-        [](Connection& connection, Frame& frame) { connection.outbox()->send(response(frame.messageID, "done")); });
-    ASSERT_TRUE(made.peer.write(request(1, "a") + request(2, "b") + stream));
-    ASSERT_TRUE(made.delegate->waitForInvalidation());
-    EXPECT_EQ(made.delegate->methods(), (std::vector<std::string>{"a", "b"}));
-    EXPECT_TRUE(made.delegate->protocolError().has_value());
-    EXPECT_EQ(made.delegate->interruptions(), 0);
-    // The answers to what came before are not lost.
-    EXPECT_EQ(made.peer.readToEnd(), response(1, "done") + response(2, "done"));
-    EXPECT_FALSE(made.connection->outbox()->send(response(3, "late")));
-  }
+  auto made =
+      open([](Connection& connection, Frame& frame) { connection.outbox()->send(response(frame.messageID, "done")); });
+  ASSERT_TRUE(made.peer.write(request(1, "a") + request(2, "b") + Bytes{0xc1}));
+  ASSERT_TRUE(made.delegate->waitForInvalidation());
+  EXPECT_EQ(made.delegate->methods(), (std::vector<std::string>{"a", "b"}));
+  EXPECT_TRUE(made.delegate->protocolError().has_value());
+  EXPECT_EQ(made.delegate->interruptions(), 0);
+  // The answers to what came before are not lost.
+  EXPECT_EQ(made.peer.readToEnd(), response(1, "done") + response(2, "done"));
+  EXPECT_FALSE(made.connection->outbox()->send(response(3, "late")));
   EXPECT_TRUE(log.lines().empty()) << "saying why is the delegate's part";
 }
 
-TEST_F(ConnectionTest, EndsQuietlyWhenThePeerClosesWithinAFrame) {
-  LogCapture log(LogLevel::info);
-  auto made = open();
-  const Bytes whole = notification("whole");
-  ASSERT_TRUE(made.peer.write(whole + Bytes(whole.begin(), whole.end() - 2)));
-  made.peer.close();
-  ASSERT_TRUE(made.delegate->waitForInvalidation());
-  EXPECT_EQ(made.delegate->methods(), std::vector<std::string>{"whole"});
-  EXPECT_EQ(made.delegate->protocolError(), std::nullopt);
-  EXPECT_EQ(made.delegate->interruptions(), 0);
-  EXPECT_TRUE(log.lines().empty());
-}
-
-TEST_F(ConnectionTest, CarriesOutEverythingThatArrivedBeforeTheClose) {
-  Counter entered;
-  Counter closed;
+TEST_F(ConnectionTest, CarriesOutEveryWholeFrameThatArrivedBeforeTheClose) {
+  LogCapture log;
+  Counter entered, closed;
   auto made = open([&](Connection&, Frame& frame) {
     if (frame.method != "first") return;
     entered.add();
@@ -69,11 +41,15 @@ TEST_F(ConnectionTest, CarriesOutEverythingThatArrivedBeforeTheClose) {
   });
   ASSERT_TRUE(made.peer.write(notification("first")));
   ASSERT_TRUE(entered.waitFor(1));
-  ASSERT_TRUE(made.peer.write(repeated(notification("more"), 1000)));
+  const Bytes more = notification("more");
+  ASSERT_TRUE(made.peer.write(repeated(more, 1000) + Bytes(more.begin(), more.end() - 2)));
   made.peer.close();
   closed.add();
   ASSERT_TRUE(made.delegate->waitForInvalidation());
-  EXPECT_EQ(made.delegate->frameCount(), 1001U);
+  EXPECT_EQ(made.delegate->frameCount(), 1001);
+  EXPECT_EQ(made.delegate->protocolError(), std::nullopt);
+  EXPECT_EQ(made.delegate->interruptions(), 0);
+  EXPECT_TRUE(log.lines().empty());
 }
 
 TEST_F(ConnectionTest, OutlivesAHalfCloseUntilTheRealOne) {
@@ -82,7 +58,7 @@ TEST_F(ConnectionTest, OutlivesAHalfCloseUntilTheRealOne) {
   ASSERT_TRUE(made.peer.write(request(1, "call") + request(2, "call")));
   made.peer.shutdownSending();
   ASSERT_TRUE(made.delegate->waitForInterruption());
-  EXPECT_EQ(made.delegate->frameCount(), 2U);
+  EXPECT_EQ(made.delegate->frameCount(), 2);
   // Answers made later, on other threads, still arrive.
   std::thread([&] { EXPECT_TRUE(outbox->send(response(2, "late"))); }).join();
   EXPECT_TRUE(outbox->send(response(1, "later")));
@@ -198,7 +174,7 @@ TEST_F(ConnectionTest, WhatIsSentOnInvalidationStillReachesAPeerThatListens) {
 
 TEST_F(ConnectionTest, ShutdownSendingLetsThePeerReadOutAndSendOn) {
   auto made = open();
-  const Bytes reply = response(1, Value(std::string(3U << 20U, 'r')));
+  const Bytes reply = response(1, std::string(3U << 20U, 'r'));
   EXPECT_TRUE(made.connection->outbox()->send(reply));
   made.connection->shutdownSending();
   EXPECT_FALSE(made.connection->outbox()->send(response(2, "too late")));
@@ -235,10 +211,10 @@ TEST_F(ConnectionTest, OnlyLargeFramesAreCarriedOutBesideTheLoop) {
   ASSERT_TRUE(made.peer.write(repeated(notification("small"), 20'000)));  // fills each read
   ASSERT_TRUE(made.delegate->waitForFrames(20'000));
   EXPECT_EQ(most, 1U);
-  std::size_t frames = 20'000;
-  for (const std::size_t size : {40'000, 400'000}) {  // whole in one read, and not
+  int frames = 20'000;
+  for (const std::size_t size : {40'000, 8'000'000}) {  // whole in one read, and not
     most = 0;
-    ASSERT_TRUE(made.peer.write(notification("large", Value(std::string(size, 'x'))) + notification("end")));
+    ASSERT_TRUE(made.peer.write(notification("large", {std::string(size, 'x')}) + notification("end")));
     ASSERT_TRUE(made.delegate->waitForFrames(frames += 2));
     EXPECT_EQ(most, 2U) << size;
   }
@@ -246,15 +222,13 @@ TEST_F(ConnectionTest, OnlyLargeFramesAreCarriedOutBesideTheLoop) {
 
 TEST_F(ConnectionTest, GoesWithItsPool) {
   const std::size_t before = openDescriptors();
-  std::weak_ptr<RecordingDelegate> idle;
-  std::weak_ptr<RecordingDelegate> stuck;
+  std::weak_ptr<RecordingDelegate> idle, stuck;
   {
     startPool(2);
     auto first = open();
     // The second waits for its peer to read.
-    auto second = open([](Connection& connection, Frame&) {
-      connection.outbox()->send(response(1, Value(std::string(2U << 20U, 'r'))));
-    });
+    auto second = open(
+        [](Connection& connection, Frame&) { connection.outbox()->send(response(1, std::string(2U << 20U, 'r'))); });
     ASSERT_TRUE(second.peer.write(repeated(request(1, "call"), 3)));
     ASSERT_TRUE(second.delegate->waitForFrames(1));
     onQueueOf(*second.connection, [] {});

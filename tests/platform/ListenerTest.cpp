@@ -9,8 +9,8 @@
 
 #include <atomic>
 #include <cstdlib>
+#include <future>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <thread>
 #include <vector>
@@ -51,12 +51,10 @@ class ListenerTest : public ConnectionFixture {
     (*listener)->resume();
     return std::move(*listener);
   }
-  // A blocking socket.
   Peer connect() {
     auto socket = connectToService(_directory.path(), kService);
     EXPECT_TRUE(socket.ok()) << socket.error();
     if (!socket) return {};
-    ::fcntl(socket->get(), F_SETFL, 0);
     return Peer(std::move(*socket));
   }
   std::string socketPath() const { return _directory / kService; }
@@ -106,7 +104,7 @@ TEST_F(ListenerTest, EverybodyMayConnectWhateverTheMaskButNobodyIsAcceptedBefore
   struct stat status {};
   ASSERT_EQ(::stat(socketPath().c_str(), &status), 0);
   EXPECT_EQ(status.st_mode & 07777U, 0666U);
-  const Peer early = connect();
+  Peer early = connect();
   EXPECT_EQ(_admitted.value(), 0);
   (*listener)->resume();
   EXPECT_TRUE(_admitted.waitFor(1));
@@ -144,29 +142,27 @@ TEST_F(ListenerTest, SaysWhatStandsInTheWay) {
 TEST_F(ListenerTest, OfSeveralThatStartAtOnceOneWins) {
   { const UniqueFd gone = listeningSocket(socketPath()); }
   constexpr int kStarters = 8;
-  std::mutex mutex;
-  std::vector<std::unique_ptr<Listener>> winners;  // guarded by mutex
-  std::vector<std::string> errors;                 // guarded by mutex
   Counter ready;
-  std::vector<std::thread> starters;
+  std::vector<std::future<Result<std::unique_ptr<Listener>>>> starters;
   for (int i = 0; i < kStarters; ++i) {
-    starters.emplace_back([&] {
+    starters.push_back(std::async(std::launch::async, [&] {
       ready.add();
       ready.waitFor(kStarters);
-      auto listener = create(admitting());
-      const std::lock_guard lock(mutex);
-      if (listener) {
-        winners.push_back(std::move(*listener));
-      } else {
-        errors.push_back(listener.error());
-      }
-    });
+      return create(admitting());
+    }));
   }
-  for (auto& starter : starters) starter.join();
+  std::vector<std::unique_ptr<Listener>> winners;
+  for (auto& starter : starters) {
+    auto listener = starter.get();
+    if (listener) {
+      winners.push_back(std::move(*listener));
+    } else {
+      EXPECT_THAT(listener.error(), HasSubstr("listens at"));
+    }
+  }
   ASSERT_EQ(winners.size(), 1U);
-  EXPECT_THAT(errors, ::testing::Each(HasSubstr("listens at")));
   winners.front()->resume();
-  const Peer peer = connect();
+  Peer peer = connect();
   EXPECT_TRUE(_admitted.waitFor(1));
   winners.front()->stop();
 }
@@ -188,8 +184,7 @@ TEST_F(ListenerTest, StopRemovesItsSocketFreesTheNameAndLeavesOthersAlone) {
 }
 
 TEST_F(ListenerTest, StopWaitsForHandlersUnderWay) {
-  Counter entered;
-  Counter release;
+  Counter entered, release;
   std::atomic<bool> left = false;
   const auto listener = listen([&](OfferedConnection&&) {
     entered.add();
@@ -197,7 +192,7 @@ TEST_F(ListenerTest, StopWaitsForHandlersUnderWay) {
     left = true;
     return false;
   });
-  const Peer peer = connect();
+  Peer peer = connect();
   ASSERT_TRUE(entered.waitFor(1));
   std::thread releaser([&] { release.add(); });
   listener->stop();
@@ -217,7 +212,7 @@ TEST_F(ListenerTest, AHandlerMayStopItsListener) {
   ASSERT_TRUE(made.ok());
   listener = std::move(*made);
   listener->resume();
-  const Peer peer = connect();
+  Peer peer = connect();
   EXPECT_TRUE(stopped.waitFor(1));
   _pool->stop();
 }
@@ -269,8 +264,8 @@ TEST_F(ListenerTest, PausesWhenDescriptorsRunOutAndGoesOn) {
   LogCapture log;
   auto listener = create(admitting());
   ASSERT_TRUE(listener.ok());
-  const Peer first = connect();
-  const Peer second = connect();
+  Peer first = connect();
+  Peer second = connect();
   {
     const DescriptorsExhausted exhausted;
     (*listener)->resume();
@@ -285,7 +280,7 @@ TEST_F(ListenerTest, PausesWhenDescriptorsRunOutAndGoesOn) {
 // Back-pressure wants a descriptor of its own; without one it must still get on.
 TEST_F(ListenerTest, RepliesStillGoOutWhenDescriptorsRunOut) {
   auto made = open();
-  const Bytes reply = response(1, Value(std::string(2U << 20U, 'r')));
+  const Bytes reply = response(1, std::string(2U << 20U, 'r'));
   {
     const DescriptorsExhausted exhausted;
     EXPECT_TRUE(made.connection->outbox()->send(reply));
@@ -321,7 +316,7 @@ TEST_F(ListenerTest, TakesTheSocketOfTheServiceManager) {
     ::_exit(127);
   }
   ASSERT_GT(child, 0);
-  const Peer peer = connect();
+  Peer peer = connect();
   const Bytes expected = notification("activated");
   EXPECT_EQ(peer.read(expected.size()), expected);
   int status = -1;

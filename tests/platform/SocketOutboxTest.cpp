@@ -8,7 +8,6 @@
 #include <thread>
 
 #include "platform/Connection.h"
-#include "platform/FrameDecoder.h"
 #include "tests/platform/ConnectionFixture.h"
 
 namespace orvanta::test {
@@ -20,11 +19,11 @@ class OutboxTest : public ConnectionFixture {
  protected:
   // Fills the socket's buffer and puts `beyond` bytes more into the outbox; returns what the peer will read.
   static Bytes fill(Connection& connection, std::size_t beyond) {
-    const Bytes block = response(0, Value(std::string(16U << 10U, 'f')));
+    const Bytes block = response(0, std::string(16U << 10U, 'f'));
     Bytes all;
     while (connection.outbox()->pending() < beyond) {
       EXPECT_TRUE(connection.outbox()->send(block));
-      all.insert(all.end(), block.begin(), block.end());
+      append(all, block);
     }
     return all;
   }
@@ -32,10 +31,9 @@ class OutboxTest : public ConnectionFixture {
 };
 
 TEST_F(OutboxTest, StopsReadingWhileThePeerReadsNoReplies) {
-  constexpr std::size_t kReply = 64U << 10U;
-  constexpr std::size_t kCalls = 200;
+  constexpr int kCalls = 200;
   const std::size_t limit = ConnectionLimits{}.maximumUnreadReplies;
-  const Bytes reply = response(1, Value(std::string(kReply, 'r')));
+  const Bytes reply = response(1, std::string(64U << 10U, 'r'));
   std::atomic<std::size_t> mostPending = 0;
   auto made = open([&](Connection& connection, Frame&) {
     mostPending = std::max(mostPending.load(), connection.outbox()->pending());
@@ -54,19 +52,17 @@ TEST_F(OutboxTest, StopsReadingWhileThePeerReadsNoReplies) {
 }
 
 TEST_F(OutboxTest, APeerThatNeverReadsMayStillClose) {
-  auto made = open([](Connection& connection, Frame&) {
-    connection.outbox()->send(response(1, Value(std::string(256U << 10U, 'r'))));
-  });
+  auto made = open(
+      [](Connection& connection, Frame&) { connection.outbox()->send(response(1, std::string(256U << 10U, 'r'))); });
   ASSERT_TRUE(made.peer.write(repeated(request(1, "call"), 20)));
   ASSERT_TRUE(eventually([&] { return made.connection->outbox()->pending() > (1U << 20U); }));
   made.peer.close();
   ASSERT_TRUE(made.delegate->waitForInvalidation());
-  EXPECT_EQ(made.delegate->frameCount(), 20U) << "what had arrived is carried out";
+  EXPECT_EQ(made.delegate->frameCount(), 20) << "what had arrived is carried out";
 }
 
 TEST_F(OutboxTest, WritesWhileItsConnectionIsBusy) {
-  Counter entered;
-  Counter release;
+  Counter entered, release;
   auto made = open([&](Connection&, Frame&) {
     entered.add();
     release.waitFor(1);
@@ -82,11 +78,11 @@ TEST_F(OutboxTest, WritesWhileItsConnectionIsBusy) {
 TEST_F(OutboxTest, DropsOnlyDroppableMessagesWhole) {
   const std::size_t limit = ConnectionLimits{}.maximumDroppable;
   auto made = open();
-  const Bytes event = notification("event", Value(std::string(10'000, 'e')));
+  const Bytes event = notification("event", {std::string(10'000, 'e')});
   const Bytes notice = notification("notice");
   Outbox& outbox = *made.connection->outbox();
   Bytes expected;
-  while (outbox.send(event, Outbox::Urgency::droppable)) expected.insert(expected.end(), event.begin(), event.end());
+  while (outbox.send(event, Outbox::Urgency::droppable)) append(expected, event);
   EXPECT_LE(outbox.pending(), limit);
   EXPECT_GT(outbox.pending(), limit - 2 * event.size());
   EXPECT_TRUE(outbox.send(event));  // a reply is never dropped
@@ -106,20 +102,14 @@ TEST_F(OutboxTest, DropsOnlyDroppableMessagesWhole) {
 }
 
 TEST_F(OutboxTest, MessagesOfManyThreadsStayWholeAndInOrder) {
-  constexpr int kThreads = 6;
-  constexpr int kMessages = 400;
-  Counter answered;
-  auto made = open([&](Connection& connection, Frame&) {
-    connection.outbox()->send(notification("answer"));
-    answered.add();
-  });
+  constexpr int kThreads = 6, kMessages = 400;
+  auto made = open([](Connection& connection, Frame&) { connection.outbox()->send(notification("answer")); });
   std::vector<std::thread> senders;
   for (int sender = 0; sender < kThreads; ++sender) {
     senders.emplace_back([&, sender] {
       for (int i = 0; i < kMessages; ++i) {
         const std::string filling(static_cast<std::size_t>((i * 37 + sender * 11) % 3000), 'a');
-        const Value parameter(Array{Value(i), Value(filling)});
-        EXPECT_TRUE(made.connection->outbox()->send(notification(std::to_string(sender), parameter)));
+        EXPECT_TRUE(made.connection->outbox()->send(notification(std::to_string(sender), {i, filling})));
       }
     });
   }
@@ -127,27 +117,17 @@ TEST_F(OutboxTest, MessagesOfManyThreadsStayWholeAndInOrder) {
     for (int i = 0; i < kMessages; ++i) EXPECT_TRUE(made.peer.write(notification("call")));
   });
 
-  FrameDecoder decoder;
   std::vector<std::int64_t> next(kThreads, 0);
   int answers = 0;
-  for (int count = 0; count < (kThreads + 1) * kMessages;) {
-    FrameDecoder::Outcome outcome = decoder.next();
-    if (std::holds_alternative<FrameDecoder::NeedMore>(outcome)) {
-      std::uint8_t bytes[4096];
-      const ssize_t size = ::recv(made.peer.fd(), bytes, sizeof bytes, 0);
-      ASSERT_GT(size, 0);
-      decoder.append({bytes, static_cast<std::size_t>(size)});
-      continue;
-    }
-    ASSERT_TRUE(std::holds_alternative<Frame>(outcome));
-    const Frame& frame = std::get<Frame>(outcome);
-    ++count;
-    if (frame.method == "answer") {
+  for (int count = 0; count < (kThreads + 1) * kMessages; ++count) {
+    const auto frame = made.peer.nextFrame();
+    ASSERT_TRUE(frame);
+    if (frame->method == "answer") {
       ++answers;
       continue;
     }
-    const auto sender = static_cast<std::size_t>(std::stoi(frame.method));
-    ASSERT_EQ(frame.params.at(0).array()->at(0).integerValue(), next.at(sender)++);
+    const auto sender = static_cast<std::size_t>(std::stoi(frame->method));
+    ASSERT_EQ(frame->params.at(0).integerValue(), next.at(sender)++);
   }
   EXPECT_EQ(answers, kMessages);
   for (auto& sender : senders) sender.join();
@@ -213,8 +193,8 @@ TEST_F(OutboxTest, DescriptorsTravelWithTheirMessages) {
   const auto senderDelegate = std::make_shared<RecordingDelegate>();
   sender->resume(senderDelegate);
   for (int i = 0; i < kUploads; ++i) {
-    EXPECT_TRUE(sender->outbox()->send(notification("event", Value(std::string(5000, 'e')))));
-    EXPECT_TRUE(sender->outbox()->sendWithDescriptor(notification("upload", Value(i)), readableWith(i)));
+    EXPECT_TRUE(sender->outbox()->send(notification("event", {std::string(5000, 'e')})));
+    EXPECT_TRUE(sender->outbox()->sendWithDescriptor(notification("upload", {i}), readableWith(i)));
     EXPECT_TRUE(sender->outbox()->send(notification("event")));
   }
   receiver.connection->resume(receiver.delegate);
@@ -266,7 +246,7 @@ TEST_F(OutboxTest, TooManyWaitingDescriptorsEndTheConnection) {
     }
     ASSERT_TRUE(made.delegate->waitForInvalidation());
     EXPECT_TRUE(made.delegate->protocolError().has_value());
-    EXPECT_EQ(made.delegate->frameCount(), inOneMessage ? 1U : 17U);
+    EXPECT_EQ(made.delegate->frameCount(), inOneMessage ? 1 : 17);
     EXPECT_TRUE(made.peer.atEnd());
   }
   EXPECT_TRUE(eventually([&] { return openDescriptors() == before; }));
