@@ -19,8 +19,7 @@ struct Swallow final : platform::LogSink {
 // A device that trusts the server's key, and the server.
 struct World {
   World() {
-    const auto key = signer.publicKeyDer(test::KeyLayout::subjectPublicKeyInfo);
-    device.directory.write("share/publicKey.der", {reinterpret_cast<const char*>(key.data()), key.size()});
+    installKey(device, signer.publicKeyDer(test::KeyLayout::subjectPublicKeyInfo));
     device.http.answer = [this](const platform::HttpRequest&) {
       return test::ScriptedHttpClient::status(200, document);
     };

@@ -42,19 +42,16 @@ TEST(Orvanta, keepsTheKeyOnceItHasOne) {
   Orvanta& orvanta = Orvanta::of(platform);
   EXPECT_FALSE(orvanta.publicKey());
   const std::string file = platform.directory / "share/publicKey.der";
-  const auto install = [&](const test::Bytes& bytes) {
-    platform.directory.write("share/publicKey.der", {reinterpret_cast<const char*>(bytes.data()), bytes.size()});
-  };
   const auto der = test::StorebagSigner().publicKeyDer(test::KeyLayout::pkcs1);
   for (const auto& unusable : {test::Bytes{}, test::Bytes(70'000, 0x30), test::Bytes(der.begin(), der.end() - 1)}) {
-    install(unusable);
+    installKey(platform, unusable);
     EXPECT_FALSE(orvanta.publicKey());
   }
   std::filesystem::remove(file);
   std::filesystem::create_directory(file);
   EXPECT_FALSE(orvanta.publicKey());
   std::filesystem::remove(file);
-  install(der);
+  installKey(platform, der);
   const auto key = orvanta.publicKey();
   ASSERT_TRUE(key);
   std::filesystem::remove(file);

@@ -57,6 +57,10 @@ std::string StorebagSigner::document(const platform::Dictionary& bag, PlistForm 
   return document(plistBytes(bag, form), form);
 }
 
+void installKey(TestPlatform& device, const Bytes& der) {
+  device.directory.write("share/publicKey.der", {reinterpret_cast<const char*>(der.data()), der.size()});
+}
+
 Bytes plistBytes(const platform::Value& value, PlistForm form) {
   if (form == PlistForm::binary) return platform::writeBinaryPropertyList(value).value();
   const std::string text = platform::writeXmlPropertyList(value).value();

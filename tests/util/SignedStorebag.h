@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "platform/Value.h"
+#include "tests/support/TestPlatform.h"
 
 namespace orvanta::test {
 
@@ -29,6 +30,7 @@ class StorebagSigner {
   void* _key;  // an EVP_PKEY that lives as long as the process
 };
 
+void installKey(TestPlatform& device, const Bytes& der);
 Bytes plistBytes(const platform::Value& value, PlistForm form);
 // An outer document from decoded parts, which need not fit together.
 std::string outerDocument(std::span<const std::uint8_t> signature, std::span<const std::uint8_t> bag,
