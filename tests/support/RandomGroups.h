@@ -1,14 +1,20 @@
 #pragma once
 
+#include <fmt/format.h>
+#include <gtest/gtest.h>
+
 #include <array>
 #include <atomic>
 #include <chrono>
 #include <condition_variable>
 #include <cstdint>
+#include <cstdio>
+#include <cstdlib>
 #include <functional>
 #include <memory>
 #include <mutex>
 #include <random>
+#include <stdexcept>
 #include <string>
 #include <thread>
 #include <vector>
@@ -36,16 +42,45 @@ class GroupOperations {
 
   explicit GroupOperations(std::uint64_t seed) : _random(seed) {}
 
-  GroupOperation next();
+  GroupOperation next() {
+    GroupOperation operation;
+    operation.member = below(kMembers);
+    operation.kind = kindFor(operation.member);
+    operation.group = below(kGroups);
+    operation.level = below(kLevels);
+    operation.aggregates = below(3) == 0;
+    operation.batches = below(2) == 0;
+    operation.variant = below(kVariants);
+    operation.count = 1 + below(8);
+    // Realtime events and promoting ones are the exception.
+    operation.flag = below(8) == 0 ? below(4) : 0;
+    if (operation.kind == Kind::join) _here[operation.member] = true;
+    if (operation.kind == Kind::leave || operation.kind == Kind::vanish) _here[operation.member] = false;
+    return operation;
+  }
   void everyoneHasLeft() { _here.fill(false); }
   // Of all operations so far: what shows that two runs did the same.
   std::uint64_t digest() const { return _digest; }
 
  private:
+  using Kind = GroupOperation::Kind;
+
   // The engine's values are the same everywhere; the library's distributions are not.
-  std::uint32_t below(std::uint32_t limit) { return static_cast<std::uint32_t>(_random() % limit); }
-  GroupOperation::Kind kindFor(std::uint32_t member);
-  void digest(std::uint32_t value) { _digest = (_digest ^ value) * 1'099'511'628'211U; }
+  std::uint32_t below(std::uint32_t limit) {
+    const auto value = static_cast<std::uint32_t>(_random() % limit);
+    _digest = (_digest ^ value) * 1'099'511'628'211U;
+    return value;
+  }
+  Kind kindFor(std::uint32_t member) {
+    if (!_here[member]) return Kind::join;
+    const std::uint32_t chance = below(100);
+    if (chance < 2) return Kind::leave;
+    if (chance < 4) return Kind::vanish;
+    if (chance < 10) return Kind::regroup;
+    if (chance < 20) return Kind::userInfo;
+    if (chance < 32) return Kind::flush;
+    return chance < 33 ? Kind::storebag : Kind::send;
+  }
 
   std::mt19937_64 _random;
   std::array<bool, kMembers> _here{};
@@ -67,18 +102,58 @@ class RandomGroups {
     // Everybody has left; the first time, what the daemon holds then is the standard for later.
     std::function<void(bool first)> compareLeftovers;
   };
-  RandomGroups(Daemon daemon, std::chrono::seconds duration);
-  ~RandomGroups();
+  RandomGroups(Daemon daemon, std::chrono::seconds duration)
+      : _daemon(std::move(daemon)),
+        _seed(setting("ORVANTA_RANDOM_SEED", std::random_device()())),
+        _operationLimit(setting("ORVANTA_RANDOM_OPERATIONS", 0)),
+        _end(std::chrono::steady_clock::now() +
+             std::chrono::seconds(setting("ORVANTA_RANDOM_SECONDS", static_cast<std::uint64_t>(duration.count())))),
+        _callbackThread(CallbackThread::start().value()),
+        _next(_seed) {
+    for (std::uint32_t i = 0; i < GroupOperations::kMembers; ++i) _members[i].id = i + 1;
+    _watchdog = std::thread([this] { watch(); });
+  }
+  ~RandomGroups() {
+    for (auto& member : _members) {
+      member.vanishing = true;
+      member.connection.reset();
+    }
+    {
+      const std::lock_guard lock(_mutex);
+      _over = true;
+    }
+    _ended.notify_all();
+    _watchdog.join();
+  }
   RandomGroups(const RandomGroups&) = delete;
   RandomGroups& operator=(const RandomGroups&) = delete;
 
   // Rounds of operations, at whose end everybody leaves, until the time is up; prints the seed at once and a summary.
-  void run();
+  void run() {
+    fmt::print("seed {}\n", _seed);
+    std::fflush(stdout);
+    std::uint64_t rounds = 0;
+    do {
+      runRound();
+      ++rounds;
+      if (rounds == 1 || rounds % kRoundsPerComparison == 0 || timeIsUp()) _daemon.compareLeftovers(rounds == 1);
+      // Two rounds at least: the first sets the standard.
+    } while ((!timeIsUp() || rounds < 2) && !::testing::Test::HasFailure());
+    fmt::print("seed {}: {} rounds, {} operations (digest {:016x}), {} calls answered, {} events sent, {} aggregated\n",
+               _seed, rounds, _operations.load(), _next.digest(), _calls.load(), _eventsSent, _eventsAggregated.load());
+  }
 
   std::uint64_t eventsSent() const { return _eventsSent; }
   std::uint64_t eventsAggregated() const { return _eventsAggregated.load(); }
 
  private:
+  using Kind = GroupOperation::Kind;
+  static constexpr std::uint64_t kOperationsPerRound = 2'000;
+  static constexpr std::uint64_t kRoundsPerComparison = 8;
+  static constexpr std::uint64_t kMostUnanswered = 2'000;
+  static constexpr std::chrono::seconds kLockedUpAfter{60};
+  static constexpr std::uint16_t kCategory = 20;
+
   // A client, with what its replies need.
   struct Member {
     std::uint32_t id = 0;
@@ -87,23 +162,162 @@ class RandomGroups {
     std::atomic<bool> vanishing{false};
   };
 
-  void runRound();
-  void carryOut(const GroupOperation& operation);
-  void join(Member& member, const GroupOperation& operation);
-  void configure(Member& member, const GroupOperation& operation);
-  void send(Member& member, const GroupOperation& operation);
-  void leave(Member& member);
-  void vanish(Member& member);
-  bool timeIsUp() const;
+  static std::uint64_t setting(const char* name, std::uint64_t usual) {
+    const char* text = std::getenv(name);
+    return text == nullptr ? usual : std::strtoull(text, nullptr, 0);
+  }
+  static SharedDictionary userInfo(std::uint32_t id, std::uint32_t variant) {
+    if (variant == 0) return nullptr;
+    return UserInfo{"client" + std::to_string(variant), "service", {{"who", id}, {"marker", "covered?"}}}.dictionary();
+  }
+
+  bool timeIsUp() const {
+    if (_operationLimit != 0) return _operations >= _operationLimit;
+    return std::chrono::steady_clock::now() >= _end;
+  }
+  void runRound() {
+    for (std::uint64_t i = 0; i < kOperationsPerRound; ++i) {
+      if (_operationLimit != 0 && _operations >= _operationLimit) break;
+      carryOut(_next.next());
+      ++_operations;
+      ++_progress;
+      waitUntil([this] { return _unanswered.load() < kMostUnanswered; });
+    }
+    for (auto& member : _members) {
+      if (member.connection) leave(member);
+    }
+    _next.everyoneHasLeft();
+  }
+  void carryOut(const GroupOperation& operation) {
+    Member& member = _members[operation.member];
+    switch (operation.kind) {
+      case Kind::join:
+        return join(member, operation);
+      case Kind::regroup:
+        return configure(member, operation);
+      case Kind::leave:
+        return leave(member);
+      case Kind::vanish:
+        return vanish(member);
+      case Kind::send:
+        return send(member, operation);
+      case Kind::userInfo:
+        return member.connection->session().fetchStatesWithUserInfo(userInfo(member.id, operation.variant),
+                                                                    owed<BackendNamesReply>(member));
+      case Kind::flush:
+        return member.connection->session().flushMessagesWithCompletion(owed<FlushReply>(member));
+      case Kind::storebag:
+        return _daemon.changeStorebag(operation.variant);
+    }
+  }
+  void join(Member& member, const GroupOperation& operation) {
+    ConnectionOptions options;
+    options.socketDirectory = _daemon.socketDirectory;
+    options.callbackThread = _callbackThread;
+    options.closingTime = std::chrono::milliseconds(0);
+    auto connected = OrvantaConnection::connect(std::move(options));
+    if (!connected) throw std::runtime_error(connected.error().text);
+    member.connection = std::move(*connected);
+    member.vanishing = false;
+    member.connection->session().setAggregationHandler([this](const AggregatedEvent& event) { received(event); },
+                                                       [] {});
+    configure(member, operation);
+  }
+  void configure(Member& member, const GroupOperation& operation) {
+    SessionInfo info{.sessionID = member.id, .clientType = 5};
+    info.requireUserInfo = operation.count % 2 == 1;
+    info.batchEvent = operation.batches;
+    // Some belong to nobody.
+    if (operation.count != 8)
+      info.hierarchyToken = HierarchyToken{fmt::format("group{}", operation.group), operation.level};
+    auto& session = member.connection->session();
+    session.setSessionInfo(info.dictionary(), userInfo(member.id, operation.variant), nullptr, operation.aggregates,
+                           owed<DoneReply>(member));
+    session.startConfigWithCompletionHandler(owed<BackendNamesReply>(member));
+  }
+  void send(Member& member, const GroupOperation& operation) {
+    for (std::uint32_t i = 0; i < operation.count; ++i) {
+      MessageParameters event{.category = kCategory, .type = static_cast<std::uint16_t>(operation.group)};
+      event.payload = platform::Dictionary{{"number", _eventsSent++}, {"marker", "own"}};
+      event.flag = operation.flag;
+      member.connection->session().sendMessageWithDictionary(event.dictionary(), owed<StringReply>(member));
+    }
+  }
+  // With everything answered first, so that no answer may be missing.
+  void leave(Member& member) {
+    member.connection->session().finishSessionWithReply(owed<StringReply>(member));
+    waitUntil([&member] { return member.unanswered.load() == 0; });
+    member.connection.reset();
+  }
+  // In the middle of everything: what has not been answered fails, but nothing is forgotten.
+  void vanish(Member& member) {
+    member.vanishing = true;
+    member.connection.reset();
+    EXPECT_EQ(member.unanswered.load(), 0U) << "replies of session " << member.id << " are lost; seed " << _seed;
+    _unanswered -= member.unanswered.exchange(0);
+  }
 
   // A reply that must come; counts as unanswered until it has.
   template <class AnyReply>
-  AnyReply owed(Member& member);
-  void answered(Member& member, bool withValues, const std::string& error);
-  void waitUntil(const std::function<bool()>& condition);
+  AnyReply owed(Member& member) {
+    ++member.unanswered;
+    ++_unanswered;
+    ++_calls;
+    return AnyReply([this, &member](typename AnyReply::Outcome outcome) {
+      answered(member, outcome.values.has_value(), outcome.error.text);
+    });
+  }
+  void answered(Member& member, bool withValues, const std::string& error) {
+    if (!withValues && !member.vanishing) {
+      ADD_FAILURE() << "session " << member.id << " got no answer: " << error << "; seed " << _seed;
+    }
+    ++_progress;
+    {
+      const std::lock_guard lock(_mutex);
+      --member.unanswered;
+      --_unanswered;
+    }
+    _changed.notify_all();
+  }
+  void waitUntil(const std::function<bool()>& condition) {
+    if (condition()) return;
+    std::unique_lock lock(_mutex);
+    _changed.wait(lock, condition);
+  }
   // On the callback thread.
-  void received(const AggregatedEvent& event);
-  void watch();
+  void received(const AggregatedEvent& event) {
+    ++_progress;
+    if (event.category != kCategory) return;
+    const auto number = static_cast<std::uint64_t>(event.payload->find("number")->integerValue());
+    if (const auto* who = event.payload->find("who")) {
+      EXPECT_EQ(who->integerValue(), event.sessionInfo->find("sessionID")->integerValue()) << "seed " << _seed;
+      EXPECT_EQ(event.payload->find("marker")->description(), "covered?") << "user info wins; seed " << _seed;
+    }
+    const std::lock_guard lock(_mutex);
+    if (_aggregatedOnce.size() <= number) _aggregatedOnce.resize(number + 1);
+    EXPECT_FALSE(_aggregatedOnce[number]) << "event " << number << " reached two aggregators; seed " << _seed;
+    _aggregatedOnce[number] = true;
+    ++_eventsAggregated;
+  }
+  void watch() {
+    std::uint64_t seen = 0;
+    auto quietSince = std::chrono::steady_clock::now();
+    std::unique_lock lock(_mutex);
+    while (!_ended.wait_for(lock, std::chrono::seconds(1), [this] { return _over; })) {
+      const auto now = std::chrono::steady_clock::now();
+      if (const auto progress = _progress.load(); progress != seen) {
+        seen = progress;
+        quietSince = now;
+      }
+      if (now - quietSince < kLockedUpAfter) continue;
+      fmt::print(stderr, "LOCKED UP: nothing came for {} s; seed {}, operation {}, {} calls unanswered:\n",
+                 kLockedUpAfter.count(), _seed, _operations.load(), _unanswered.load());
+      for (const auto& member : _members) {
+        if (member.unanswered != 0) fmt::print(stderr, "  session {}: {}\n", member.id, member.unanswered.load());
+      }
+      std::abort();
+    }
+  }
 
   // Constant after construction.
   const Daemon _daemon;
