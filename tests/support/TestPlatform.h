@@ -1,11 +1,13 @@
 #pragma once
 
 #include <chrono>
+#include <filesystem>
 #include <functional>
 #include <memory>
 #include <mutex>
 #include <optional>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "platform/Platform.h"
@@ -41,36 +43,79 @@ struct TestDevice final : platform::DeviceProperties {
 // run on the calling thread. Thread-safe.
 class ScriptedHttpClient final : public platform::HttpClient {
  public:
-  struct Taken {
-    platform::HttpRequest request;
-    Observer observe;
-    Completion completion;
-  };
   // The answer to requests that nobody holds; default 200 with an empty body. May be called on several threads at once.
   std::function<platform::HttpResult(const platform::HttpRequest&)> answer;
   // While true, started requests wait in `held` for finishHeld().
   bool hold = false;
 
-  std::shared_ptr<platform::HttpLane> makeLane(LaneKind kind) override;
-  void start(const std::shared_ptr<platform::HttpLane>& lane, platform::HttpRequest request, Observer observe,
-             Completion completion) override;
-  platform::HttpResult perform(const std::shared_ptr<platform::HttpLane>& lane, platform::HttpRequest request) override;
+  std::shared_ptr<platform::HttpLane> makeLane(LaneKind) override { return std::make_shared<platform::HttpLane>(); }
+  void start(const std::shared_ptr<platform::HttpLane>&, platform::HttpRequest request, Observer observe,
+             Completion completion) override {
+    {
+      const std::lock_guard lock(_mutex);
+      _requests.push_back(request);
+      if (hold) {
+        _held.push_back({std::move(observe), std::move(completion)});
+        return;
+      }
+    }
+    end({std::move(observe), std::move(completion)}, answerFor(request));
+  }
+  platform::HttpResult perform(const std::shared_ptr<platform::HttpLane>&, platform::HttpRequest request) override {
+    {
+      const std::lock_guard lock(_mutex);
+      _requests.push_back(request);
+    }
+    return answerFor(request);
+  }
   void abortBlockingRequests() override {}
   void shutdown(std::chrono::milliseconds) override {}
 
   // Every request so far, in order, held ones included.
-  std::vector<platform::HttpRequest> requests() const;
-  void clear();
+  std::vector<platform::HttpRequest> requests() const {
+    const std::lock_guard lock(_mutex);
+    return _requests;
+  }
+  void clear() {
+    const std::lock_guard lock(_mutex);
+    _requests.clear();
+  }
   // Ends the oldest held request with `result`; false when none waits.
-  bool finishHeld(platform::HttpResult result);
+  bool finishHeld(platform::HttpResult result) {
+    Held oldest;
+    {
+      const std::lock_guard lock(_mutex);
+      if (_held.empty()) return false;
+      oldest = std::move(_held.front());
+      _held.erase(_held.begin());
+    }
+    end(std::move(oldest), std::move(result));
+    return true;
+  }
 
-  static platform::HttpResult status(int code, std::string body = {});
+  static platform::HttpResult status(int code, std::string body = {}) {
+    platform::HttpResponse response;
+    response.status = code;
+    response.body = std::move(body);
+    return {std::move(response), {}};
+  }
 
  private:
-  platform::HttpResult answerFor(const platform::HttpRequest& request);
+  struct Held {
+    Observer observe;
+    Completion completion;
+  };
+  static void end(Held request, platform::HttpResult result) {
+    if (request.observe && !request.observe(result)) return;
+    if (request.completion) request.completion(std::move(result));
+  }
+  platform::HttpResult answerFor(const platform::HttpRequest& request) {
+    return answer ? answer(request) : status(200);
+  }
+
   mutable std::mutex _mutex;
   std::vector<platform::HttpRequest> _requests;  // guarded by _mutex
-  std::vector<Taken> _held;                      // guarded by _mutex
+  std::vector<Held> _held;                       // guarded by _mutex
 };
 
 struct RecordedPowerLog final : platform::PowerLog {
@@ -90,8 +135,7 @@ struct RecordedPowerLog final : platform::PowerLog {
 // A platform over the parts above, with its files in a directory of its own. The pool is started.
 class TestPlatform {
  public:
-  explicit TestPlatform(std::size_t threads = 2);
-  ~TestPlatform();
+  explicit TestPlatform(std::size_t threads = 2) : _platform(make(threads)) {}
 
   platform::Platform& get() { return *_platform; }
   operator platform::Platform&() { return *_platform; }  // NOLINT(google-explicit-constructor): stands for the platform
@@ -99,14 +143,33 @@ class TestPlatform {
   TemporaryDirectory directory;
 
  private:
+  std::unique_ptr<platform::Platform> make(std::size_t threads) const {
+    platform::Platform::Parts parts;
+    parts.files.runtimeDirectory = directory / "run";
+    parts.files.stateDirectory = directory / "state";
+    parts.files.configurationDirectory = directory / "etc";
+    parts.files.frameworkDirectory = directory / "share";
+    parts.files.plugInsDirectory = directory / "PlugIns";
+    for (const char* name : {"run", "state", "etc", "share", "PlugIns"}) {
+      std::filesystem::create_directory(directory / name);
+    }
+    parts.clock = std::make_unique<TestClock>();
+    parts.device = std::make_unique<TestDevice>();
+    parts.defaults = std::make_unique<platform::UserDefaults>(parts.files.stateDirectory, "com.kovalt.orvanta");
+    parts.pool = std::make_unique<platform::WorkPool>(threads);
+    parts.pool->start();
+    parts.http = std::make_unique<ScriptedHttpClient>();
+    parts.powerLog = std::make_unique<RecordedPowerLog>();
+    return std::make_unique<platform::Platform>(std::move(parts));
+  }
   std::unique_ptr<platform::Platform> _platform;
 
  public:
   // Parts of the platform.
-  TestClock& clock;
-  TestDevice& device;
-  ScriptedHttpClient& http;
-  RecordedPowerLog& powerLog;
+  TestClock& clock = static_cast<TestClock&>(_platform->clock());
+  TestDevice& device = static_cast<TestDevice&>(_platform->device());
+  ScriptedHttpClient& http = static_cast<ScriptedHttpClient&>(_platform->http());
+  RecordedPowerLog& powerLog = static_cast<RecordedPowerLog&>(_platform->powerLog());
 };
 
 }  // namespace orvanta::test
