@@ -1,6 +1,6 @@
 #include "platform/DeviceProperties.h"
 
-#include <gtest/gtest.h>
+#include <gmock/gmock.h>
 #include <sched.h>
 #include <sys/mount.h>
 #include <sys/wait.h>
@@ -8,7 +8,6 @@
 
 #include <atomic>
 #include <cstdlib>
-#include <filesystem>
 #include <limits>
 #include <thread>
 
@@ -26,7 +25,7 @@ using Text = std::optional<std::string>;
 const std::string kMachineId = "0123456789abcdef0123456789abcdef\n";
 
 std::string plist(const std::string& entries) {
-  return "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\"><dict>" + entries + "</dict></plist>\n";
+  return "<plist><dict>" + entries + "</dict></plist>";
 }
 
 // What is read from each of these; nothing from the last ones.
@@ -49,20 +48,14 @@ TEST(SystemFacts, CountryOfALocale) {
 }
 
 TEST(SystemFacts, FirmwareTexts) {
-  const Texts rows = {{"Board X1\n", "Board X1"},
-                      {std::string("maker,board\0maker,soc\0", 22), "maker,board"},
-                      {" padded  \n", "padded"},
-                      {"To Be Filled By O.E.M.\n", {}},
-                      {"\n", {}},
-                      {"", {}}};
+  const Texts rows = {{" padded  \n", "padded"}, {"To Be Filled By O.E.M.\n", {}}, {"\n", {}}, {"", {}}};
   for (const auto& [content, expected] : rows) EXPECT_EQ(firmwareText(content), expected) << content;
 }
 
 TEST(SystemFacts, DerivedIdentifiers) {
   const Text first = deriveDeviceIdentifier(kMachineId, "app.one");
   ASSERT_TRUE(first);
-  EXPECT_EQ(first->size(), 40U);
-  EXPECT_EQ(first->find_first_not_of("0123456789abcdef"), std::string::npos);
+  EXPECT_THAT(*first, testing::MatchesRegex("[0-9a-f]{40}"));
   EXPECT_EQ(first, deriveDeviceIdentifier("0123456789abcdef0123456789abcdef", "app.one")) << "the line end is no part";
   EXPECT_NE(first, deriveDeviceIdentifier(kMachineId, "app.two"));
   EXPECT_EQ(first->find("0123456789abcdef"), std::string::npos);
@@ -74,12 +67,8 @@ TEST(SystemFacts, DerivedIdentifiers) {
 class DevicePropertiesTest : public testing::Test {
  protected:
   LinuxDeviceProperties make() const { return {_configuration.path(), "app.test", _root.path()}; }
-  void configure(const std::string& content) const {
-    _configuration.write("new", content);
-    std::filesystem::rename(_configuration / "new", _configuration / "device.plist");
-  }
-  TemporaryDirectory _configuration;
-  TemporaryDirectory _root;
+  void configure(const std::string& content) const { _configuration.replace("device.plist", content); }
+  TemporaryDirectory _configuration, _root;
   LogCapture _log;
 };
 
@@ -151,12 +140,6 @@ TEST_F(DevicePropertiesTest, SaysWhatItDoesNotUnderstand) {
   EXPECT_EQ(_log.count("<3>DeviceProperties: " + (_configuration / "device.plist") + " counts as empty"), 1U);
 }
 
-TEST_F(DevicePropertiesTest, IdentifiersAreCutAtFortyBytesBetweenCharacters) {
-  const auto device = make();
-  configure(plist("<key>UniqueDeviceID</key><string>" + std::string(39, 'a') + "\xc3\xa4" + "</string>"));
-  EXPECT_EQ(device.uniqueDeviceID(), std::string(39, 'a'));
-}
-
 // Environment and system files belong to the whole process, so these run in a child.
 template <class Body>
 void inChild(Body body) {
@@ -226,9 +209,7 @@ TEST_F(DevicePropertiesTest, SeveralThreadsAsk) {
       }
     });
   }
-  for (int i = 0; i < 50; ++i) {
-    configure(plist("<key>SerialNumber</key><string>S" + std::to_string(i) + "</string>"));
-  }
+  for (int i = 0; i < 50; ++i) configure(plist("<key>SerialNumber</key><string>S" + std::to_string(i) + "</string>"));
   done = true;
   for (auto& thread : threads) thread.join();
 }

@@ -7,8 +7,6 @@
 #include <atomic>
 #include <csignal>
 #include <filesystem>
-#include <fstream>
-#include <iterator>
 #include <thread>
 #include <vector>
 
@@ -25,22 +23,12 @@ using orvanta::test::TemporaryDirectory;
 namespace fs = std::filesystem;
 
 const char* const kDomain = "com.example.test";
-
-std::string contentOf(const std::string& path) {
-  std::ifstream file(path, std::ios::binary);
-  return {std::istreambuf_iterator<char>(file), {}};
-}
-std::string plist(const std::string& entries) {
-  return "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\"><dict>" + entries + "</dict></plist>\n";
-}
-// Replaces a file as other programs do: a new inode.
-void replaceFile(const std::string& path, const std::string& content) {
-  std::ofstream(path + ".other", std::ios::binary) << content;
-  fs::rename(path + ".other", path);
-}
+const char* const kFile = "com.example.test.plist";
 
 class UserDefaultsTest : public testing::Test {
  protected:
+  std::string content() const { return _directory.read(kFile); }
+
   TemporaryDirectory _directory;
   UserDefaults _defaults{_directory.path(), kDomain};
   LogCapture _log;
@@ -67,12 +55,8 @@ TEST_F(UserDefaultsTest, AnotherReadsWhatWasSetAndEachSettingSaysWhetherTheFileH
 TEST_F(UserDefaultsTest, NoticesEveryChangeByOthers) {
   for (int i = 0; i < 200; ++i) {
     const std::string value = std::to_string(100 + i);
-    const std::string content = plist("<key>key</key><string>" + value + "</string>");
-    if (i % 2 == 0) {
-      replaceFile(_defaults.path(), content);
-    } else {
-      std::ofstream(_defaults.path(), std::ios::binary) << content;
-    }
+    const std::string content = "<plist><dict><key>key</key><string>" + value + "</string></dict></plist>";
+    i % 2 == 0 ? _directory.replace(kFile, content) : _directory.write(kFile, content);
     ASSERT_EQ(_defaults.text("key"), value);
   }
   fs::remove(_defaults.path());
@@ -81,11 +65,11 @@ TEST_F(UserDefaultsTest, NoticesEveryChangeByOthers) {
 
 TEST_F(UserDefaultsTest, KeepsCorruptFilesAside) {
   for (const std::string bad : {"<plist><dict><key>a</key>", "", "bplist00\xff", "<plist><array/></plist>"}) {
-    replaceFile(_defaults.path(), bad);
+    _directory.replace(kFile, bad);
     _log.clear();
     for (int i = 0; i < 2; ++i) EXPECT_EQ(_defaults.value("a"), std::nullopt);
     EXPECT_EQ(_log.count("<3>UserDefaults: " + _defaults.path() + " is no property list, kept aside as"), 1U) << bad;
-    EXPECT_EQ(contentOf(_defaults.path() + ".corrupt"), bad);
+    EXPECT_EQ(_directory.read(std::string(kFile) + ".corrupt"), bad);
     EXPECT_FALSE(fs::exists(_defaults.path()));
     ASSERT_TRUE(_defaults.set("a", "new"));
     EXPECT_EQ(_defaults.text("a"), "new");
@@ -106,12 +90,12 @@ TEST_F(UserDefaultsTest, NeverWritesOverWhatItCannotRead) {
 
 TEST_F(UserDefaultsTest, AFailedWriteLeavesTheFileAsItWas) {
   ASSERT_TRUE(_defaults.set("key", "value"));
-  const std::string before = contentOf(_defaults.path());
+  const std::string before = content();
   EXPECT_FALSE(_defaults.set("bad", Array{Value()})) << "a null inside has no XML form";
   fs::create_directories(_defaults.path() + ".new/occupied");
   EXPECT_FALSE(_defaults.set("key", "other"));
   fs::remove_all(_defaults.path() + ".new");
-  EXPECT_EQ(contentOf(_defaults.path()), before);
+  EXPECT_EQ(content(), before);
   EXPECT_EQ(_defaults.text("key"), "value");
 }
 

@@ -87,19 +87,9 @@ int DaemonProcess::terminate() {
   return _process->wait();
 }
 
-std::string DaemonProcess::stateFile(const std::string& name) const {
-  std::ifstream file(stateDirectory() + "/" + name);
-  return {std::istreambuf_iterator<char>(file), {}};
-}
-
-std::size_t DaemonProcess::descriptorCount() const {
-  const auto entries = fs::directory_iterator("/proc/" + std::to_string(_process->pid()) + "/fd");
-  return static_cast<std::size_t>(std::distance(fs::begin(entries), fs::end(entries)));
-}
-
-std::size_t DaemonProcess::threadCount() const {
-  const auto entries = fs::directory_iterator("/proc/" + std::to_string(_process->pid()) + "/task");
-  return static_cast<std::size_t>(std::distance(fs::begin(entries), fs::end(entries)));
+std::size_t DaemonProcess::entries(const std::string& name) const {
+  const auto all = fs::directory_iterator("/proc/" + std::to_string(_process->pid()) + "/" + name);
+  return static_cast<std::size_t>(std::distance(fs::begin(all), fs::end(all)));
 }
 
 std::size_t DaemonProcess::residentKiB() const {

@@ -51,13 +51,13 @@ class DaemonProcess {
   std::string stateDirectory() const { return _directory / "state"; }
   std::string configurationDirectory() const { return _directory / "etc"; }
   // A file of the state directory; empty when there is none.
-  std::string stateFile(const std::string& name) const;
+  std::string stateFile(const std::string& name) const { return _directory.read("state/" + name); }
   std::string socketPath() const { return runtimeDirectory() + "/com.kovalt.orvantad"; }
   std::map<std::string, std::string> environment() const { return _environment; }
 
   // Open descriptors and threads of the daemon now, and its resident memory in KiB.
-  std::size_t descriptorCount() const;
-  std::size_t threadCount() const;
+  std::size_t descriptorCount() const { return entries("fd"); }
+  std::size_t threadCount() const { return entries("task"); }
   std::size_t residentKiB() const;
   // Counts until `counter` gives at most `limit`; false when it never does.
   bool settles(const std::function<std::size_t()>& counter, std::size_t limit) const;
@@ -67,6 +67,7 @@ class DaemonProcess {
 
  private:
   void launch();
+  std::size_t entries(const std::string& name) const;  // of a directory that /proc has for the daemon
   void writeSandboxProfile(std::int64_t landlockAbi);
 
   std::string _wrapper;

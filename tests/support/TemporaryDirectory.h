@@ -3,6 +3,7 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
 #include <stdexcept>
 #include <string>
 #include <string_view>
@@ -32,6 +33,16 @@ class TemporaryDirectory {
     std::filesystem::create_directories(file.parent_path());
     std::ofstream(file, std::ios::binary) << content;
     return file.string();
+  }
+  // The same as other programs do it: by a new file of that name.
+  std::string replace(std::string_view name, std::string_view content) const {
+    std::filesystem::rename(write("new", content), *this / name);
+    return *this / name;
+  }
+  // Empty when there is no such file.
+  std::string read(std::string_view name) const {
+    std::ifstream file(*this / name, std::ios::binary);
+    return {std::istreambuf_iterator<char>(file), {}};
   }
 
  private:
