@@ -2,7 +2,6 @@
 
 #include <unistd.h>
 
-#include <csignal>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
@@ -22,7 +21,14 @@ DaemonProcess::DaemonProcess(Options options) : _wrapper(options.wrapper) {
     _directory.write(name, *platform::writeXmlPropertyList(content));
   };
   for (const char* name : {"run", "state", "etc", "framework", "plugins"}) fs::create_directories(_directory / name);
-  writeSandboxProfile(options.landlockAbi);
+  // The shipped profile, with what only this build of the daemon needs.
+  constexpr const char* kProfile = "/sandbox/com.kovalt.orvantad.plist";
+  const auto shipped =
+      platform::readPropertyListFile(std::string(ORVANTA_SOURCE_DIR) + "/packaging/share/orvanta" + kProfile);
+  if (!shipped) throw std::runtime_error(shipped.error());
+  Dictionary profile = *shipped->dictionary();
+  profile.set("landlockABI", options.landlockAbi);
+  plist(std::string("framework") + kProfile, profile);
   plist("framework/framework.plist", {{"version", options.version}});
   if (!options.publicKey.empty()) {
     _directory.write("framework/publicKey.der",
@@ -51,16 +57,6 @@ DaemonProcess::DaemonProcess(Options options) : _wrapper(options.wrapper) {
   for (const auto& [name, value] : options.environment) _environment[name] = value;
 }
 
-// The shipped profile, with what only this build of the daemon needs.
-void DaemonProcess::writeSandboxProfile(std::int64_t landlockAbi) {
-  const auto shipped = platform::readPropertyListFile(std::string(ORVANTA_SOURCE_DIR) +
-                                                      "/packaging/share/orvanta/sandbox/com.kovalt.orvantad.plist");
-  if (!shipped) throw std::runtime_error(shipped.error());
-  Dictionary profile = *shipped->dictionary();
-  profile.set("landlockABI", landlockAbi);
-  _directory.write("framework/sandbox/com.kovalt.orvantad.plist", *platform::writeXmlPropertyList(profile));
-}
-
 void DaemonProcess::launch() {
   ChildProcess::Options options;
   options.program = programPath("orvantad");
@@ -72,19 +68,9 @@ void DaemonProcess::launch() {
   _process = std::make_unique<ChildProcess>(std::move(options));
 }
 
-bool DaemonProcess::start() {
-  launch();
-  return _process->waitForLine("main: Listener resumes with sandbox, start loop.");
-}
-
 bool DaemonProcess::startQuietly() {
   launch();
   return settles([this] { return platform::connectToService(runtimeDirectory(), "com.kovalt.orvantad") ? 0U : 1U; }, 0);
-}
-
-int DaemonProcess::terminate() {
-  _process->signal(SIGTERM);
-  return _process->wait();
 }
 
 std::size_t DaemonProcess::entries(const std::string& name) const {
@@ -106,10 +92,6 @@ bool DaemonProcess::settles(const std::function<std::size_t()>& counter, std::si
     std::this_thread::yield();
   }
   return true;
-}
-
-std::string DaemonProcess::programPath(const std::string& name) {
-  return std::string(ORVANTA_BIN_DIR) + "/" + name;
 }
 
 }  // namespace orvanta::test

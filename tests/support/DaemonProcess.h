@@ -1,5 +1,6 @@
 #pragma once
 
+#include <csignal>
 #include <cstdint>
 #include <functional>
 #include <map>
@@ -36,11 +37,17 @@ class DaemonProcess {
   explicit DaemonProcess(Options options);
 
   // Starts the program (again) and waits until it listens; false when it ended instead.
-  bool start();
+  bool start() {
+    launch();
+    return logged("main: Listener resumes with sandbox, start loop.");
+  }
   // The same for log levels at which it does not say that it listens: waits for its socket instead.
   bool startQuietly();
   // SIGTERM; the exit status.
-  int terminate();
+  int terminate() {
+    _process->signal(SIGTERM);
+    return _process->wait();
+  }
 
   ChildProcess& process() { return *_process; }
   // Shorthands on the log.
@@ -63,12 +70,11 @@ class DaemonProcess {
   bool settles(const std::function<std::size_t()>& counter, std::size_t limit) const;
 
   // The build's programs.
-  static std::string programPath(const std::string& name);
+  static std::string programPath(const std::string& name) { return std::string(ORVANTA_BIN_DIR) + "/" + name; }
 
  private:
   void launch();
   std::size_t entries(const std::string& name) const;  // of a directory that /proc has for the daemon
-  void writeSandboxProfile(std::int64_t landlockAbi);
 
   std::string _wrapper;
   TemporaryDirectory _directory;
