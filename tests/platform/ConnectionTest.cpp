@@ -16,21 +16,6 @@ using namespace std::chrono_literals;
 
 using ConnectionTest = ConnectionFixture;
 
-TEST_F(ConnectionTest, ABrokenStreamEndsItAfterTheFramesBefore) {
-  LogCapture log;
-  auto made =
-      open([](Connection& connection, Frame& frame) { connection.outbox()->send(response(frame.messageID, "done")); });
-  ASSERT_TRUE(made.peer.write(request(1, "a") + request(2, "b") + Bytes{0xc1}));
-  ASSERT_TRUE(made.delegate->waitForInvalidation());
-  EXPECT_EQ(made.delegate->methods(), (std::vector<std::string>{"a", "b"}));
-  EXPECT_TRUE(made.delegate->protocolError().has_value());
-  EXPECT_EQ(made.delegate->interruptions(), 0);
-  // The answers to what came before are not lost.
-  EXPECT_EQ(made.peer.readToEnd(), response(1, "done") + response(2, "done"));
-  EXPECT_FALSE(made.connection->outbox()->send(response(3, "late")));
-  EXPECT_TRUE(log.lines().empty()) << "saying why is the delegate's part";
-}
-
 TEST_F(ConnectionTest, CarriesOutEveryWholeFrameThatArrivedBeforeTheClose) {
   LogCapture log;
   Counter entered, closed;

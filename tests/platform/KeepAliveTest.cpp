@@ -30,8 +30,6 @@ TEST(KeepAliveTest, TellsTheServiceManagerWhenItBecomesBusyAndIdle) {
   keepAlive.end();
   KeepAlive::stopping();
   EXPECT_EQ(manager.heard(), (Messages{"STATUS=idle", "STOPPING=1"}));
-  EXPECT_EQ(keepAlive.begun(), 2U);
-  EXPECT_EQ(keepAlive.ended(), 2U);
 }
 
 TEST(KeepAliveTest, TheLastWordIsIdleHoweverThreadsMeet) {

@@ -66,14 +66,10 @@ TEST(Platform, makesEachOnceValueOnceWhateverThreadAsks) {
 
 using Ends = std::vector<std::string>;
 
-class TellingHttpClient final : public HttpClient {
+class TellingHttpClient final : public orvanta::test::ScriptedHttpClient {
  public:
   TellingHttpClient(WorkPool& pool, Ends& ends) : _pool(pool), _ends(ends) {}
   ~TellingHttpClient() override { _ends.emplace_back("client destroyed"); }
-  std::shared_ptr<HttpLane> makeLane(LaneKind) override { return std::make_shared<HttpLane>(); }
-  void start(const std::shared_ptr<HttpLane>&, HttpRequest, Observer, Completion) override {}
-  HttpResult perform(const std::shared_ptr<HttpLane>&, HttpRequest) override { return {}; }
-  void abortBlockingRequests() override {}
   void shutdown(std::chrono::milliseconds) override {
     EXPECT_EQ(_pool.threadCount(), 1U) << "nobody would run the last completions";
     _ends.emplace_back("client shut down");

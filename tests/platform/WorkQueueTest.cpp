@@ -76,21 +76,6 @@ TEST_F(WorkQueueTest, DifferentQueuesRunAtOnce) {
   EXPECT_TRUE(met.waitFor(2));
 }
 
-TEST_F(WorkQueueTest, IsCurrentOnlyInItsOwnJobs) {
-  const auto other = _pool.makeQueue();
-  onQueue([&] {
-    EXPECT_TRUE(_queue->isCurrent());
-    EXPECT_FALSE(other->isCurrent());
-  });
-  Counter done;
-  _pool.post([&] {
-    EXPECT_FALSE(_queue->isCurrent());
-    done.add();
-  });
-  ASSERT_TRUE(done.waitFor(1));
-  EXPECT_FALSE(_queue->isCurrent());
-}
-
 TEST(WorkPoolTest, HasThreadsFromStartToStopWhichLetsTheRunningJobEnd) {
   Counter ran;
   WorkPool pool(2);

@@ -41,7 +41,7 @@ struct TestDevice final : platform::DeviceProperties {
 
 // An HTTP client without a network: gathers requests, answers each from a script or when a test says so. Completions
 // run on the calling thread. Thread-safe.
-class ScriptedHttpClient final : public platform::HttpClient {
+class ScriptedHttpClient : public platform::HttpClient {
  public:
   // The answer to requests that nobody holds; default 200 with an empty body. May be called on several threads at once.
   std::function<platform::HttpResult(const platform::HttpRequest&)> answer;

@@ -59,8 +59,7 @@ class MessageLogTest : public testing::Test {
     return found;
   }
   std::string content(const std::string& name) const {
-    std::ifstream file(directory + "/" + name);
-    return {std::istreambuf_iterator<char>(file), {}};
+    return platform.directory.read("state/Logs/Faultline/Retired/" + name);
   }
   std::string nameForNow() const {
     return "orvantad_" + std::to_string(static_cast<int>(platform.clock.wallSeconds())) + "_messageLog.diag";
@@ -82,31 +81,23 @@ TEST(MessageLogName, hasThreePieces) {
   EXPECT_TRUE(isMessageLogName(messageLogName(-1)));
 }
 
-TEST_F(MessageLogTest, theFirstLineMakesTheDirectoryAndTheFile) {
+TEST_F(MessageLogTest, theFirstLineMakesTheDirectoryAndTheFileAndLaterOnesAreAppendedAsTheyAre) {
   fs::remove_all(platform.get().files().stateDirectory + "/Logs");
   platform.clock.set(1795532645.75);
   const std::string path = directory + "/orvantad_1795532645_messageLog.diag";
   const test::LogCapture log;
   writeToLogFile(platform, "[http_post -> flushMessages] done");
+  platform.clock.advance(60);
+  writeToLogFile(platform, "two\nlines\n");
+  writeToLogFile(platform, "");
+  const std::string saved = "<6>writeToLogFile: Saved log message to " + path;
   EXPECT_THAT(log.lines(), ElementsAre("<6>writeToLogFile: Creating orvantad log directory at " + directory,
                                        "<6>writeToLogFile: Created new orvantad log file " + path + " (" +
                                            platform::describeDate(birthTime(path)) + ")",
-                                       "<6>writeToLogFile: Saved log message to " + path));
+                                       saved, saved, saved));
   EXPECT_EQ(content("orvantad_1795532645_messageLog.diag"),
-            "(2026-11-24 15:04:05 +0000) [http_post -> flushMessages] done\n");
-}
-
-TEST_F(MessageLogTest, laterLinesAreAppendedAsTheyAre) {
-  const std::string name = nameForNow();
-  const std::string first = prefix();
-  writeToLogFile(platform, "one");
-  platform.clock.advance(60);
-  const test::LogCapture log;
-  writeToLogFile(platform, "two\nlines\n");
-  writeToLogFile(platform, "");
-  EXPECT_EQ(content(name), first + "one\n" + prefix() + "two\nlines\n\n" + prefix() + "\n");
-  const std::string saved = "<6>writeToLogFile: Saved log message to " + directory + "/" + name;
-  EXPECT_THAT(log.lines(), ElementsAre(saved, saved));
+            "(2026-11-24 15:04:05 +0000) [http_post -> flushMessages] done\n"
+            "(2026-11-24 15:05:05 +0000) two\nlines\n\n(2026-11-24 15:05:05 +0000) \n");
 }
 
 TEST_F(MessageLogTest, aFileIsReplacedOnceItIsMoreThanADayOld) {
