@@ -1,8 +1,8 @@
 #include <memory>
-#include <vector>
 
 #include "interface/RemoteCalls.h"
 #include "tests/fuzz/Require.h"
+#include "tests/support/NotedSession.h"
 
 namespace {
 
@@ -29,51 +29,6 @@ class Answers final : public platform::Outbox {
 
   std::uint32_t expected = 0;
   int count = 0;
-};
-
-// Answers with what it was given, or, when told to, with nothing.
-class Echo final : public ClientSessionInterface {
- public:
-  bool drops = false;
-
-  void setSessionInfo(SharedDictionary info, SharedDictionary, SharedArray, bool, DoneReply done) override {
-    REQUIRE(info != nullptr);
-    if (!drops) done();
-  }
-  void startConfigWithCompletionHandler(BackendNamesReply reply) override { names(std::move(reply)); }
-  void fetchStatesWithUserInfo(SharedDictionary, BackendNamesReply reply) override { names(std::move(reply)); }
-  void fetchDisplayURL(StringReply reply) override { text(nullptr, std::move(reply)); }
-  void sendMessageWithCategory(std::uint16_t, std::uint16_t, SharedDictionary payload, StringReply reply) override {
-    text(payload, std::move(reply));
-  }
-  void sendMessageWithDictionary(SharedDictionary parameters, StringReply reply) override {
-    REQUIRE(parameters != nullptr);
-    text(parameters, std::move(reply));
-  }
-  void flushMessagesWithCompletion(FlushReply reply) override {
-    if (!drops) reply("flushed", makeOrvantaError("description", 503));
-  }
-  void finishSessionWithReply(StringReply reply) override { text(nullptr, std::move(reply)); }
-  void uploadFileAtPath(std::string, std::optional<std::string>, UploadReply reply) override {
-    if (!drops) reply(true);
-  }
-  void uploadLogData(SharedArray, LogDataReply reply) override {
-    if (!drops) reply(false, makeOrvantaError("description", -1));
-  }
-  void sendMessageWithSessionInfo(SharedDictionary info, SharedDictionary, std::uint16_t, std::uint16_t,
-                                  SharedDictionary payload, StringReply reply) override {
-    REQUIRE(info != nullptr);
-    text(payload, std::move(reply));
-  }
-
- private:
-  void names(BackendNamesReply reply) {
-    if (!drops) reply(std::vector<std::string>{"one", "two"});
-  }
-  void text(const SharedDictionary& given, StringReply reply) {
-    if (drops) return;
-    reply(given ? std::optional(platform::Value(*given).description()) : std::nullopt);
-  }
 };
 
 template <class... Values>
@@ -112,8 +67,8 @@ void takeAsClient(Frame frame) {
 // answers or drops its replies; either way each request has one answer and a notification none.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
   if (size == 0) return 0;
-  Echo session;
-  session.drops = (bytes[0] & 1U) != 0;
+  test::NotedSession session;
+  if ((bytes[0] & 1U) != 0) session.fate = test::NotedSession::dropped;
   const auto answers = std::make_shared<Answers>();
   FrameDecoder decoder({4096, 64U << 10U, 16});
   decoder.append({bytes + 1, size - 1});

@@ -2,10 +2,9 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/MessagePack.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/NotedSession.h"
 #include "tests/support/RecordingConnection.h"
-#include "tests/support/TestPlatform.h"
 
 namespace orvanta::test {
 namespace {
@@ -14,65 +13,6 @@ using platform::Array;
 using platform::Dictionary;
 using platform::Frame;
 using platform::Value;
-
-// Notes which operation was called with what.
-class NotedSession final : public ClientSessionInterface {
- public:
-  std::string called;
-  enum { given, dropped, kept } fate = given;  // of replies with a text
-  StringReply keptReply;
-
-  void setSessionInfo(SharedDictionary info, SharedDictionary user, SharedArray frameworks, bool aggregates,
-                      DoneReply done) override {
-    called = "setSessionInfo " + Value(*info).description() + (user ? " user" : "") +
-             (frameworks ? " frameworks" : "") + (aggregates ? " aggregates" : "");
-    done();
-  }
-  void startConfigWithCompletionHandler(BackendNamesReply reply) override {
-    called = "start";
-    reply(std::vector<std::string>{"a", "b"});
-  }
-  void fetchStatesWithUserInfo(SharedDictionary user, BackendNamesReply reply) override {
-    called = user ? "states with user info" : "states";
-    reply(std::nullopt);
-  }
-  void fetchDisplayURL(StringReply reply) override { answer("url", std::move(reply)); }
-  void sendMessageWithCategory(std::uint16_t category, std::uint16_t type, SharedDictionary payload,
-                               StringReply reply) override {
-    called = "send " + std::to_string(category) + " " + std::to_string(type) + (payload ? " payload" : "");
-    answer(called, std::move(reply));
-  }
-  void sendMessageWithDictionary(SharedDictionary parameters, StringReply reply) override {
-    answer("dictionary " + std::to_string(parameters->size()), std::move(reply));
-  }
-  void flushMessagesWithCompletion(FlushReply reply) override {
-    called = "flush";
-    reply("text", makeOrvantaError("went wrong", 503));
-  }
-  void finishSessionWithReply(StringReply reply) override {
-    called = "finish";
-    reply(std::nullopt);
-  }
-  void uploadFileAtPath(std::string url, std::optional<std::string> token, UploadReply reply) override {
-    called = "upload " + url + " " + token.value_or("-");
-    reply(true);
-  }
-  void uploadLogData(SharedArray data, LogDataReply reply) override {
-    called = "log data " + std::to_string(data->size());
-    reply(false, std::nullopt);
-  }
-  void sendMessageWithSessionInfo(SharedDictionary, SharedDictionary user, std::uint16_t category, std::uint16_t,
-                                  SharedDictionary, StringReply reply) override {
-    answer("one-off " + std::to_string(category) + (user ? " user" : ""), std::move(reply));
-  }
-
- private:
-  void answer(std::string text, StringReply reply) {
-    called = text;
-    if (fate == given) reply(std::move(text));
-    if (fate == kept) keptReply = std::move(reply);
-  }
-};
 
 class RemoteCallsTest : public ::testing::Test {
  protected:
@@ -106,13 +46,13 @@ TEST_F(RemoteCallsTest, EveryOperationArrivesWithItsArgumentsAndAnswersInItsShap
       {"fetchDisplayURL", {}, "url"},
       {"sendMessageWithCategory", {65535, 0, nullptr}, "send 65535 0"},
       {"sendMessageWithCategory", {1, 2, info}, "send 1 2 payload"},
-      {"sendMessageWithDictionary", {info}, "dictionary 1"},
+      {"sendMessageWithDictionary", {info}, "dictionary {sessionID = 1}"},
       {"flushMessagesWithCompletion", {}, "flush"},
       {"finishSessionWithReply", {}, "finish"},
       {"uploadFileAtPath", {"file:///a", nullptr}, "upload file:///a -"},
       {"uploadFileAtPath", {"file:///a", "t"}, "upload file:///a t"},
       {"uploadLogData", {Value(Array{1, 2})}, "log data 2"},
-      {"sendMessageWithSessionInfo", {info, nullptr, 3, 4, nullptr}, "one-off 3"},
+      {"sendMessageWithSessionInfo", {info, nullptr, 3, 4, nullptr}, "one-off {sessionID = 1} 3"},
   };
   for (const auto& [method, params, called] : rows) {
     EXPECT_TRUE(dispatch(method, params)) << method;

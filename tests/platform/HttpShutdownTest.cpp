@@ -42,15 +42,6 @@ class HttpShutdownTest : public HttpFixture {
   }
 };
 
-TEST_F(HttpShutdownTest, RequestsThatEndInTimeGetTheirAnswers) {
-  RawServer server(answering("200 OK"));
-  const auto lane = client().makeLane();
-  std::vector<std::future<HttpResult>> results;
-  for (int i = 0; i < 30; ++i) results.push_back(start(lane, post(server.url())));
-  client().shutdown(seconds(30));
-  for (auto& result : results) EXPECT_EQ(statusOf(await(result)), 200);
-}
-
 TEST_F(HttpShutdownTest, TheRestFailsAndCompletes) {
   RawServer server(beSilent);
   const auto lane = client().makeLane();
