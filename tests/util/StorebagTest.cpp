@@ -124,7 +124,7 @@ TEST_F(StorebagFetchTest, asksConditionallyOnceItHoldsAStamp) {
 
 TEST_F(StorebagFetchTest, anEmptyAnswerIsUnchangedOnlyWithBothStamps) {
   const std::vector<HttpHeader> stamp{{"Last-Modified", "new"}};
-  const std::string forged = StorebagSigner("stranger").document(bag);
+  const std::string forged = StorebagSigner(SigningKey::generate().value()).document(bag);
   const struct {
     const char* what;
     std::optional<std::string> held;
