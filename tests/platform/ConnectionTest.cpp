@@ -8,6 +8,7 @@
 
 #include "tests/platform/ConnectionFixture.h"
 #include "tests/support/LogCapture.h"
+#include "tests/support/Threads.h"
 
 namespace orvanta::test {
 namespace {
@@ -126,9 +127,7 @@ TEST_F(ConnectionTest, ABusyConnectionLetsOthersHaveTheirTurn) {
 TEST_F(ConnectionTest, CancelFromSeveralThreadsEndsItOnce) {
   auto made = open();
   ASSERT_TRUE(made.peer.write(notification("call")));
-  std::vector<std::thread> threads;
-  for (int i = 0; i < 4; ++i) threads.emplace_back([&] { made.connection->cancel(); });
-  for (auto& thread : threads) thread.join();
+  inThreads(4, [&](int) { made.connection->cancel(); });
   ASSERT_TRUE(made.delegate->waitForInvalidation());
   EXPECT_TRUE(made.peer.atEnd());
   onQueueOf(*made.connection, [] {});

@@ -6,10 +6,10 @@
 #include <openssl/x509.h>
 
 #include <algorithm>
-#include <thread>
 #include <vector>
 
 #include "tests/support/Bytes.h"
+#include "tests/support/Threads.h"
 
 namespace platform {
 namespace {
@@ -42,13 +42,9 @@ TEST(Digest, KnownAnswers) {
 }
 
 TEST(Digest, ThreadsDoNotDisturbEachOther) {
-  std::vector<std::thread> threads;
-  for (int i = 0; i < 4; ++i) {
-    threads.emplace_back([expected = sha256(bytesOf("x"))] {
-      for (int n = 0; n < 500; ++n) EXPECT_EQ(sha256(bytesOf("x")), expected);
-    });
-  }
-  for (auto& thread : threads) thread.join();
+  orvanta::test::inThreads(4, [expected = sha256(bytesOf("x"))](int) {
+    for (int n = 0; n < 500; ++n) EXPECT_EQ(sha256(bytesOf("x")), expected);
+  });
 }
 
 template <class Encoder>

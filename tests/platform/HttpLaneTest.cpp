@@ -1,4 +1,3 @@
-#include <atomic>
 #include <filesystem>
 #include <fstream>
 #include <functional>

@@ -7,7 +7,6 @@
 #include <filesystem>
 #include <fstream>
 #include <set>
-#include <thread>
 #include <vector>
 
 #include "platform/Json.h"
@@ -15,6 +14,7 @@
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/TestClock.h"
+#include "tests/support/Threads.h"
 
 namespace platform {
 namespace {
@@ -98,15 +98,11 @@ TEST_F(JsonLinesPowerLogTest, followsNoLink) {
 
 TEST_F(JsonLinesPowerLogTest, recordsOfSeveralThreadsStayWhole) {
   JsonLinesPowerLog log(path, clock, 16U << 20U);
-  std::vector<std::thread> threads;
-  for (int thread = 0; thread < 4; ++thread) {
-    threads.emplace_back([&log, thread] {
-      for (int record = 0; record < 100; ++record) {
-        log.registeredEvent(thread * 100 + record, "s", {{"filler", std::string(500, 'f')}});
-      }
-    });
-  }
-  for (std::thread& thread : threads) thread.join();
+  orvanta::test::inThreads(4, [&log](int thread) {
+    for (int record = 0; record < 100; ++record) {
+      log.registeredEvent(thread * 100 + record, "s", {{"filler", std::string(500, 'f')}});
+    }
+  });
   std::set<std::int64_t> events;
   for (const std::string& line : lines()) {
     const auto parsed = parseJson(line);

@@ -3,10 +3,10 @@
 #include <gtest/gtest.h>
 
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "tests/support/ServiceManager.h"
+#include "tests/support/Threads.h"
 
 namespace orvanta::test {
 namespace {
@@ -37,14 +37,10 @@ TEST(KeepAliveTest, TheLastWordIsIdleHoweverThreadsMeet) {
   manager.setEnvironment();
   KeepAlive keepAlive;
   for (int round = 0; round < 20; ++round) {
-    std::vector<std::thread> threads;
-    for (int i = 0; i < 4; ++i) {
-      threads.emplace_back([&] {
-        keepAlive.begin();
-        keepAlive.end();
-      });
-    }
-    for (auto& thread : threads) thread.join();
+    inThreads(4, [&](int) {
+      keepAlive.begin();
+      keepAlive.end();
+    });
     ASSERT_EQ(manager.heard().back(), "STATUS=idle");
   }
 }

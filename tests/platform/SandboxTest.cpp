@@ -13,7 +13,6 @@
 
 #include <algorithm>
 #include <csignal>
-#include <cstdio>
 #include <ctime>
 #include <filesystem>
 #include <functional>

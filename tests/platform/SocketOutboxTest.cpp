@@ -6,7 +6,6 @@
 #include <algorithm>
 #include <atomic>
 #include <future>
-#include <thread>
 
 #include "platform/Connection.h"
 #include "tests/platform/ConnectionFixture.h"

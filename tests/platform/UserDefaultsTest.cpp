@@ -7,13 +7,13 @@
 #include <atomic>
 #include <csignal>
 #include <filesystem>
-#include <thread>
 #include <vector>
 
 #include "platform/PropertyList.h"
 #include "tests/platform/Waiting.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
+#include "tests/support/Threads.h"
 
 namespace platform {
 namespace {
@@ -143,15 +143,12 @@ TEST_F(UserDefaultsTest, WritersInSeveralProcessesAndThreadsLoseNothing) {
   ASSERT_TRUE(inProcesses(kProcesses, [&](int process) {
     UserDefaults defaults(_directory.path(), kDomain);
     std::atomic<int> written{0};
-    const auto write = [&](int first) {
+    orvanta::test::inThreads(2, [&](int first) {
       for (int i = first; i < kWrites; i += 2) {
         const std::string key = std::to_string(process) + "/" + std::to_string(i);
         written += defaults.set(key, i).ok() && defaults.value(key) ? 1 : 0;
       }
-    };
-    std::thread other(write, 1);
-    write(0);
-    other.join();
+    });
     return written == kWrites;
   }));
   EXPECT_EQ(_defaults.all().size(), std::size_t{kProcesses * kWrites});
@@ -161,15 +158,10 @@ TEST_F(UserDefaultsTest, OneStoredValueWinsInAllProcessesAndThreads) {
   for (int round = 0; round < 10; ++round) {
     const std::string key = "identifier" + std::to_string(round);
     ASSERT_TRUE(inProcesses(3, [&](int process) {
-      std::vector<std::thread> threads;
-      std::vector<Value> values(2);
+      Value values[2];
       UserDefaults defaults(_directory.path(), kDomain);
-      for (std::size_t i = 0; i < values.size(); ++i) {
-        threads.emplace_back([&, i] {
-          values[i] = defaults.valueOrStore(key, [&] { return Value(process * 10 + static_cast<int>(i)); });
-        });
-      }
-      for (auto& thread : threads) thread.join();
+      orvanta::test::inThreads(
+          2, [&](int i) { values[i] = defaults.valueOrStore(key, [&] { return Value(process * 10 + i); }); });
       return values[0] == values[1] && UserDefaults(_directory.path(), kDomain).value(key) == values[0];
     }));
   }

@@ -5,13 +5,12 @@
 
 #include <atomic>
 #include <memory>
-#include <optional>
 #include <thread>
 #include <vector>
 
-#include "platform/PoolThreads.h"
 #include "platform/UniqueFd.h"
 #include "tests/platform/Waiting.h"
+#include "tests/support/Threads.h"
 
 namespace platform {
 namespace {
@@ -43,25 +42,20 @@ using WorkQueueTest = QueueFixture;
 using TimerTest = QueueFixture;
 
 TEST_F(WorkQueueTest, RunsJobsOneAtATimeAndInEachPostersOrder) {
-  constexpr int kPosters = 4;
-  constexpr int kJobs = 500;
+  constexpr int kPosters = 4, kJobs = 500;
   int next[kPosters] = {};  // no lock: the queue is one
   int inside = 0;
   Counter done;
-  std::vector<std::thread> posters;
-  for (int& expected : next) {
-    posters.emplace_back([&] {
-      for (int job = 0; job < kJobs; ++job) {
-        _queue->post([&, job] {
-          EXPECT_EQ(++inside, 1);
-          EXPECT_EQ(expected++, job);
-          --inside;
-          done.add();
-        });
-      }
-    });
-  }
-  for (auto& poster : posters) poster.join();
+  orvanta::test::inThreads(kPosters, [&](int poster) {
+    for (int job = 0; job < kJobs; ++job) {
+      _queue->post([&, poster, job] {
+        EXPECT_EQ(++inside, 1);
+        EXPECT_EQ(next[poster]++, job);
+        --inside;
+        done.add();
+      });
+    }
+  });
   ASSERT_TRUE(done.waitFor(kPosters * kJobs));
 }
 

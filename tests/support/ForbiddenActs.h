@@ -1,21 +1,18 @@
 #pragma once
 
 #include <fcntl.h>
-#include <netinet/in.h>
 #include <sys/inotify.h>
 #include <sys/mman.h>
 #include <sys/mount.h>
 #include <sys/ptrace.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstdint>
 #include <cstring>
-#include <functional>
 #include <string>
 
 #include "platform/UniqueFd.h"

@@ -2,7 +2,6 @@
 
 #include <sys/socket.h>
 
-#include <optional>
 #include <stdexcept>
 #include <string>
 #include <string_view>

@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "tests/support/LogCapture.h"
+#include "tests/support/Threads.h"
 
 namespace orvanta {
 namespace {
@@ -58,19 +59,12 @@ TEST(Compression, roundTripsThroughBothContainers) {
 }
 
 TEST(Compression, threadsDoNotShareStreams) {
-  std::vector<std::thread> threads;
-  std::vector<int> failures(4);
-  for (std::size_t index = 0; index < failures.size(); ++index) {
-    threads.emplace_back([&failures, index] {
-      for (std::size_t round = 1; round <= 50; ++round) {
-        const std::string input = randomBytes(index * 1000 + round);
-        const auto compressed = gzipDeflate(input);
-        if (!compressed || inflated(*compressed, kGzip, input.size()) != input) ++failures[index];
-      }
-    });
-  }
-  for (std::thread& thread : threads) thread.join();
-  EXPECT_EQ(failures, std::vector<int>(4));
+  test::inThreads(4, [](int thread) {
+    for (int round = 1; round <= 50; ++round) {
+      const std::string input = randomBytes(static_cast<std::size_t>(thread * 1000 + round));
+      EXPECT_EQ(inflated(gzipDeflate(input).value_or(""), kGzip, input.size()), input);
+    }
+  });
 }
 
 TEST(Compression, logsWhatItDid) {

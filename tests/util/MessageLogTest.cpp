@@ -9,10 +9,10 @@
 #include <filesystem>
 #include <fstream>
 #include <set>
-#include <thread>
 
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
+#include "tests/support/Threads.h"
 #include "util/MessageLogDirectory.h"
 
 namespace orvanta {
@@ -183,15 +183,11 @@ TEST_F(MessageLogTest, aLineThatDoesNotFitOnTheDiskExpiresTheFile) {
 TEST_F(MessageLogTest, linesOfSeveralThreadsDoNotMix) {
   writeToLogFile(platform, "start");
   std::multiset<std::string> expected = {prefix() + "start"};
-  std::vector<std::thread> threads;
-  for (char thread = '0'; thread < '4'; ++thread) {
-    const std::string text = thread + std::string(3000, '.');
-    for (int line = 0; line < 100; ++line) expected.insert(prefix() + text);
-    threads.emplace_back([this, text] {
-      for (int line = 0; line < 100; ++line) writeToLogFile(platform, text);
-    });
-  }
-  for (std::thread& thread : threads) thread.join();
+  const auto text = [](int thread) { return std::to_string(thread) + std::string(3000, '.'); };
+  for (int line = 0; line < 400; ++line) expected.insert(prefix() + text(line % 4));
+  test::inThreads(4, [&](int thread) {
+    for (int line = 0; line < 100; ++line) writeToLogFile(platform, text(thread));
+  });
   ASSERT_THAT(names(), ElementsAre(nameForNow()));
   std::ifstream file(directory + "/" + nameForNow());
   std::multiset<std::string> lines;
