@@ -1,29 +1,12 @@
 #include "tests/backends/HTTPSFixture.h"
 
-#include <zlib.h>
-
-#include <stdexcept>
-
 #include "platform/Json.h"
+#include "tools/collector/BodyDecoder.h"
 
 namespace orvanta::test {
 
 std::string gunzip(const std::string& bytes) {
-  z_stream stream{};
-  if (::inflateInit2(&stream, 15 + 16) != Z_OK) throw std::runtime_error("inflateInit2 failed");
-  std::string out, chunk(65536, '\0');
-  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes.data()));
-  stream.avail_in = static_cast<uInt>(bytes.size());
-  int result = Z_OK;
-  while (result == Z_OK) {
-    stream.next_out = reinterpret_cast<Bytef*>(chunk.data());
-    stream.avail_out = static_cast<uInt>(chunk.size());
-    result = ::inflate(&stream, Z_NO_FLUSH);
-    out.append(chunk, 0, chunk.size() - stream.avail_out);
-  }
-  ::inflateEnd(&stream);
-  if (result != Z_STREAM_END) throw std::runtime_error("not a whole gzip member");
-  return out;
+  return collector::inflateBody(bytes, 64U << 20U).value();
 }
 
 std::string headerOf(const platform::HttpRequest& request, std::string_view name) {

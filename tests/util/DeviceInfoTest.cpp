@@ -37,18 +37,6 @@ TEST(DeviceInfo, copiesTheDeviceIdentifierIntoItsBuffer) {
   }
 }
 
-TEST(DeviceInfo, internalBuildIsDecidedOnce) {
-  const std::pair<std::optional<std::string>, bool> rows[] = {
-      {"Internal", true}, {"internal", false}, {"Internal ", false}, {"Beta", false}, {std::nullopt, false}};
-  for (const auto& [releaseType, expected] : rows) {
-    test::TestPlatform platform;
-    platform.device.release = releaseType;
-    EXPECT_EQ(isInternalBuild(platform), expected) << releaseType.value_or("none");
-    platform.device.release = expected ? "Beta" : "Internal";
-    EXPECT_EQ(isInternalBuild(platform), expected) << "asked again";
-  }
-}
-
 TEST(DeviceInfo, persistentIdentifiersSurviveARestart) {
   const std::tuple<std::optional<std::string>, std::optional<std::string>, std::string> rows[] = {
       {{}, {}, "uuid::"}, {"Mail", {}, "uuid:Mail:"}, {{}, "Mail", "uuid::Mail"}, {"Mail", "push", "uuid:Mail:push"}};

@@ -6,6 +6,7 @@
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
 #include "tests/util/SignedStorebag.h"
+#include "util/DeviceInfo.h"
 
 namespace orvanta::test {
 namespace {
@@ -86,6 +87,8 @@ TEST(StorebagServer, isTheOverrideOrFollowsTheBuildOnce) {
       // setting, release type, address
       {std::nullopt, std::nullopt, "https://bags.kovalt.com/bags/tamrel"},
       {std::nullopt, "Internal", "https://internal-bags.kovalt.com/storebags/tamrel"},
+      {std::nullopt, "internal", "https://bags.kovalt.com/bags/tamrel"},
+      {std::nullopt, "Internal ", "https://bags.kovalt.com/bags/tamrel"},
       {local, "Internal", local},
       {local, std::nullopt, local},
   };
@@ -94,6 +97,9 @@ TEST(StorebagServer, isTheOverrideOrFollowsTheBuildOnce) {
     platform.device.release = releaseType;
     if (setting) platform.get().defaults().set("orvanta_storebag_url", *setting);
     EXPECT_EQ(storebagServerURL(platform), expected);
+    EXPECT_EQ(isInternalBuild(platform), releaseType == "Internal");
+    platform.device.release = releaseType == "Internal" ? "Beta" : "Internal";
+    EXPECT_EQ(isInternalBuild(platform), releaseType == "Internal") << "asked again";
     ASSERT_TRUE(platform.get().defaults().set("orvanta_storebag_url", "http://other.kovalt.com"));
     EXPECT_EQ(storebagServerURL(platform), expected) << "asked again";
   }
