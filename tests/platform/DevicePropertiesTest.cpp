@@ -9,11 +9,11 @@
 #include <atomic>
 #include <cstdlib>
 #include <limits>
-#include <thread>
 
 #include "platform/SystemFacts.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
+#include "tests/support/Threads.h"
 
 namespace platform {
 namespace {
@@ -200,18 +200,16 @@ TEST_F(DevicePropertiesTest, SeveralThreadsAsk) {
   configure(plist("<key>SerialNumber</key><string>S0</string>"));
   const auto device = make();
   std::atomic<bool> done{false};
-  std::vector<std::thread> threads;
-  for (int i = 0; i < 3; ++i) {
-    threads.emplace_back([&] {
-      while (!done) {
-        EXPECT_EQ(device.serialNumber().value_or("none")[0], 'S');
-        device.timeZoneOffset(1'700'000'000);
-      }
-    });
-  }
-  for (int i = 0; i < 50; ++i) configure(plist("<key>SerialNumber</key><string>S" + std::to_string(i) + "</string>"));
-  done = true;
-  for (auto& thread : threads) thread.join();
+  orvanta::test::inThreads(4, [&](int thread) {
+    for (int i = 0; thread == 0 && i < 50; ++i) {
+      configure(plist("<key>SerialNumber</key><string>S" + std::to_string(i) + "</string>"));
+    }
+    if (thread == 0) done = true;
+    while (!done) {
+      EXPECT_EQ(device.serialNumber().value_or("none")[0], 'S');
+      device.timeZoneOffset(1'700'000'000);
+    }
+  });
 }
 
 }  // namespace

@@ -14,12 +14,10 @@
 namespace platform {
 namespace {
 
+using orvanta::test::bytesOf;
 using orvanta::test::fromHex;
 using Bytes = std::vector<std::uint8_t>;
 
-Bytes bytesOf(std::string_view text) {
-  return {text.begin(), text.end()};
-}
 Bytes joined(std::initializer_list<Bytes> parts) {
   Bytes all;
   for (const Bytes& part : parts) all.insert(all.end(), part.begin(), part.end());

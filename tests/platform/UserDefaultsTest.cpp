@@ -137,34 +137,23 @@ bool inProcesses(int count, Body body) {
   return ok;
 }
 
-TEST_F(UserDefaultsTest, WritersInSeveralProcessesAndThreadsLoseNothing) {
-  constexpr int kProcesses = 4;
-  constexpr int kWrites = 25;
+TEST_F(UserDefaultsTest, ProcessesAndThreadsLoseNothingAndAgreeOnWhatIsStoredOnce) {
+  constexpr int kProcesses = 4, kRounds = 25;
   ASSERT_TRUE(inProcesses(kProcesses, [&](int process) {
     UserDefaults defaults(_directory.path(), kDomain);
-    std::atomic<int> written{0};
-    orvanta::test::inThreads(2, [&](int first) {
-      for (int i = first; i < kWrites; i += 2) {
-        const std::string key = std::to_string(process) + "/" + std::to_string(i);
-        written += defaults.set(key, i).ok() && defaults.value(key) ? 1 : 0;
+    std::atomic<int> right{0};
+    orvanta::test::inThreads(2, [&](int thread) {
+      const std::string mine = std::to_string(process * 2 + thread);
+      for (int round = 0; round < kRounds; ++round) {
+        const std::string once = "once " + std::to_string(round);
+        const Value stored = defaults.valueOrStore(once, [&] { return Value(mine); });
+        const bool kept = defaults.set(mine + "/" + std::to_string(round), round).ok();
+        right += kept && UserDefaults(_directory.path(), kDomain).value(once) == stored ? 1 : 0;
       }
     });
-    return written == kWrites;
+    return right == 2 * kRounds;
   }));
-  EXPECT_EQ(_defaults.all().size(), std::size_t{kProcesses * kWrites});
-}
-
-TEST_F(UserDefaultsTest, OneStoredValueWinsInAllProcessesAndThreads) {
-  for (int round = 0; round < 10; ++round) {
-    const std::string key = "identifier" + std::to_string(round);
-    ASSERT_TRUE(inProcesses(3, [&](int process) {
-      Value values[2];
-      UserDefaults defaults(_directory.path(), kDomain);
-      orvanta::test::inThreads(
-          2, [&](int i) { values[i] = defaults.valueOrStore(key, [&] { return Value(process * 10 + i); }); });
-      return values[0] == values[1] && UserDefaults(_directory.path(), kDomain).value(key) == values[0];
-    }));
-  }
+  EXPECT_EQ(_defaults.all().size(), std::size_t{(2 * kProcesses + 1) * kRounds});
 }
 
 // A writer killed at any moment leaves a whole file, and no lock or temporary file that stops the next writer.

@@ -347,11 +347,9 @@ TEST_F(StorebagVerificationTest, refusesDocumentsWithoutWhatItNeeds) {
 }
 
 TEST_F(StorebagVerificationTest, needsAKeyAndTakesOneThatComesLater) {
-  for (const Bytes& unusable : {Bytes{}, Bytes{'n', 'o', ' ', 'k', 'e', 'y'}}) {
-    installKey(platform, unusable);
-    EXPECT_FALSE(open(outerDocument(signature, bag)));
-    EXPECT_EQ(log.count("<3>"), 0);
-  }
+  installKey(platform, {'n', 'o', ' ', 'k', 'e', 'y'});
+  EXPECT_FALSE(open(outerDocument(signature, bag)));
+  EXPECT_EQ(log.count("<3>"), 0);
   installKey(platform, signer.publicKeyDer(KeyLayout::pkcs1));
   EXPECT_TRUE(open(outerDocument(signature, bag)));
 }
