@@ -9,8 +9,8 @@ const std::string kSecret = "s3cr3t-value-of-a-person";
 
 class HTTPSPostPrivacyTest : public HTTPSFixture {
  protected:
-  static Setup filtering(const char* action, const Value& method = -1) {
-    const Dictionary rule{{"key", "PersonName"}, {"method", method}, {"action", action}};
+  static Setup filtering(const Value& method = -1) {
+    const Dictionary rule{{"key", "PersonName"}, {"method", method}, {"action", "remove"}};
     Setup setup = requiring({{"filters", Array{rule}}, {"event_threshold", 2}}, true);
     setup.userInfo = shared({{"clientName", "Mail"}, {"personName", kSecret}});
     return setup;
@@ -27,30 +27,9 @@ class HTTPSPostPrivacyTest : public HTTPSFixture {
   }
 };
 
-TEST_F(HTTPSPostPrivacyTest, FilteredFieldsLeaveOnNoWay) {
-  for (const char* action : {"remove", "sha256"}) {
-    platform.http.clear();
-    const auto backend = makeBackend(filtering(action));
-    const auto payload = shared({{"PERSONNAME", kSecret}, {"personName", kSecret}, {"open", "visible"}});
-    send(*backend, 1, 1, payload);                              // direct
-    send(*backend, 1, 0, payload);                              // batched,
-    send(*backend, 2, 3, payload);                              // forced out
-    for (int i = 0; i < 5; ++i) send(*backend, 3, 0, payload);  // threshold
-    backend->setUserInfoDict(shared({{"clientName", "Mail"}, {"PersonName", kSecret}}));
-    flush(*backend);                   // user info merged again
-    send(*backend, 0, 1, payload, 1);  // the session's end
-    EXPECT_GE(requests().size(), 6U) << action;
-    EXPECT_EQ(postsWith(kSecret), 0U) << action;
-    EXPECT_EQ(postsWith("visible"), requests().size()) << action;
-    const std::string digest = OrvantaBackend::convertIntoSHA256(kSecret);
-    EXPECT_EQ(postsWith(digest), std::string(action) == "sha256" ? requests().size() : 0U);
-    EXPECT_EQ(postsWith(OrvantaBackend::convertIntoSHA256(digest)), 0U) << "no digest of a digest";
-  }
-}
-
 TEST_F(HTTPSPostPrivacyTest, WhatEventsBeforeUserInfoAndOtherSessionsKeep) {
   // The filters come with the evaluation that has user info; what was batched before was prepared without them.
-  Setup setup = filtering("remove");
+  Setup setup = filtering();
   const SharedDictionary userInfo = setup.userInfo;
   setup.userInfo = nullptr;
   const auto backend = makeBackend(setup);
@@ -68,7 +47,7 @@ TEST_F(HTTPSPostPrivacyTest, WhatEventsBeforeUserInfoAndOtherSessionsKeep) {
 }
 
 TEST_F(HTTPSPostPrivacyTest, FiltersForOneCategory) {
-  const auto backend = makeBackend(filtering("remove", 3));
+  const auto backend = makeBackend(filtering(3));
   send(*backend, 3, 1);
   EXPECT_EQ(postsWith(kSecret), 0U);
   send(*backend, 3);

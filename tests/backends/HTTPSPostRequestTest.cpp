@@ -74,27 +74,36 @@ TEST_F(HTTPSPostRequestTest, GzipOnlyWhereItIsSmaller) {
 }
 
 TEST_F(HTTPSPostRequestTest, AnswersOfTheServer) {
-  for (const int status : {200, 404, 499, 600, 0, 500, 599}) {
-    SCOPED_TRACE(status);
-    platform.http.answer = [status](const HttpRequest&) { return ScriptedHttpClient::status(status); };
+  const auto nothing = makeOrvantaError("Nothing to flush", -1);
+  const std::string disabled = "backend http_post disabled by server ";
+  const std::tuple<HttpResult, std::optional<OrvantaError>, std::string> rows[] = {
+      {ScriptedHttpClient::status(200), {}, ""},
+      {ScriptedHttpClient::status(404), {}, ""},
+      {ScriptedHttpClient::status(499), {}, ""},
+      {ScriptedHttpClient::status(600), {}, ""},
+      {ScriptedHttpClient::status(0), {}, ""},
+      {ScriptedHttpClient::status(500), makeOrvantaError(disabled + "500 return code", 500), "<6>postJSONMessage: "},
+      {ScriptedHttpClient::status(599), makeOrvantaError(disabled + "599 return code", 599), "<6>postJSONMessage: "},
+      {{std::nullopt, "certificate has expired"},
+       makeOrvantaError("certificate has expired", -1),
+       "<3>HTTPSPostBackend(postJsonMessage): post error: "},
+  };
+  for (const auto& row : rows) {
+    const auto& [result, error, line] = row;
+    SCOPED_TRACE(result.response ? std::to_string(result.response->status) : result.error);
+    platform.http.answer = [&row](const HttpRequest&) { return std::get<0>(row); };
     const LogCapture log;
-    Setup setup = batching();
-    setup.name = "http_post2";
-    const auto backend = makeBackend(setup);
+    const auto backend = makeBackend(batching());
     send(*backend, 1);
     const FlushAnswer answer = flush(*backend);
     EXPECT_EQ(answer.calls, 1);
-    if (status < 500 || status > 599) {
-      EXPECT_EQ(answer.error, std::nullopt);
-      EXPECT_EQ(backend->state(), kBackendEnabled);
-      continue;
-    }
-    const std::string text = "backend http_post2 disabled by server " + std::to_string(status) + " return code";
-    EXPECT_EQ(answer.error, makeOrvantaError(text, status));
-    EXPECT_TRUE(log.contains("<6>postJSONMessage: " + text));
-    EXPECT_EQ(backend->state(), kBackendDisabled);
-    send(*backend, 2, 1);
-    EXPECT_EQ(flush(*backend).error, makeOrvantaError("Nothing to flush", -1)) << "events are dropped now";
+    EXPECT_EQ(answer.error, error);
+    EXPECT_TRUE(!error || log.contains(line + error->description));
+    EXPECT_EQ(flush(*backend).error, nothing) << "a failed post restores nothing";
+    const bool disables = error && error->code >= 500;
+    EXPECT_EQ(backend->state(), disables ? kBackendDisabled : kBackendEnabled);
+    send(*backend, 2);
+    EXPECT_EQ(flush(*backend).error == nothing, disables) << "events are dropped now";
     backend->updateState();
     EXPECT_EQ(backend->state(), kBackendEnabled) << "until the next evaluation";
   }
@@ -111,18 +120,6 @@ TEST_F(HTTPSPostRequestTest, APromotionDoesNotUndoTheServersAnswer) {
   send(*backend, 2, 2);
   EXPECT_EQ(backend->state(), kBackendDisabled);
   EXPECT_EQ(requests().size(), 1U);
-}
-
-TEST_F(HTTPSPostRequestTest, TransportErrors) {
-  platform.http.answer = [](const HttpRequest&) { return HttpResult{std::nullopt, "certificate has expired"}; };
-  const LogCapture log;
-  const auto backend = makeBackend(batching());
-  send(*backend, 1);
-  const FlushAnswer answer = flush(*backend);
-  EXPECT_EQ(answer.error, makeOrvantaError("certificate has expired", -1));
-  EXPECT_TRUE(log.contains("<3>HTTPSPostBackend(postJsonMessage): post error: certificate has expired"));
-  EXPECT_EQ(backend->state(), kBackendEnabled);
-  EXPECT_EQ(flush(*backend).error, makeOrvantaError("Nothing to flush", -1)) << "a failed post restores nothing";
 }
 
 TEST_F(HTTPSPostRequestTest, NoURL) {

@@ -2,6 +2,8 @@
 
 #include <map>
 
+#include "backends/OrvantaBackend.h"
+#include "platform/Json.h"
 #include "tests/integration/IntegrationFixture.h"
 
 namespace orvanta::test {
@@ -24,9 +26,12 @@ TEST_F(BatchingTest, ARealtimeEventIsPrecededByWhatWaited) {
   flush(*session);  // the session-start record
   ASSERT_TRUE(waitForPosts(1));
   for (const std::uint16_t type : {1, 2, 3}) EXPECT_EQ(send(*session, event(5, type)), std::nullopt);
-  auto realtime = event(5, 4, {{"mark", "standalone"}});
+  auto realtime = event(5, 4);
   realtime.realtime = true;
   const auto reply = send(*session, realtime);
+  EXPECT_EQ(daemon->count("<7>HTTPSPostBackend(sendMessage): Got a realtime event and some events have already been "
+                          "batched. Forcing Flush here to keep events in order."),
+            1U);
   ASSERT_TRUE(waitForPosts(3));
   const auto received = posts();
   EXPECT_EQ(received[1].path, "/events");
@@ -36,9 +41,14 @@ TEST_F(BatchingTest, ARealtimeEventIsPrecededByWhatWaited) {
   for (std::size_t i = 0; i < 4; ++i) EXPECT_EQ(number(events[i], "_status"), std::int64_t(i) + 1);
   EXPECT_EQ(events[2].request, received[1].id);
   EXPECT_EQ(received[1].header("X-ORV-Event-Map"), nullptr);
-  ASSERT_TRUE(reply) << "with consent the client sees what was sent";
-  EXPECT_EQ(reply->find("Flushed events:\n"), 0U);
-  EXPECT_NE(reply->find("\nStandalone event:\n"), std::string::npos);
+  // With consent the client sees what was sent.
+  const std::string head = "Flushed events:\n", middle = "\nStandalone event:\n";
+  ASSERT_TRUE(reply && reply->starts_with(head));
+  const std::size_t cut = reply->find(middle);
+  ASSERT_NE(cut, std::string::npos);
+  EXPECT_EQ(*platform::parseJson(reply->substr(head.size(), cut - head.size())),
+            *platform::parseJson(received[1].body));
+  EXPECT_EQ(*platform::parseJson(reply->substr(cut + middle.size())), *platform::parseJson(received[2].body));
 }
 
 TEST_F(BatchingTest, WithoutConsentNothingLeavesUnlessOverridden) {
@@ -64,16 +74,17 @@ TEST_F(BatchingTest, WithoutConsentNothingLeavesUnlessOverridden) {
   ASSERT_TRUE(waitForClientEvents(1));
 }
 
-TEST_F(BatchingTest, AHeldSessionIsPromoted) {
+TEST_F(BatchingTest, AHeldSessionIsPromotedAndAFlushSendsWhatItHeld) {
   setSection({{"http_post", httpPost(clientSection({{"sampling_threshold", 0.0}}))}});
   startDaemon();
-  auto session = openSession(batching(), user());
+  auto session = openSession({.sessionID = 1, .requireUserInfo = true}, user());
   send(*session, event(5, 1));
   auto promoting = event(5, 2);
   promoting.promote = true;
-  send(*session, promoting);
+  send(*session, promoting);  // at once, and what was held stays where it is
   EXPECT_EQ(flush(*session).error, std::nullopt);
   ASSERT_TRUE(waitForClientEvents(2));
+  EXPECT_EQ(number(clientEvents()[0], "_status"), 2);
 }
 
 TEST_F(BatchingTest, FlushesThatCannotSendSayWhy) {
@@ -132,16 +143,22 @@ TEST_F(BatchingTest, AFilteredFieldIsInNoBodyOnAnyPath) {
   batchingSession.reset();
   direct.reset();
   EXPECT_EQ(daemon->terminate(), 0);
-  std::size_t visible = 0;
+  EXPECT_EQ(server->requests(RequestKind::storebag).size(), 1U) << "sessions of one client type share it";
+  const std::string digest = OrvantaBackend::convertIntoSHA256(hashedOnly);
+  std::size_t visible = 0, hashed = 0;
   for (const auto& request : server->requests()) {
     for (const std::string* body : {&request.rawBody, &request.body, &request.target}) {
       EXPECT_EQ(body->find(secret), std::string::npos);
       EXPECT_EQ(body->find(hashedOnly), std::string::npos);
+      EXPECT_EQ(body->find(OrvantaBackend::convertIntoSHA256(digest)), std::string::npos)
+          << "a filter never hashes twice";
     }
     for (const auto& [name, value] : request.headers) EXPECT_EQ(value.find(secret), std::string::npos) << name;
     if (request.body.find("visible") != std::string::npos) ++visible;
+    if (request.body.find(digest) != std::string::npos) ++hashed;
   }
   EXPECT_GE(visible, 4U);
+  EXPECT_GE(hashed, visible);
 }
 
 TEST_F(BatchingTest, TenThousandEventsArriveOnceAndInOrderAndLeaveNoMemoryBehind) {
