@@ -30,13 +30,7 @@ TEST_F(LifecycleTest, SessionsSendTheirStartFinishAndEnd) {
   EXPECT_EQ(records(0), 1U);
   EXPECT_EQ(records(2), 1U);
   EXPECT_EQ(records(1), 1U);
-  const auto end = server->events().back();
-  EXPECT_TRUE(end.event.contains("StorebagVersion"));
-  EXPECT_EQ(end.event.find("SamplingThreshold")->integerValue(), -1);
-  EXPECT_EQ(end.event.find("OverrideSampling")->integerValue(), -1);
-  EXPECT_EQ(number(end, "_status"), 1);
-  EXPECT_EQ(number(end, "Batch"), 0);
-  EXPECT_EQ(number(end, "Opt"), 0);
+  EXPECT_TRUE(server->events().back().event.contains("StorebagVersion"));
 }
 
 TEST_F(LifecycleTest, SIGTERMEndsSessionsWhileTheirClientsAreConnected) {
