@@ -3,7 +3,6 @@
 
 #include <algorithm>
 #include <future>
-#include <random>
 #include <thread>
 #include <utility>
 
@@ -159,46 +158,6 @@ TEST_F(ConcurrentSessionsTest, AllHaveEndedAndWhatGoesWithThemMayAskTheAgent) {
   EXPECT_FALSE(log.contains("was dropped before it ended"));
 }
 
-std::ptrdiff_t endNotices(const std::vector<AggregatedEvent>& events) {
-  return std::count_if(events.begin(), events.end(), [](const auto& event) { return event.isEndNotice(); });
-}
-
-// Sessions of one group, each on a thread of its own: they change places, configure, send, aggregate and leave.
-TEST_F(ConcurrentSessionsTest, EverythingAtOnce) {
-  const SharedDictionary users[] = {shared({{"clientName", "a"}, {"serviceName", "s"}}),
-                                    shared({{"clientName", "b"}, {"serviceName", "s"}})};
-  constexpr std::uint32_t kAggregating = 2;
-  for (int round = 0; round < 5; ++round) {
-    std::vector<std::shared_ptr<OrvantadSession>> sessions;
-    std::vector<std::thread> threads;
-    const std::size_t first = connections.size();
-    for (std::uint32_t i = 0; i < 6; ++i) sessions.push_back(makeSession());
-    for (std::uint32_t i = 0; i < sessions.size(); ++i) {
-      threads.emplace_back([&, i] {
-        OrvantadSession& session = *sessions[i];
-        std::minstd_rand random(i + 1);
-        configure(session, i, hierarchy("t", i), users[0], i < kAggregating);
-        start(session);
-        for (int turn = 0; turn < 30; ++turn) {
-          if (i >= kAggregating && turn % 5 == 0) {
-            configure(session, i, hierarchy(turn % 10 == 0 ? "t" : "u", 1 + random() % 3), users[0]);
-          }
-          session.fetchStatesWithUserInfo(users[random() % 2], {});
-          send(session, {{"category", 3}, {"type", turn}, {"payload", Dictionary{{"i", i}}}});
-          if (turn % 7 == 0) session.flushMessagesWithCompletion({});
-        }
-        leave(sessions[i]);
-      });
-    }
-    for (auto& thread : threads) thread.join();
-    for (std::size_t i = first; i < connections.size(); ++i) {
-      const auto events = connections[i]->aggregated();
-      EXPECT_EQ(endNotices(events), i - first < kAggregating ? 1 : 0);
-      EXPECT_TRUE(events.empty() || events.back().isEndNotice()) << "an event followed the end notice";
-    }
-  }
-}
-
 // The test's own threads meet in the leaf lock only: an event and the end of aggregation.
 TEST_F(ConcurrentSessionsTest, NoEventFollowsTheEndOfAggregationAndItIsToldOnce) {
   for (int round = 0; round < 200; ++round) {
@@ -218,7 +177,7 @@ TEST_F(ConcurrentSessionsTest, NoEventFollowsTheEndOfAggregationAndItIsToldOnce)
     }
     for (auto& thread : threads) thread.join();
     const auto events = connections.back()->aggregated();
-    ASSERT_EQ(endNotices(events), 1) << round;
+    ASSERT_EQ(std::count_if(events.begin(), events.end(), [](auto& event) { return event.isEndNotice(); }), 1) << round;
     ASSERT_TRUE(events.back().isEndNotice()) << round;
     leave(session);
   }

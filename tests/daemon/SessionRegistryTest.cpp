@@ -152,11 +152,12 @@ TEST_F(HierarchyTest, ChildrenCarryTheChainOfIdentifiersAndFollowTheirParentsSta
   EXPECT_EQ(stateAfterSync(kBackendSampledOut, kBackendEnabled), kBackendSampledOut);
 
   leave(root);
-  log.clear();
   child->syncReportingStates();
   EXPECT_EQ(backend(*child).samplingThreshold(), 0.25) << "the threshold outlives the parent";
   EXPECT_TRUE(log.contains(
       "<6>syncReportingStates: child session 2 (backend http_post) with hierarchy 1 is missing its parent"));
+  const auto returned = started(4, 0);
+  EXPECT_EQ(backend(*child).combinedSessionIDString(), returned->sessionIDString() + "." + child->sessionIDString());
 }
 
 TEST_F(HierarchyTest, ABackendThatTheParentLacksIsDisabled) {

@@ -9,13 +9,7 @@ namespace {
 
 class RelatedSessionsTest : public IntegrationFixture {
  protected:
-  // A session in this process; its user info holds who it is.
-  std::unique_ptr<OrvantaConnection> join(std::uint32_t id, const std::string& token, std::uint32_t level) {
-    SessionInfo info{.sessionID = id, .clientType = 5, .requireUserInfo = true};
-    info.hierarchyToken = HierarchyToken{token, level};
-    return openSession(info, UserInfo{"client", "service", {{"who", std::int64_t(id)}}});
-  }
-  // The same in a process of its own (see MemberProgram.cpp), which tells what happens to it.
+  // A session in a process of its own (see MemberProgram.cpp), which tells what happens to it.
   std::unique_ptr<ChildProcess> launch(std::uint32_t id, const std::string& token, std::uint32_t level,
                                        bool aggregates) {
     ChildProcess::Options member;
@@ -88,24 +82,6 @@ TEST_F(RelatedSessionsTest, FiveProgramsFollowTheirHierarchy) {
   EXPECT_EQ(stranger->count("received"), 0U);
 }
 
-TEST_F(RelatedSessionsTest, AParentThatLeavesAndReturnsIsFollowedAgain) {
-  startDaemon();
-  auto root = join(1, "t", 0);
-  auto child = join(2, "t", 1);
-  root.reset();
-  ASSERT_TRUE(daemon->logged("dealloc: OrvantadSession dealloc: 1"));
-  ASSERT_TRUE(child->session().blocking().fetchStates(UserInfo{"client", "else", {}}.dictionary()));
-  EXPECT_TRUE(daemon->logged(
-      "<6>syncReportingStates: child session 2 (backend http_post) with hierarchy 1 is missing its parent"));
-  root = join(3, "t", 0);
-  EXPECT_TRUE(daemon->logged(
-      "<7>updateDownstreamSessions: Updating combined session ID and syncing reporting states for session 2"));
-  send(*child, event(20, 1, {{"marker", 1}}));
-  send(*root, event(20, 1, {{"marker", 2}}));
-  ASSERT_TRUE(waitForClientEvents(2));
-  EXPECT_EQ(postedSessionID(1).find(postedSessionID(2) + "."), 0U);
-}
-
 TEST_F(RelatedSessionsTest, WatchPrintsTheEventsOfItsHierarchyAsJSONLines) {
   startDaemon();
   ChildProcess::Options watching;
@@ -115,7 +91,9 @@ TEST_F(RelatedSessionsTest, WatchPrintsTheEventsOfItsHierarchyAsJSONLines) {
   watching.keepOutput = true;
   ChildProcess watcher(std::move(watching));
   ASSERT_TRUE(daemon->logged("updateCorrelatedSessions: Adding session"));
-  auto child = join(2, "call", 1);
+  SessionInfo info{.sessionID = 2};
+  info.hierarchyToken = HierarchyToken{"call", 1};
+  auto child = openSession(info, UserInfo{"client", "service", {}});
   send(*child, event(20, 7, {{"marker", 1}}));
   child.reset();
   ASSERT_TRUE(daemon->logged("dealloc: OrvantadSession dealloc: 2"));
