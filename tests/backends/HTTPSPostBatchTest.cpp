@@ -5,7 +5,7 @@
 namespace orvanta::test {
 namespace {
 
-class HTTPSPostBatchTest : public HTTPSFixture {};
+using HTTPSPostBatchTest = HTTPSFixture;
 
 TEST_F(HTTPSPostBatchTest, ThresholdFlushesTheWholeBatch) {
   const LogCapture log;
