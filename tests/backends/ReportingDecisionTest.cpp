@@ -120,6 +120,8 @@ TEST(ReportingDecision, SectionForTheClient) {
       {"blank before the client's own name", {{"client", "News, Mail"}}, sampledIn, blankClient},
       {"client unknown", {{"client", "Mail"}}, noSectionMatches, noClient},
       {"empty client list, empty client", {{"client", ""}}, sampledIn, emptyClient},
+      {"empty client list, a client", {{"client", ""}}, noSectionMatches},
+      {"an empty fragment fits any service", {{"service", "pop,"}}, sampledIn},
       {"client of a wrong type", {{"client", Array{"Mail"}}}, noSectionMatches},
       {"fragment of the service", {{"service", "x,IMAP"}}, sampledIn},
       {"fragment too long", {{"service", "imap.service2"}}, noSectionMatches},

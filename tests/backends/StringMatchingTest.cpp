@@ -28,36 +28,5 @@ TEST(StringMatching, EqualsIgnoringCase) {
   }
 }
 
-TEST(StringMatching, Lists) {
-  const struct {
-    TextList list;
-    std::optional<std::string> whole;
-    bool whitelist, exact, fragment;
-  } rows[] = {
-      {{}, "DE", true, true, true},
-      {{}, std::nullopt, true, true, true},
-      {{}, std::nullopt, false, false, false},
-      {{"a", "b"}, std::nullopt, true, false, false},
-      {{"a", "b"}, std::nullopt, false, true, true},
-      {{"a", "b"}, "B", true, true, true},
-      {{"a", "b"}, "c", true, false, false},
-      {{"ab"}, "xABy", true, false, true},
-      {{"abc"}, "ab", true, false, false},
-      {{""}, "Mail", true, false, true},
-      {{""}, "", true, true, true},
-      {{""}, std::nullopt, true, false, false},
-  };
-  for (const auto& row : rows) {
-    const std::string what = (row.list.empty() ? "[]" : row.list.front()) + " / " + row.whole.value_or("(none)");
-    EXPECT_EQ(matchExactStringWithList(row.list, row.whole, row.whitelist), row.exact) << what;
-    EXPECT_EQ(matchStringWithList(row.list, row.whole, row.whitelist), row.fragment) << what;
-  }
-}
-
-TEST(StringMatching, SplitsWithoutTrimming) {
-  EXPECT_EQ(splitAtCommas("Mail, News,"), (TextList{"Mail", " News", ""}));
-  EXPECT_EQ(splitAtCommas(""), (TextList{""}));
-}
-
 }  // namespace
 }  // namespace orvanta

@@ -206,15 +206,6 @@ TEST_F(ConnectionTest, AClientThatDiesInTheMiddleOfACallTakesItsSessionAlong) {
 
 using StartedLaterTest = IntegrationFixture;
 
-TEST_F(StartedLaterTest, NothingIsGrantedByDefault) {
-  options.entitled = false;
-  startDaemon();
-  auto connection = connect();
-  EXPECT_FALSE(connection->session().blocking().fetchDisplayURL());
-  EXPECT_TRUE(daemon->logged("does not have required orvanta entitlement. Closing connection..."));
-  EXPECT_EQ(daemon->count("initWithSessionDelegate"), 0U);
-}
-
 TEST_F(StartedLaterTest, OneSessionsFetchHoldsUpNoOtherSessionsEventsAndEndsAtItsLimit) {
   startDaemon();
   auto working = openSession({.sessionID = 1, .clientType = 5, .batchEvent = true});

@@ -59,17 +59,6 @@ TEST_F(EventDeliveryTest, TheOneOffPathSendsOneEvent) {
   EXPECT_FALSE(refused) << "a reply that the daemon drops is an error, not silence";
 }
 
-TEST_F(EventDeliveryTest, WithTheServerDownConfluoFallsBackToBrisk) {
-  options.storebagURL = "http://127.0.0.1:1/storebags";
-  startDaemon();
-  BackendNames names;
-  auto session = openSession({.sessionID = 1, .clientType = 11}, {}, &names);
-  EXPECT_EQ(names, (std::vector<std::string>{"brisk"}));
-  EXPECT_TRUE(daemon->logged("<6>fetchStorebagWithName: Loading default storebag 'confluo'"));
-  auto other = openSession({.sessionID = 2, .clientType = 5}, {}, &names);
-  EXPECT_EQ(names, std::nullopt);
-}
-
 TEST_F(EventDeliveryTest, ATamperedStorebagIsRefused) {
   server->setFault("/storebags/*", collector::ConnectionFault::corrupt);
   startDaemon();

@@ -88,6 +88,14 @@ class IntegrationFixture : public ::testing::Test {
     EXPECT_TRUE(connected) << connected.error().text;
     return connected ? std::move(*connected) : nullptr;
   }
+  // A program of the build as a child of this daemon's surroundings.
+  ChildProcess::Options program(const std::string& name, std::vector<std::string> arguments = {}) const {
+    ChildProcess::Options child;
+    child.program = DaemonProcess::programPath(name);
+    child.arguments = std::move(arguments);
+    child.environment = daemon->environment();
+    return child;
+  }
   // Connects and configures; `names` gets what the daemon answered.
   std::unique_ptr<OrvantaConnection> openSession(SessionInfo info, const std::optional<UserInfo>& user = {},
                                                  BackendNames* names = nullptr) {

@@ -76,10 +76,7 @@ TEST_F(LifecycleTest, AfterSIGKILLAStaleSocketIsReplacedAndTheDefaultsAreWhole) 
 
 TEST_F(LifecycleTest, ASecondDaemonOnTheSameSocketSaysWhoIsThere) {
   startDaemon();
-  ChildProcess::Options second;
-  second.program = DaemonProcess::programPath("orvantad");
-  second.environment = daemon->environment();
-  ChildProcess other(std::move(second));
+  ChildProcess other(program("orvantad"));
   EXPECT_EQ(other.wait(), 1);
   EXPECT_NE(other.allLines().find(std::to_string(daemon->process().pid())), std::string::npos) << other.allLines();
   EXPECT_TRUE(openSession({.sessionID = 1}));
@@ -104,23 +101,12 @@ TEST_F(LifecycleTest, OutsideTheSandboxItRunsWithAWarningAndLeaksNothing) {
   EXPECT_EQ(daemon->terminate(), 0);  // a sanitizer that finds a leak gives another status
 }
 
-TEST_F(LifecycleTest, AUserDefaultsFileThatDoesNotParseIsKeptAside) {
-  daemon = std::make_unique<DaemonProcess>(options);
-  std::ofstream(daemon->stateDirectory() + "/com.kovalt.orvanta.plist") << "<plist><dict><key>";
-  ASSERT_TRUE(daemon->start());
-  auto connection = connect();
-  connection->session().blocking().configure({.sessionID = 1, .clientType = 7});
-  EXPECT_TRUE(std::filesystem::exists(daemon->stateDirectory() + "/com.kovalt.orvanta.plist.corrupt"));
-  EXPECT_TRUE(daemon->logged("com.kovalt.orvanta.plist"));
-}
-
 TEST_F(LifecycleTest, OrvantactlWritesDefaultsOnlyToADirectoryThatIsThere) {
   daemon = std::make_unique<DaemonProcess>(options);
-  const auto write = [](const std::string& directory) {
-    ChildProcess::Options ctl;
-    ctl.program = DaemonProcess::programPath("orvantactl");
-    ctl.arguments = {"defaults", "--state-dir", directory, "write", "environmentType", "4", "--type", "int"};
-    return ChildProcess(std::move(ctl)).wait();
+  const auto write = [this](const std::string& directory) {
+    return ChildProcess(program("orvantactl", {"defaults", "--state-dir", directory, "write", "environmentType", "4",
+                                               "--type", "int"}))
+        .wait();
   };
   EXPECT_EQ(write(daemon->stateDirectory()), 0);
   EXPECT_EQ(write(daemon->stateDirectory() + "/mistyped"), 1);

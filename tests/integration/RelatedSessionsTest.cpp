@@ -12,14 +12,12 @@ class RelatedSessionsTest : public IntegrationFixture {
   // A session in a process of its own (see MemberProgram.cpp), which tells what happens to it.
   std::unique_ptr<ChildProcess> launch(std::uint32_t id, const std::string& token, std::uint32_t level,
                                        bool aggregates) {
-    ChildProcess::Options member;
-    member.program = DaemonProcess::programPath("member_program");
-    member.arguments = {std::to_string(id), token, std::to_string(level), aggregates ? "aggregates" : "sends"};
-    member.environment = daemon->environment();
-    member.holdInput = true;
-    auto program = std::make_unique<ChildProcess>(std::move(member));
-    EXPECT_TRUE(program->waitForLine("joined")) << program->allLines();
-    return program;
+    auto options = program("member_program",
+                           {std::to_string(id), token, std::to_string(level), aggregates ? "aggregates" : "sends"});
+    options.holdInput = true;
+    auto member = std::make_unique<ChildProcess>(std::move(options));
+    EXPECT_TRUE(member->waitForLine("joined")) << member->allLines();
+    return member;
   }
   static void tell(ChildProcess& program, int number) {
     program.write(std::to_string(number) + "\n");
@@ -84,10 +82,7 @@ TEST_F(RelatedSessionsTest, FiveProgramsFollowTheirHierarchy) {
 
 TEST_F(RelatedSessionsTest, WatchPrintsTheEventsOfItsHierarchyAsJSONLines) {
   startDaemon();
-  ChildProcess::Options watching;
-  watching.program = DaemonProcess::programPath("orvantactl");
-  watching.arguments = {"watch", "--token", "call", "--level", "0", "--client-type", "5"};
-  watching.environment = daemon->environment();
+  auto watching = program("orvantactl", {"watch", "--token", "call", "--level", "0", "--client-type", "5"});
   watching.keepOutput = true;
   ChildProcess watcher(std::move(watching));
   ASSERT_TRUE(daemon->logged("updateCorrelatedSessions: Adding session"));

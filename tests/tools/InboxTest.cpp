@@ -33,28 +33,21 @@ class InboxTest : public testing::Test {
 };
 
 TEST_F(InboxTest, ForgetsTheOldestBeyondItsLimits) {
-  InboxLimits limits;
-  limits.maximumRequests = 20;
-  const auto byNumber = open(limits);
-  for (int i = 1; i <= 100; ++i) {
-    ReceivedRequest request = post(i, 1);
-    byNumber->add(request);
-    ASSERT_LE(byNumber->counts().requests, 20U);
+  for (const bool byBytes : {false, true}) {
+    InboxLimits limits;
+    limits.maximumRequests = byBytes ? 1000 : 20;
+    if (byBytes) limits.maximumBytes = 20'000;
+    const auto inbox = open(limits);
+    inbox->clear();
+    for (int i = 1; i <= 100; ++i) {
+      ReceivedRequest request = post(i, byBytes ? 1000 : 1);
+      inbox->add(request);
+      ASSERT_LE(inbox->counts().requests, 20U);
+    }
+    EXPECT_EQ(inbox->requests().back().exchange, 100);
+    EXPECT_EQ(inbox->events().size(), inbox->requests().size());
+    EXPECT_GE(inbox->counts().requests, byBytes ? 10U : 17U) << "takes a tenth at a time";
   }
-  EXPECT_EQ(byNumber->requests().back().exchange, 100);
-  EXPECT_EQ(byNumber->events().size(), byNumber->requests().size());
-  EXPECT_GE(byNumber->counts().requests, 17U) << "takes a tenth at a time";
-
-  limits.maximumRequests = 1000;
-  limits.maximumBytes = 10'000;
-  byNumber->clear();
-  const auto byBytes = open(limits);
-  for (int i = 1; i <= 50; ++i) {
-    ReceivedRequest request = post(i, 1000);
-    byBytes->add(request);
-    ASSERT_LE(byBytes->counts().requests, 10U);
-  }
-  EXPECT_EQ(byBytes->requests().back().exchange, 50);
 }
 
 TEST_F(InboxTest, SaysWhyItCannotOpen) {

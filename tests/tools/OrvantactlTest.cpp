@@ -100,7 +100,7 @@ std::vector<std::string> linesOf(const std::string& content) {
   }
 }
 
-TEST(LineReader, givesEveryLineOnce) {
+TEST(LineReader, givesEveryLineOnceAndSaysThatReadingFailed) {
   const std::string wide(200'000, 'w');
   const std::pair<std::string, std::vector<std::string>> rows[] = {
       {"", {}},
@@ -112,13 +112,10 @@ TEST(LineReader, givesEveryLineOnce) {
   const std::string giant(LineReader::kMaximumLine + 1, 'g');
   EXPECT_EQ(linesOf("a\n" + giant + "\nb"), (std::vector<std::string>{"a", "too long: 2", "b"}));
   EXPECT_EQ(linesOf(giant), (std::vector<std::string>{"too long: 1"}));
-}
-
-TEST(LineReader, saysThatReadingFailed) {
-  LineReader reader(-1);
+  LineReader unreadable(-1);
   std::string_view line;
-  EXPECT_EQ(reader.next(line), LineReader::Outcome::failed);
-  EXPECT_EQ(reader.error(), EBADF);
+  EXPECT_EQ(unreadable.next(line), LineReader::Outcome::failed);
+  EXPECT_EQ(unreadable.error(), EBADF);
 }
 
 TEST(FlushVerdict, forgivesOnlyThatThereWasNothing) {
