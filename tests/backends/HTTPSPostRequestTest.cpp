@@ -137,28 +137,6 @@ TEST_F(HTTPSPostRequestTest, NoURL) {
   EXPECT_EQ(requests().at(0).url, "https://later.example");
 }
 
-TEST_F(HTTPSPostRequestTest, AFlushAnswersWhenThePostHasEndedThoughTheBackendHasGone) {
-  platform.device.consent = true;
-  platform.http.hold = true;
-  for (const int status : {200, 503}) {
-    auto backend = makeBackend(batching());
-    send(*backend, 1);
-    Pending pending;
-    const auto text = backend->flushMessagesWithCompletion(pending.completion());
-    EXPECT_TRUE(text);
-    settle();
-    const std::weak_ptr<HTTPSPostBackend> watch = backend;
-    backend.reset();
-    EXPECT_TRUE(watch.expired()) << "a post keeps no backend alive";
-    EXPECT_EQ(pending.answer->calls, 0);
-    ASSERT_TRUE(platform.http.finishHeld(ScriptedHttpClient::status(status)));
-    ASSERT_TRUE(pending.wait());
-    EXPECT_EQ(pending.answer->calls, 1);
-    EXPECT_EQ(pending.answer->text, text);
-    EXPECT_EQ(pending.answer->error.has_value(), status == 503);
-  }
-}
-
 TEST_F(HTTPSPostRequestTest, ADroppedPostIsReported) {
   // A client that loses a request without a word, as a pool does with jobs that it never ran.
   Pending pending;

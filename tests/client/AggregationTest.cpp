@@ -1,10 +1,8 @@
-#include <mutex>
 #include <vector>
 
 #include "tests/client/ClientFixture.h"
 
 namespace orvanta::test {
-
 namespace {
 
 class Aggregation : public ClientFixture {
@@ -75,5 +73,4 @@ TEST_F(Aggregation, theDaemonIsToldWhetherThereIsAHandler) {
 }
 
 }  // namespace
-
 }  // namespace orvanta::test

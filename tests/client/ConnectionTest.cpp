@@ -7,10 +7,9 @@
 #include "tests/client/ClientFixture.h"
 
 namespace orvanta::test {
-
 namespace {
 
-class Connection : public ClientFixture {};
+using Connection = ClientFixture;
 
 TEST(Connecting, saysThatNoDaemonIsThere) {
   TemporaryDirectory empty;
@@ -26,15 +25,6 @@ TEST(Connecting, saysThatNoDaemonIsThere) {
   EXPECT_EQ(stale.error().kind, CallErrorKind::noSuchService);
 
   EXPECT_FALSE(OrvantaConnection::connect({.socketDirectory = std::string(200, 'd')}));
-}
-
-TEST_F(Connection, closedBeforeAnyAnswerAsksAboutTheEntitlement) {
-  Awaited<DoneReply> done;
-  session().setSessionInfo(shared({}), nullptr, nullptr, false, done.reply());
-  peer->close();
-  const auto outcome = done.get();
-  EXPECT_EQ(outcome.error.kind, CallErrorKind::notEntitled);
-  EXPECT_NE(outcome.error.text.find("com.kovalt.private.orvantad"), std::string::npos);
 }
 
 TEST_F(Connection, lostMidCallFailsAllThatWaitThenTellsTheHandler) {
@@ -254,5 +244,4 @@ TEST_F(Connection, bringsEachAnswerOnceUnderStress) {
 }
 
 }  // namespace
-
 }  // namespace orvanta::test

@@ -11,7 +11,6 @@
 #include "tests/client/ClientFixture.h"
 
 namespace orvanta::test {
-
 namespace {
 
 std::string contentOf(int fd) {
@@ -169,5 +168,4 @@ TEST(FileURLs, ofOtherKindsAreRefused) {
 }
 
 }  // namespace
-
 }  // namespace orvanta::test

@@ -183,20 +183,28 @@ TEST_F(ConcurrentSessionsTest, NoEventFollowsTheEndOfAggregationAndItIsToldOnce)
   }
 }
 
-TEST_F(ConcurrentSessionsTest, AFlushOnItsWayKeepsNoSessionAliveAndIsStillAnswered) {
+TEST_F(ConcurrentSessionsTest, AFlushOnItsWayKeepsNothingAliveAndIsStillAnswered) {
   device.http.hold = true;
-  auto session = OrvantadSession::create(device, agent, nullptr);
-  const std::weak_ptr<OrvantadSession> watch = session;
-  configure(*session, 1, {{"batchEvent", true}});
-  start(*session);
-  KeptFlush kept;
-  session->flushMessagesWithCompletion(kept.reply());
-  leave(session);
-  session.reset();
-  EXPECT_TRUE(watch.expired());
-  EXPECT_FALSE(kept.given());
-  ASSERT_TRUE(eventually([&] { return device.http.finishHeld(ScriptedHttpClient::status(200)); }));
-  EXPECT_TRUE(kept.given());
+  device.device.consent = true;
+  for (const int status : {200, 503}) {
+    auto session = OrvantadSession::create(device, agent, nullptr);
+    configure(*session, 1, {{"batchEvent", true}});
+    start(*session);
+    const std::weak_ptr<OrvantadSession> watch = session;
+    const std::weak_ptr<OrvantaBackend> backend = session->backends()->begin()->second;
+    KeptFlush kept;
+    session->flushMessagesWithCompletion(kept.reply());
+    leave(session);
+    session.reset();
+    EXPECT_TRUE(watch.expired() && backend.expired());
+    EXPECT_FALSE(kept.given());
+    EXPECT_TRUE(eventually([&] {
+      device.http.finishHeld(ScriptedHttpClient::status(status));
+      return kept.given();
+    }));
+    EXPECT_TRUE(kept.get<0>()) << "what was sent";
+    EXPECT_EQ(kept.get<1>().has_value(), status == 503);
+  }
 }
 
 }  // namespace

@@ -4,7 +4,6 @@
 #include <malloc.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <array>
 #include <filesystem>
 #include <functional>

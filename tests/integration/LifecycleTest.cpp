@@ -82,14 +82,6 @@ TEST_F(LifecycleTest, ASecondDaemonOnTheSameSocketSaysWhoIsThere) {
   EXPECT_TRUE(openSession({.sessionID = 1}));
 }
 
-TEST_F(LifecycleTest, WithoutItsSandboxProfileItDoesNotRun) {
-  options.environment["ORVANTA_FRAMEWORK"] = "/nonexistent";
-  daemon = std::make_unique<DaemonProcess>(options);
-  EXPECT_FALSE(daemon->start());
-  EXPECT_EQ(daemon->process().wait(), 255);
-  EXPECT_EQ(daemon->count("<3>main: Failed to enter sandbox com.kovalt.orvantad: "), 1U);
-}
-
 TEST_F(LifecycleTest, OutsideTheSandboxItRunsWithAWarningAndLeaksNothing) {
   options.sandbox = false;
   startDaemon();

@@ -117,7 +117,6 @@ TEST_F(UploadTest, FilesThatChangeWhileTheyAreReadHarmNobody) {
       if (grown < 5000) more << std::string(1000, 'h') << std::flush;
       fs::resize_file(shrinking, 0);
       fs::resize_file(shrinking, 1'000'000);
-      std::this_thread::yield();
     }
   });
   for (int i = 0; i < 6; ++i) {
@@ -126,17 +125,14 @@ TEST_F(UploadTest, FilesThatChangeWhileTheyAreReadHarmNobody) {
   }
   done = true;
   writer.join();
-  std::size_t previous = 0;
   for (const auto& post : uploads()) {
     EXPECT_EQ(post.damage + post.note, "") << "whole gzip bodies";
     if (post.parameter("filename") == "shrinking.gz") {
       EXPECT_LE(post.body.size(), 1'000'000U);
-      continue;
+    } else {
+      EXPECT_EQ(post.body.substr(0, 1'000'000), std::string(1'000'000, 'g'));
+      EXPECT_EQ(post.body.find_first_not_of('h', 1'000'000), std::string::npos);
     }
-    EXPECT_EQ(post.body.substr(0, 1'000'000), std::string(1'000'000, 'g'));
-    EXPECT_EQ(post.body.find_first_not_of('h', 1'000'000), std::string::npos);
-    EXPECT_GE(post.body.size(), previous);
-    previous = post.body.size();
   }
 }
 

@@ -18,13 +18,6 @@ class SessionSetupTest : public SessionFixture {
   }
 };
 
-TEST_F(SessionSetupTest, IdentifiersAreDistinctBase64OfSixteenBytes) {
-  const std::string identifier = makeSession()->sessionIDString();
-  EXPECT_NE(makeSession()->sessionIDString(), identifier);
-  EXPECT_EQ(identifier.size(), 24U);
-  EXPECT_TRUE(identifier.ends_with("=="));
-}
-
 TEST_F(SessionSetupTest, WithoutAStorebagThereIsNothingToReportTo) {
   const auto session = makeSession();
   configure(*session, 7);

@@ -3,7 +3,6 @@
 #include <gmock/gmock.h>
 
 #include <filesystem>
-#include <vector>
 
 #include "tests/tools/CollectorFixture.h"
 #include "util/Compression.h"

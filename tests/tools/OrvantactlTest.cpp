@@ -230,9 +230,9 @@ TEST_F(Pipeline, tellsThatTheDaemonHasGone) {
   pipeline.drain();
   EXPECT_TRUE(pipeline.lost());
   ASSERT_TRUE(pipeline.firstError());
-  EXPECT_EQ(pipeline.firstError()->kind, CallErrorKind::notEntitled);
+  EXPECT_EQ(pipeline.firstError()->kind, CallErrorKind::notEntitled) << "before any answer";
+  EXPECT_NE(pipeline.firstError()->text.find("com.kovalt.private.orvantad"), std::string::npos);
 }
 
 }  // namespace
-
 }  // namespace orvanta::ctl

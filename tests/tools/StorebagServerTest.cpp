@@ -3,9 +3,9 @@
 #include <gmock/gmock.h>
 
 #include <filesystem>
-#include <fstream>
 
 #include "platform/Digest.h"
+#include "tests/support/Bytes.h"
 #include "tests/tools/CollectorFixture.h"
 
 namespace orvanta::collector {
@@ -18,20 +18,17 @@ class StorebagServerTest : public CollectorFixture {
   }
   // The inner bag of a document, whose signature must be right by the daemon's own check under that key file.
   static Value verified(const std::string& document, const std::string& keyFile) {
-    const auto content = openStorebag({reinterpret_cast<const std::uint8_t*>(document.data()), document.size()});
-    if (!content) {
-      ADD_FAILURE() << content.error();
-      return {};
-    }
+    const auto content = openStorebag(test::bytesOf(document));
+    EXPECT_TRUE(content) << content.error();
+    if (!content) return {};
     const auto der = readFile(keyFile);
     const auto key = platform::RsaPublicKey::fromDer(*der);
     EXPECT_TRUE(key && key->verifySha1(platform::sha1(content->bag), content->signature));
     return content->inner;
   }
-  void setFileTime(const std::string& path, std::int64_t secondsSince1970) const {
-    const auto age = std::chrono::system_clock::now() -
-                     std::chrono::system_clock::time_point(std::chrono::seconds(secondsSince1970));
-    std::filesystem::last_write_time(path, std::filesystem::file_time_type::clock::now() - age);
+  static void setFileTime(const std::string& path, std::int64_t secondsSince1970) {
+    const std::chrono::sys_time<std::chrono::seconds> time{std::chrono::seconds(secondsSince1970)};
+    std::filesystem::last_write_time(path, std::chrono::file_clock::from_sys(time));
   }
 };
 
