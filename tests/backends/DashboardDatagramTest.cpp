@@ -29,41 +29,30 @@ TEST(DashboardDatagram, EveryByteOfTheHeader) {
   const struct {
     const char* what;
     DashboardSender sender;
-    platform::TimeValue time;
-    std::uint16_t method, respCode, eventNumber;
+    DashboardEvent event;
     std::string header;  // in hexadecimal: before the device identifier, that, behind it
     const char* line;
   } rows[] = {
       {"all fields",
        {8, 7, 1, 0, udid, 1},
-       {123, 4999},
-       0x0102,
-       0x0304,
-       0x0506,
+       {&payload, {123, 4999}, 0x0102, 0x0304, 0x0506},
        "080701010000007bfffffffeffffffb501020304"
        "30313233343536373839616263646566303132333435363738396162636465663031323334353637"
        "05060001",
        "123.004 0123456789abcdef0123456789abcdef01234567 127.0.0.1 XF     0     1  1286   258   772  a=q b=xyz"},
       {"short device, explicit server, latest time",
        {255, 14, 0xffffffff, 0xffff, "D", 3},
-       {-1, 999'999},
-       65535,
-       0,
-       0,
+       {&payload, {-1, 999'999}, 65535, 0, 0},
        "ff0e01f9ffffffff000000000000ffb5ffff000044" + std::string(78, '0') + "00000003",
        "4294967295.996 D 127.0.0.1 QB-ZIRL 65535 4294967295     0 65535     0  a=q b=xyz"},
       {"no such client type",
        {0, 256 + 19, 0, 0, "", 0},
-       {0, 3999},
-       0,
-       0,
-       9,
+       {&payload, {0, 3999}, 0, 0, 9},
        "0013010000000000ffffffffffffffb500000000" + std::string(80, '0') + "00090000",
        "0.000  127.0.0.1      0     0     9     0     0  a=q b=xyz"},
   };
   for (const auto& row : rows) {
-    const auto datagram =
-        encodeDashboardDatagram(row.sender, {&payload, row.time, row.method, row.respCode, row.eventNumber});
+    const auto datagram = encodeDashboardDatagram(row.sender, row.event);
     EXPECT_EQ(platform::hexDigits(std::span(datagram).first(kDashboardHeaderBytes)), row.header) << row.what;
     EXPECT_EQ(textOf(datagram), " a=q b=xyz") << row.what;
     EXPECT_EQ(writeLocalLog(datagram), row.line) << row.what;
@@ -72,7 +61,7 @@ TEST(DashboardDatagram, EveryByteOfTheHeader) {
     ASSERT_TRUE(decoded) << decoded.error();
     EXPECT_EQ(decoded->header.sessionID(), row.sender.sessionID);
     EXPECT_EQ(decoded->header.deviceIDText(), row.sender.deviceID);
-    EXPECT_EQ(decoded->header.eventNumber, row.eventNumber);
+    EXPECT_EQ(decoded->header.eventNumber, row.event.eventNumber);
   }
   const std::string longer = udid + "89";
   DashboardSender longDevice;

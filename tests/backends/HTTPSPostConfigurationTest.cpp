@@ -127,24 +127,22 @@ TEST_F(HTTPSPostConfigurationTest, ClientIdentifiers) {
     const char* what;
     bool consent;
     int overrideDnu;
-    bool custom;
-    int extras;
-    bool isInternal;
+    bool custom, extras, isInternal;
     std::string key;  // of the user default that holds the identifier; empty: the device's own
   } rows[] = {
-      {"consent respected", true, 0, false, 0, false, "uuid-respect-dnu"},
-      {"overridden, given", true, 1, false, 0, false, "uuid-override-dnu"},
-      {"custom", true, 0, true, 0, false, "uuid:Mail:imap"},
-      {"custom, overridden", false, 1, true, 0, false, "uuid:Mail:imap"},
-      {"extras on an internal device", true, 0, true, 1, true, ""},
-      {"extras elsewhere", true, 0, true, 1, false, "uuid:Mail:imap"},
-      {"no extras on an internal device", true, 0, false, 0, true, "uuid-respect-dnu"},
+      {"consent respected", true, 0, false, false, false, "uuid-respect-dnu"},
+      {"overridden, given", true, 1, false, false, false, "uuid-override-dnu"},
+      {"custom", true, 0, true, false, false, "uuid:Mail:imap"},
+      {"custom, overridden", false, 1, true, false, false, "uuid:Mail:imap"},
+      {"extras on an internal device", true, 0, true, true, true, ""},
+      {"extras elsewhere", true, 0, true, true, false, "uuid:Mail:imap"},
+      {"no extras on an internal device", true, 0, false, false, true, "uuid-respect-dnu"},
   };
   for (const auto& row : rows) {
     platform.http.clear();
     platform.device.consent = row.consent;
     Setup setup = requiring({{"override_dnu", row.overrideDnu},
-                             {"extras_on_internal", row.extras},
+                             {"extras_on_internal", row.extras ? 1 : 0},
                              {"custom_clientId", row.custom ? Value(false) : Value()}});
     setup.identity.isInternal = row.isInternal;
     send(*makeBackend(setup), 1);

@@ -9,6 +9,7 @@
 #include "platform/Connect.h"
 #include "platform/UserDefaults.h"
 #include "tests/integration/IntegrationFixture.h"
+#include "tests/platform/Waiting.h"
 #include "tests/support/ServiceManager.h"
 
 namespace orvanta::test {
@@ -105,12 +106,10 @@ TEST_F(AdaptorTest, TheServiceManagerHearsHowManySessionsThereAre) {
   options.environment["NOTIFY_SOCKET"] = manager.path();
   startDaemon();
   const auto hears = [&](const std::string& text) {
-    return daemon->settles(
-        [&] {
-          const auto heard = manager.heard();
-          return std::find(heard.begin(), heard.end(), text) == heard.end() ? 1U : 0U;
-        },
-        0);
+    return eventually([&] {
+      const auto heard = manager.heard();
+      return std::find(heard.begin(), heard.end(), text) != heard.end();
+    });
   };
   EXPECT_TRUE(hears("READY=1\nSTATUS=idle"));
   auto first = connect();

@@ -101,6 +101,7 @@ TEST_F(BatchingTest, FlushesThatCannotSendSayWhy) {
   ASSERT_TRUE(anonymous->session().blocking().fetchStates(user().dictionary()));
   EXPECT_EQ(flush(*anonymous).error,
             makeOrvantaError("Nothing to flush: batched events were completely filtered out", -1));
+  EXPECT_EQ(flush(*anonymous).error, makeOrvantaError("Nothing to flush", -1)) << "the batch is gone";
 }
 
 TEST_F(BatchingTest, AServerErrorAnswersTheFlushAndDisables) {

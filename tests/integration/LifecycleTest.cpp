@@ -74,14 +74,6 @@ TEST_F(LifecycleTest, AfterSIGKILLAStaleSocketIsReplacedAndTheDefaultsAreWhole) 
   EXPECT_TRUE(platform::readPropertyListFile(daemon->stateDirectory() + "/com.kovalt.orvanta.plist"));
 }
 
-TEST_F(LifecycleTest, ASecondDaemonOnTheSameSocketSaysWhoIsThere) {
-  startDaemon();
-  ChildProcess other(program("orvantad"));
-  EXPECT_EQ(other.wait(), 1);
-  EXPECT_NE(other.allLines().find(std::to_string(daemon->process().pid())), std::string::npos) << other.allLines();
-  EXPECT_TRUE(openSession({.sessionID = 1}));
-}
-
 TEST_F(LifecycleTest, OutsideTheSandboxItRunsWithAWarningAndLeaksNothing) {
   options.sandbox = false;
   startDaemon();
