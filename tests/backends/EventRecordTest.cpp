@@ -176,7 +176,6 @@ TEST_F(EventRecordTest, EqualsTheStepwiseDictionary) {
     RandomRecords random{std::mt19937(seed)};
     BackendIdentity identity = defaultIdentity();
     if (random.chance(0.3)) identity.productVersion.reset();
-    if (random.chance(0.3)) identity.buildVersion.reset();
     if (random.chance(0.3)) identity.compType = 7;
     const auto fields = fieldsOf(identity);
     const SharedDictionary payload = random.chance(0.1) ? nullptr : shared(random.dictionary(12));

@@ -16,17 +16,6 @@ class HTTPSPostConfigurationTest : public HTTPSFixture {
   }
 };
 
-TEST_F(HTTPSPostConfigurationTest, RefusesProfilesWithoutClients) {
-  const LogCapture log;
-  const std::string line = "<3>HTTPSPostBackend(initWithName): can't find the client list.";
-  EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", nullptr, "Parva"), nullptr);
-  EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", shared(profileOf({})), ""), nullptr);
-  EXPECT_EQ(log.count(line), 0U);
-  EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", shared({}), "Parva"), nullptr);
-  EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", shared({{"clients", "Mail"}}), "Parva"), nullptr);
-  EXPECT_EQ(log.count(line), 2U);
-}
-
 TEST_F(HTTPSPostConfigurationTest, LinesOfAnEvaluation) {
   const Array byCountry{Dictionary{{"country", Array{"DE"}}, {"threshold", 0.5}}};
   Setup setup = requiring({{"expedite", 0},

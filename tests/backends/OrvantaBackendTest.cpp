@@ -73,17 +73,19 @@ std::array<unsigned short, 3> generatorState() {
 }
 
 TEST_F(OrvantaBackendTest, EachBackendDrawsOnceFromTheGenerator) {
+  const LogCapture log;
   auto state = generatorState();
   for (int i = 0; i < 3; ++i) {
     // These construct nothing and so draw nothing.
-    HTTPSPostBackend::create(platform, "http_post", nullptr, "Parva");
-    HTTPSPostBackend::create(platform, "http_post", shared({}), "Parva");
-    HTTPSPostBackend::create(platform, "http_post", shared(profileOf({})), "");
+    EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", nullptr, "Parva"), nullptr);
+    EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", shared({{"clients", "Mail"}}), "Parva"), nullptr);
+    EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", shared(profileOf({})), ""), nullptr);
     const double expected = ::erand48(state.data());
     const auto backend = HTTPSPostBackend::create(platform, "http_post", shared(profileOf({})), "Parva");
     EXPECT_EQ(backend->samplingFactor(), expected);
     EXPECT_TRUE(expected >= 0 && expected < 1);
   }
+  EXPECT_EQ(log.count("<3>HTTPSPostBackend(initWithName): can't find the client list."), 3U);
 }
 
 }  // namespace

@@ -25,22 +25,6 @@ TEST_F(Calls, goOutAsRequestsOrNotificationsWithAllTheirArguments) {
             (Array{Dictionary{{"category", 3}, {"type", 65535}, {"payload", Dictionary{{"a", 1.5}}}, {"flag", 3}}}));
 }
 
-TEST_F(Calls, answersInAnyOrderReachTheirCallers) {
-  Awaited<StringReply> first, second, third;
-  session().sendMessageWithCategory(1, 1, nullptr, first.reply());
-  session().sendMessageWithCategory(2, 1, nullptr, second.reply());
-  session().fetchDisplayURL(third.reply());
-  const Frame one = peer->next(), two = peer->next(), three = peer->next();
-  peer->answer(three, {"three"});
-  peer->answer(one, {nullptr});
-  peer->refuse(two, "no such thing");
-  EXPECT_EQ(textOf(third.get()), "three");
-  EXPECT_EQ(textOf(first.get()), "(null)");
-  const auto refused = second.get();
-  EXPECT_EQ(textOf(refused), "error: no such thing");
-  EXPECT_EQ(refused.error.kind, CallErrorKind::refused);
-}
-
 TEST_F(Calls, malformedAnswersFailTheCallAndNothingElse) {
   const Value error = Dictionary{{"domain", "d"}, {"code", -1}, {"description", "Nothing to flush"}};
   const struct {

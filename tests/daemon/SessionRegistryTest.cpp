@@ -39,15 +39,6 @@ class HierarchyTest : public SessionFixture {
   OrvantaBackend& backend(OrvantadSession& session) { return *session.backends()->find("http_post"); }
 };
 
-TEST_F(HierarchyTest, TheFirstRegisteredSessionOfTheLevelAboveIsTheParent) {
-  const auto first = join(1, "t", 1);
-  const auto second = join(2, "t", 1);
-  const auto child = join(3, "t", 2);
-  EXPECT_EQ(parentOf(*child), first);
-  configure(*first, 1, hierarchy("t", 1), user());
-  EXPECT_EQ(parentOf(*child), second) << "a session that is configured again goes to the end";
-}
-
 TEST_F(HierarchyTest, QuestionsWithoutAnAnswerSayWhy) {
   const auto root = join(1, "t", 0);
   const auto orphan = join(2, "t", 2);
@@ -74,18 +65,21 @@ TEST_F(HierarchyTest, QuestionsWithoutAnAnswerSayWhy) {
   hasNoParent("ERROR: No sessions found for hierarchyToken t");
 }
 
-TEST_F(HierarchyTest, ASessionIsInOneGroupAtMost) {
-  const auto session = join(1, "t1", 0);
-  const auto child = join(2, "t1", 1);
-  EXPECT_EQ(parentOf(*child), session);
-  configure(*session, 1, hierarchy("t2", 0), user());
-  EXPECT_EQ(parentOf(*child), nullptr);
-  const auto other = join(3, "t2", 1);
-  EXPECT_EQ(parentOf(*other), session);
-  configure(*session, 1, {}, user());
+TEST_F(HierarchyTest, TheFirstRegisteredOfTheLevelAboveIsTheParentAndNobodyIsInTwoGroups) {
+  const auto first = join(1, "t", 1);
+  const auto second = join(2, "t", 1);
+  const auto child = join(3, "t", 2);
+  EXPECT_EQ(parentOf(*child), first);
+  configure(*first, 1, hierarchy("t", 1), user());
+  EXPECT_EQ(parentOf(*child), second) << "a session that is configured again goes to the end";
+  configure(*second, 2, hierarchy("t2", 1), user());
+  EXPECT_EQ(parentOf(*child), first);
+  const auto other = join(4, "t2", 2);
+  EXPECT_EQ(parentOf(*other), second);
+  configure(*second, 2, {}, user());
   EXPECT_EQ(parentOf(*other), nullptr) << "configured again without a token it leaves its group";
   EXPECT_TRUE(
-      log.contains("<6>updateCorrelatedSessions: Session 1 has no correlated sessions as it is a standalone session"));
+      log.contains("<6>updateCorrelatedSessions: Session 2 has no correlated sessions as it is a standalone session"));
 }
 
 TEST_F(HierarchyTest, LevelsThatCannotBeAreRefusedWithoutEffect) {

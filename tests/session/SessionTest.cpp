@@ -163,8 +163,8 @@ TEST_F(SessionIntakeTest, NumbersAreCutToSixteenBitsAndAggregatedWithTheirTime) 
     device.powerLog.records.clear();
     send(*session, {{"category", category}, {"type", 65538}, {"payload", Dictionary{{"x", 1}}}});
     ASSERT_EQ(device.powerLog.records.size(), 1U) << category.description();
-    EXPECT_EQ(device.powerLog.records[0].record.find("method")->integerValue(), expected);
-    EXPECT_EQ(device.powerLog.records[0].record.find("respCode")->integerValue(), 2);
+    EXPECT_EQ(*device.powerLog.records[0].record.find("method"), Value(expected));
+    EXPECT_EQ(*device.powerLog.records[0].record.find("respCode"), Value(2));
   }
   // 65536 is category 0, which the power log never sees; the aggregating client does.
   device.clock.set(1'700'000'123.25);

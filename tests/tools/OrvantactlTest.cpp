@@ -179,7 +179,7 @@ TEST_F(Pipeline, writesAnswersInOrderAndCountsFailures) {
   char* written = nullptr;
   std::size_t size = 0;
   std::FILE* out = ::open_memstream(&written, &size);
-  EventPipeline pipeline(session(), 4, out);
+  EventPipeline pipeline(session(), 4, out);  // its answers come in another order
   pipeline.send(1, {.category = 1});
   pipeline.send(2, {.category = 2});
   pipeline.send(4, {.category = 3});
