@@ -17,16 +17,12 @@ namespace {
 using Clock = std::chrono::steady_clock;
 using Seconds = std::chrono::duration<double>;
 
-// What allocators keep. Sanitizers keep what has been freed.
-#if defined(__SANITIZE_THREAD__) || defined(__SANITIZE_ADDRESS__)
-constexpr std::size_t kMemoryLeewayKiB = 256 * 1024;
-#else
-constexpr std::size_t kMemoryLeewayKiB = 512;
-#endif
-
 class DashboardTest : public IntegrationFixture {
  protected:
-  static constexpr double kLeeway = 0.1;
+  static constexpr int kPeriod = 300;  // ms
+  // The daemon's own leeway of 0.1 s, and what a busy machine takes to let it run. Less than a period: each tick
+  // counts.
+  static constexpr double kLeeway = 0.25;
   static constexpr std::size_t kPerSession = 2;  // descriptors: its connection's and its dashboard backend's
   // The last tick before each transmission but the first, counted from the tick before the first.
   static constexpr double kTicksBetween[] = {3, 5, 9};
@@ -55,7 +51,6 @@ class DashboardTest : public IntegrationFixture {
 };
 
 TEST_F(DashboardTest, NothingIsLostOrAcknowledgedTwiceWhenAcknowledgementsAreLost) {
-  constexpr int kPeriod = 200;
   constexpr std::uint16_t kEvents = 40;
   setSection(dashboard(kPeriod, server->dashboardPort()));
   collector::AcknowledgementSettings losing;
@@ -106,24 +101,23 @@ TEST_F(DashboardTest, AThousandSessionsLeaveNothingBehind) {
   openAndClose(200);  // fills what is kept
   ASSERT_TRUE(daemon->settles(descriptorCount, descriptors));
   const auto threads = daemon->threadCount();
-  const auto resident = daemon->residentKiB();
-  openAndClose(1000);
-  EXPECT_TRUE(daemon->settles(descriptorCount, descriptors));
-  EXPECT_TRUE(daemon->settles([this] { return daemon->threadCount(); }, threads));
-  fmt::print("resident memory: {} KiB before a thousand sessions, {} KiB after\n", resident, daemon->residentKiB());
-  EXPECT_LT(daemon->residentKiB(), resident + kMemoryLeewayKiB);
+  constexpr std::size_t kLeewayKiB = 512;  // half a KiB a session
+  EXPECT_TRUE(daemon->keepsItsMemory(kLeewayKiB, [&] {
+    openAndClose(1000);
+    EXPECT_TRUE(daemon->settles(descriptorCount, descriptors));
+    EXPECT_TRUE(daemon->settles([this] { return daemon->threadCount(); }, threads));
+  }));
 }
 
 // The dashboard server, and a stranger, flood the daemon with everything but the right acknowledgement.
 TEST_F(DashboardTest, AMillionWrongAcknowledgementsRemoveNothingAndHarmNobody) {
   constexpr unsigned kFlood = 1'000'000;
-  constexpr double kPeriod = 0.3;
   UdpServer dashboardServer, stranger;
   const auto numberOf = [](const std::optional<std::vector<std::uint8_t>>& datagram) {
     EXPECT_TRUE(datagram) << "no datagram came";
     return datagram ? decodeDashboardDatagram(*datagram)->header.eventNumber : std::uint16_t{0};
   };
-  setSection(dashboard(static_cast<int>(kPeriod * 1000), dashboardServer.port()));
+  setSection(dashboard(kPeriod, dashboardServer.port()));
   startQuietDaemon();
   auto bystander = connect();  // without a backend; its calls are carried out by the same threads
   auto session = openSession({.sessionID = 7});
@@ -133,6 +127,7 @@ TEST_F(DashboardTest, AMillionWrongAcknowledgementsRemoveNothingAndHarmNobody) {
 
   send(*session, event(9, 1));
   const auto sentAt = Clock::now();
+  const double cpuBefore = daemon->cpuSeconds();
   const auto datagram = dashboardServer.receive();
   const auto awaited = numberOf(datagram);
   ASSERT_EQ(awaited, 2);
@@ -162,14 +157,19 @@ TEST_F(DashboardTest, AMillionWrongAcknowledgementsRemoveNothingAndHarmNobody) {
   }
   flooder.join();
   const double wall = Seconds(Clock::now() - sentAt).count();
+  const double cpu = daemon->cpuSeconds() - cpuBefore;
   std::sort(roundTrips.begin(), roundTrips.end());
   const double median = roundTrips[roundTrips.size() / 2];
-  fmt::print("a flood of {:.1f} s: the median of another session's calls was {:.0f} us\n", wall, median * 1e6);
+  fmt::print("a flood of {:.1f} s: the median of another session's calls was {:.0f} us, the daemon took {:.1f} s\n",
+             wall, median * 1e6, cpu);
   // The flooder takes a processor of its own, which on a small machine the calls would otherwise have.
   EXPECT_LT(median, 0.05);
+#if !defined(__SANITIZE_THREAD__) && !defined(__SANITIZE_ADDRESS__)
+  EXPECT_LT(cpu, 10.0) << "1 us is usual for each acknowledgement, and 10 for each of the calls beside them";
+#endif
 
   // The datagram has kept its schedule, which a removal would have ended.
-  const double ticks = std::floor(wall / kPeriod) - 1;
+  const double ticks = std::floor(wall * 1000 / kPeriod) - 1;
   for (const int tick : {2, 5, 10, 19}) {
     if (tick > ticks) break;
     EXPECT_EQ(numberOf(dashboardServer.receive()), awaited);

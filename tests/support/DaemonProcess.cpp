@@ -85,6 +85,27 @@ std::size_t DaemonProcess::residentKiB() const {
   return resident * static_cast<std::size_t>(::sysconf(_SC_PAGESIZE)) / 1024;
 }
 
+bool DaemonProcess::keepsItsMemory(std::size_t leewayKiB, const std::function<void()>& work) const {
+#if defined(__SANITIZE_THREAD__) || defined(__SANITIZE_ADDRESS__)
+  constexpr bool kSanitized = true;
+#else
+  constexpr bool kSanitized = false;
+#endif
+  for (int tries = 0; tries < 4; ++tries) {
+    const std::size_t before = residentKiB();
+    work();
+    if (kSanitized || residentKiB() <= before + leewayKiB) return true;
+  }
+  return false;
+}
+
+double DaemonProcess::cpuSeconds() const {
+  clockid_t clock = 0;
+  timespec used{};
+  if (::clock_getcpuclockid(_process->pid(), &clock) != 0 || ::clock_gettime(clock, &used) != 0) return 0;
+  return static_cast<double>(used.tv_sec) + static_cast<double>(used.tv_nsec) / 1e9;
+}
+
 bool DaemonProcess::settles(const std::function<std::size_t()>& counter, std::size_t limit) const {
   const auto deadline = std::chrono::steady_clock::now() + ChildProcess::kPatience;
   while (counter() > limit) {

@@ -67,6 +67,11 @@ class DaemonProcess {
   std::size_t residentKiB() const;
   // Counts until `counter` gives at most `limit`; false when it never does.
   bool settles(const std::function<std::size_t()>& counter, std::size_t limit) const;
+  // Whether `work` leaves the resident memory as it was, but for `leewayKiB`. What is kept, such as the buffers of a
+  // thread more, makes it grow once; a leak does each of a few times. Sanitizers keep what is freed: then it is true.
+  bool keepsItsMemory(std::size_t leewayKiB, const std::function<void()>& work) const;
+  // The processor time that the daemon has used so far.
+  double cpuSeconds() const;
 
   // The build's programs.
   static std::string programPath(const std::string& name) { return std::string(ORVANTA_BIN_DIR) + "/" + name; }
