@@ -88,11 +88,7 @@ TEST_F(EventRecordTest, ReservedKeysThatDependOnTheSession) {
       {"type 15", type(15), "_sender", "QB-JOVEX"},
       {"internal build", same, "_internal", 3, "a", true},
       {"no model", [](Identity& i) { i.hardwareType.reset(); }, "_productModel", nullptr},
-      {"start within a minute",
-       [](Identity& i) {
-         i.startTimestamp = {1'000'059, 700'000};
-       },
-       "_startTS", 1'000'020},
+      {"start within a minute", [](Identity& i) { i.startTimestamp.seconds = 1'000'059; }, "_startTS", 1'000'020},
   };
   for (const auto& row : rows) {
     BackendIdentity identity = defaultIdentity();

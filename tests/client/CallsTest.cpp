@@ -1,5 +1,7 @@
 // What each operation looks like on the wire, and how answers find their way back.
 
+#include <tuple>
+
 #include "interface/WireLimits.h"
 #include "tests/client/ClientFixture.h"
 
@@ -26,31 +28,27 @@ TEST_F(Calls, goOutAsRequestsOrNotificationsWithAllTheirArguments) {
 }
 
 TEST_F(Calls, malformedAnswersFailTheCallAndNothingElse) {
-  const Value error = Dictionary{{"domain", "d"}, {"code", -1}, {"description", "Nothing to flush"}};
-  const struct {
-    const char* name;
-    Value error;
-    Value result;
-    bool accepted;
-  } rows[] = {
-      {"text and no error", nullptr, Array{"sent", nullptr}, true},
-      {"error object", nullptr, Array{nullptr, error}, true},
-      {"too few values", nullptr, Array{"sent"}, false},
-      {"too many values", nullptr, Array{"sent", nullptr, nullptr}, false},
-      {"number for a text", nullptr, Array{5, nullptr}, false},
-      {"error without a code", nullptr, Array{nullptr, Dictionary{{"domain", "d"}, {"description", "x"}}}, false},
-      {"result that is no array", nullptr, "sent", false},
-      {"neither error nor result", nullptr, nullptr, false},
-      {"transport's error", "reply dropped", nullptr, false},
-      {"error that is no text", 17, Array{"sent", nullptr}, false},
+  const Value noCode = Dictionary{{"domain", "d"}, {"description", "x"}};
+  const Value flushError = Dictionary{{"domain", "d"}, {"code", -1}, {"description", "Nothing to flush"}};
+  const std::tuple<const char*, Value, Value> rows[] = {
+      {nullptr, nullptr, Array{"sent", nullptr}},  // these two are in order
+      {nullptr, nullptr, Array{nullptr, flushError}},
+      {"too few values", nullptr, Array{"sent"}},
+      {"too many values", nullptr, Array{"sent", nullptr, nullptr}},
+      {"number for a text", nullptr, Array{5, nullptr}},
+      {"error without a code", nullptr, Array{nullptr, noCode}},
+      {"result that is no array", nullptr, "sent"},
+      {"neither error nor result", nullptr, nullptr},
+      {"transport's error", "reply dropped", nullptr},
+      {"error that is no text", 17, Array{"sent", nullptr}},
   };
-  for (const auto& row : rows) {
+  for (const auto& [flaw, error, result] : rows) {
     Awaited<FlushReply> flushed;
     session().flushMessagesWithCompletion(flushed.reply());
-    peer->respond(peer->next().messageID, row.error, row.result);
+    peer->respond(peer->next().messageID, error, result);
     const auto outcome = flushed.get();
-    EXPECT_EQ(outcome.values.has_value(), row.accepted) << row.name;
-    EXPECT_EQ(outcome.error.text.empty(), row.accepted) << row.name;
+    EXPECT_EQ(outcome.values.has_value(), flaw == nullptr) << result.description();
+    EXPECT_EQ(outcome.error.text.empty(), flaw == nullptr) << result.description();
   }
 }
 
