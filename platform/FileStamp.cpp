@@ -4,11 +4,12 @@
 #include <fmt/format.h>
 #include <sys/stat.h>
 
-#include <array>
 #include <cerrno>
 #include <system_error>
+#include <utility>
 
 #include "platform/UniqueFd.h"
+#include "platform/WholeFile.h"
 
 namespace platform {
 
@@ -74,17 +75,10 @@ Result<StampedContent> readStamped(const std::string& path, std::size_t maximumB
   if (::fstat(fd.get(), &status) != 0) return failure(path, std::system_category().message(errno));
   if (!S_ISREG(status.st_mode)) return failure(path, "not a regular file");
   content.stamp = stampFrom(status);
-  std::array<char, 16384> buffer;
-  for (;;) {
-    const ssize_t count = ::read(fd.get(), buffer.data(), buffer.size());
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return failure(path, std::system_category().message(errno));
-    if (count == 0) return content;
-    if (content.bytes.size() + static_cast<std::size_t>(count) > maximumBytes) {
-      return failure(path, fmt::format("more than {} bytes", maximumBytes));
-    }
-    content.bytes.append(buffer.data(), static_cast<std::size_t>(count));
-  }
+  auto bytes = readToEnd(fd.get(), maximumBytes);
+  if (!bytes) return failure(path, bytes.error());
+  content.bytes = std::move(*bytes);
+  return content;
 }
 
 }  // namespace platform

@@ -13,13 +13,12 @@
 #include <cerrno>
 #include <cstdint>
 #include <cstring>
-#include <fstream>
-#include <iterator>
 #include <memory>
 #include <optional>
 #include <utility>
 
 #include "platform/UniqueFd.h"
+#include "platform/WholeFile.h"
 
 namespace orvanta::collector {
 
@@ -36,6 +35,7 @@ constexpr long kDay = 24L * 60 * 60;
 constexpr long kAuthorityDays = 3650;
 constexpr long kServerDays = 397;
 constexpr long kRenewalDays = 30;
+constexpr std::size_t kMaximumPemBytes = 1U << 20U;
 
 Failure openSslFailure(std::string_view what) {
   const char* reason = ERR_reason_error_string(ERR_get_error());
@@ -123,11 +123,6 @@ Result<ServerIdentity> makeAuthority() {
   return identityText(certificate.get(), key.get());
 }
 
-std::string readText(const std::string& path) {
-  std::ifstream file(path, std::ios::binary);
-  return {std::istreambuf_iterator<char>(file), {}};
-}
-
 std::optional<Failure> writeText(const std::string& path, const std::string& text, mode_t mode) {
   const platform::UniqueFd file(::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, mode));
   if (!file || ::write(file.get(), text.data(), text.size()) != static_cast<ssize_t>(text.size())) {
@@ -141,7 +136,12 @@ std::optional<Failure> writeText(const std::string& path, const std::string& tex
 Result<CertificateAuthority> CertificateAuthority::readOrMake(const std::string& directory) {
   const std::string certificateFile = directory + "/ca.pem";
   const std::string keyFile = directory + "/ca-key.pem";
-  ServerIdentity kept{readText(certificateFile), readText(keyFile)};
+  // Without one of the two files, or with one that cannot be read, there is nothing to keep.
+  const auto textOf = [](const std::string& path) {
+    auto text = platform::readWholeFile(path, kMaximumPemBytes);
+    return text ? std::move(*text) : std::string();
+  };
+  ServerIdentity kept{textOf(certificateFile), textOf(keyFile)};
   if (usable(kept)) return CertificateAuthority(certificateFile, std::move(kept));
   auto made = makeAuthority();
   if (!made) return Failure{made.error()};

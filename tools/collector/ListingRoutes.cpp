@@ -1,11 +1,10 @@
 #include <fmt/format.h>
 
 #include <charconv>
-#include <fstream>
-#include <iterator>
 #include <optional>
 #include <utility>
 
+#include "platform/WholeFile.h"
 #include "tools/collector/ApiRoutes.h"
 #include "tools/collector/Listings.h"
 
@@ -22,6 +21,7 @@ namespace {
 
 constexpr std::int64_t kUsualLimit = 1000;
 constexpr std::int64_t kHighestLimit = 100'000;
+constexpr std::size_t kMaximumFileBytes = 1U << 20U;  // certificates and keys have a few KiB
 
 std::optional<std::int64_t> wholeNumber(const std::string& text) {
   std::int64_t number = 0;
@@ -74,9 +74,9 @@ void answerBytes(Response& response, const std::optional<ReceivedRequest>& found
 }
 
 void answerFile(Response& response, const std::string& path, const char* type) {
-  std::ifstream file(path, std::ios::binary);
-  if (!file) return answerError(response, 404, "no such file");
-  response.set_content(std::string(std::istreambuf_iterator<char>(file), {}), type);
+  const auto file = platform::readWholeFile(path, kMaximumFileBytes);
+  if (!file) return answerError(response, 404, file.error());
+  response.set_content(*file, type);
 }
 
 std::int64_t numberIn(const Request& request) {

@@ -80,8 +80,9 @@ class SessionRun {
   bool openInput() {
     if (_options.file.empty() || _options.file == "-") return true;
     _file.reset(::open(_options.file.c_str(), O_RDONLY | O_CLOEXEC));
-    if (_file) return true;
-    complain(fmt::format("cannot read {}: {}", _options.file, std::strerror(errno)));
+    struct stat facts {};
+    if (_file && ::fstat(_file.get(), &facts) == 0 && !S_ISDIR(facts.st_mode)) return true;
+    complain(fmt::format("cannot read {}: {}", _options.file, std::strerror(_file ? EISDIR : errno)));
     _status = kUsage;
     return false;
   }

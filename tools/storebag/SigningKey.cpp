@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <fmt/format.h>
+#include <openssl/bio.h>
 #include <openssl/err.h>
 #include <openssl/evp.h>
 #include <openssl/pem.h>
@@ -16,6 +17,7 @@
 #include <utility>
 
 #include "platform/Digest.h"
+#include "platform/WholeFile.h"
 
 namespace orvanta {
 
@@ -24,8 +26,11 @@ using platform::Result;
 
 namespace {
 
+constexpr std::size_t kMaximumPemBytes = 1U << 20U;
+
 using KeyPointer = std::unique_ptr<EVP_PKEY, decltype(&EVP_PKEY_free)>;
 using ContextPointer = std::unique_ptr<EVP_PKEY_CTX, decltype(&EVP_PKEY_CTX_free)>;
+using BioPointer = std::unique_ptr<BIO, decltype(&BIO_free)>;
 using FilePointer = std::unique_ptr<std::FILE, decltype(&std::fclose)>;
 
 // What stands before the 20 digest bytes in the signed block: the DER of DigestInfo for SHA-1.
@@ -96,10 +101,11 @@ Result<std::shared_ptr<const SigningKey>> SigningKey::generate(unsigned bits) {
 }
 
 Result<std::shared_ptr<const SigningKey>> SigningKey::read(const std::string& path) {
-  const FilePointer file(std::fopen(path.c_str(), "re"), &std::fclose);
-  if (!file) return Failure{fmt::format("cannot read {}: {}", path, std::strerror(errno))};
+  const auto pem = platform::readWholeFile(path, kMaximumPemBytes);
+  if (!pem) return Failure{pem.error()};
+  const BioPointer source(BIO_new_mem_buf(pem->data(), static_cast<int>(pem->size())), &BIO_free);
   // The empty pass phrase keeps OpenSSL from asking for one on the terminal.
-  KeyPointer key(PEM_read_PrivateKey(file.get(), nullptr, nullptr, const_cast<char*>("")), &EVP_PKEY_free);
+  KeyPointer key(PEM_read_bio_PrivateKey(source.get(), nullptr, nullptr, const_cast<char*>("")), &EVP_PKEY_free);
   if (!key) return Failure{fmt::format("{} is no private key in PEM form: {}", path, lastOpenSslError())};
   if (EVP_PKEY_get_base_id(key.get()) != EVP_PKEY_RSA) return Failure{path + " is no RSA key"};
   return std::shared_ptr<const SigningKey>(std::make_shared<OpenSslSigningKey>(std::move(key)));

@@ -6,10 +6,10 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <iterator>
 
 #include "platform/Json.h"
 #include "platform/PropertyList.h"
+#include "platform/WholeFile.h"
 
 namespace orvanta {
 
@@ -19,7 +19,7 @@ using platform::Value;
 
 namespace {
 
-constexpr std::uintmax_t kMaximumFileBytes = 64U << 20U;
+constexpr std::size_t kMaximumFileBytes = 64U << 20U;
 
 Result<std::vector<std::uint8_t>> decodedField(const platform::Dictionary& document, std::string_view key) {
   const Value* field = document.find(key);
@@ -93,16 +93,9 @@ Result<Value> readBagSource(const std::string& path) {
 }
 
 Result<std::vector<std::uint8_t>> readFile(const std::string& path) {
-  std::error_code error;
-  const auto size = std::filesystem::file_size(path, error);
-  if (error) return Failure{fmt::format("cannot read {}: {}", path, error.message())};
-  if (size > kMaximumFileBytes) return Failure{fmt::format("{} is larger than {} MiB", path, kMaximumFileBytes >> 20U)};
-  std::ifstream file(path, std::ios::binary);
-  if (!file) return Failure{fmt::format("cannot read {}: {}", path, std::strerror(errno))};
-  std::vector<std::uint8_t> bytes(size);
-  file.read(reinterpret_cast<char*>(bytes.data()), static_cast<std::streamsize>(size));
-  bytes.resize(static_cast<std::size_t>(file.gcount()));
-  return bytes;
+  const auto bytes = platform::readWholeFile(path, kMaximumFileBytes);
+  if (!bytes) return Failure{bytes.error()};
+  return std::vector<std::uint8_t>(bytes->begin(), bytes->end());
 }
 
 std::optional<Failure> writeFile(const std::string& path, std::span<const std::uint8_t> bytes) {

@@ -1,0 +1,15 @@
+#pragma once
+
+#include <cstddef>
+#include <string>
+
+#include "platform/Result.h"
+
+namespace platform {
+
+// What is left to read from a descriptor, up to its end. The failure is the reason alone.
+Result<std::string> readToEnd(int fd, std::size_t maximumBytes);
+// What a user has named, a pipe included, for which it waits. The failure names the path; a directory is one.
+Result<std::string> readWholeFile(const std::string& path, std::size_t maximumBytes);
+
+}  // namespace platform
