@@ -5,6 +5,7 @@
 #include <memory>
 #include <mutex>
 
+#include "interface/WireLimits.h"
 #include "platform/Platform.h"
 
 namespace orvanta {
@@ -15,7 +16,7 @@ namespace orvanta {
 // pass a large one for ever.
 class UploadBudget {
  public:
-  static constexpr std::uint64_t kMaximumFileBytes = 128U << 20U;
+  static constexpr std::uint64_t kMaximumFileBytes = kMaximumUploadBytes;
   // While it is compressed a file is in memory as it is, and twice as what becomes of it (a buffer of the worst size,
   // then the copy of the right size). Beside one of the largest there is room for small ones.
   static constexpr std::uint64_t kCopies = 3;

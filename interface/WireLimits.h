@@ -12,6 +12,7 @@ inline constexpr std::size_t kMaximumUnreadReplies = 1U << 20U;  // then nothing
 inline constexpr std::size_t kMaximumWaitingAggregatedEvents = 4U
                                                                << 20U;  // bytes; then events are dropped, notices never
 inline constexpr std::size_t kMaximumWaitingDescriptors = 16;
+inline constexpr std::size_t kMaximumUploadBytes = 128U << 20U;  // of one file, which the daemon holds in memory
 inline constexpr std::size_t kMaximumHierarchyLevel = 2'147'483'647;
 
 }  // namespace orvanta

@@ -1,15 +1,17 @@
 #include <fmt/format.h>
+#include <sys/stat.h>
 
 #include <cerrno>
 #include <cstring>
-#include <fstream>
-#include <iterator>
 #include <memory>
 #include <string>
 #include <utility>
 #include <vector>
 
+#include "interface/WireLimits.h"
 #include "platform/Json.h"
+#include "platform/PropertyList.h"
+#include "platform/WholeFile.h"
 #include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
 #include "tools/orvantactl/ConfiguredSession.h"
@@ -23,6 +25,22 @@ namespace {
 struct UploadOptions : ClientOptions {
   std::vector<std::string> files;
 };
+
+// JSON is at most about twice as long as the frame that its values travel in.
+constexpr std::size_t kMaximumLogBytes = 2 * kMaximumFrameBytes;
+
+// The daemon answers no more than no, so what can be seen from here is looked at; what is left is the daemon's side.
+std::string reasonNotTaken(const std::string& file) {
+  struct stat facts {};
+  if (::stat(file.c_str(), &facts) != 0) return std::strerror(errno);
+  if (!S_ISREG(facts.st_mode)) return "it is not a regular file";
+  if (facts.st_size == 0) return "it is empty";
+  if (static_cast<std::uint64_t>(facts.st_size) > kMaximumUploadBytes) {
+    return fmt::format("it has {} bytes, and the daemon takes at most {} MiB", facts.st_size,
+                       kMaximumUploadBytes >> 20U);
+  }
+  return "the client type's storebag must have an \"upload_server\" with a \"post_url\". The daemon's log says more";
+}
 
 int upload(const UploadOptions& options) {
   int status = kAllTaken;
@@ -38,10 +56,7 @@ int upload(const UploadOptions& options) {
     }
     printLine(platform::writeJson(platform::Dictionary{{"file", file}, {"uploaded", *uploaded}}));
     if (!*uploaded) {
-      complain(
-          fmt::format("{} was not taken: it must be a regular file that is not empty, and the client type's storebag "
-                      "must have an upload server. The daemon's log says more.",
-                      file));
+      complain(fmt::format("{} was not taken: {}", file, reasonNotTaken(file)));
       status = kSomethingNotTaken;
     }
   }
@@ -50,29 +65,34 @@ int upload(const UploadOptions& options) {
 
 int uploadLog(const UploadOptions& options) {
   const auto& file = options.files.front();
-  std::ifstream input(file, std::ios::binary);
-  const std::string text((std::istreambuf_iterator<char>(input)), std::istreambuf_iterator<char>());
-  if (!input.is_open() || input.bad()) {
-    complain(fmt::format("cannot read {}: {}", file, std::strerror(errno)));
+  const auto text = platform::readWholeFile(file, kMaximumLogBytes);
+  if (!text) {
+    complain(text.error());
     return kUsage;
   }
-  auto parsed = parseTaggedJson(text);
-  auto* entries = parsed ? parsed->array() : nullptr;
-  if (entries == nullptr) {
+  auto parsed = parseTaggedJson(*text);
+  if (!parsed || parsed->array() == nullptr) {
     complain(fmt::format("{} must hold a JSON array{}", file, parsed ? "" : ": " + parsed.error()));
+    return kUsage;
+  }
+  // The daemon archives the values as a property list, and of one that it cannot write says no more than no.
+  if (const auto archived = platform::writeBinaryPropertyList(*parsed); !archived) {
+    complain(fmt::format("{} holds a value that cannot be archived: {}", file, archived.error()));
     return kUsage;
   }
   int status = kAllTaken;
   const auto session = configureOrComplain(options, status);
   if (!session.connection) return status;
   const auto answer = session.connection->session().blocking().uploadLogData(
-      std::make_shared<const platform::Array>(std::move(*entries)));
+      std::make_shared<const platform::Array>(std::move(*parsed->array())));
   if (!answer) return complain(answer.error());
   platform::Dictionary line{{"uploaded", answer->uploaded}};
   if (answer->error) line.set("error", answer->error->description);
   printLine(platform::writeJson(line));
   if (answer->uploaded) return kAllTaken;
-  complain("the log data was not taken: the client type's storebag must have a dashboard with a \"post_url\"");
+  complain(
+      "the log data was not taken: the client type's storebag must have a \"dashboard\" with a \"post_url\", and the "
+      "server there must answer with a text. The daemon's log says more.");
   return kSomethingNotTaken;
 }
 
