@@ -16,6 +16,7 @@
 int main() {
   using namespace orvanta;
 
+  platform::secureStandardDescriptors();
   platform::enterUtilitySchedulingClass();
   platform::tuneAllocator();
   OrvantaLogging::startLogging("orvantad", "Daemon");

@@ -1,7 +1,9 @@
 #include "platform/Process.h"
 
+#include <fcntl.h>
 #include <pthread.h>
 #include <sys/resource.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <csignal>
@@ -19,6 +21,13 @@ sigset_t terminationSignals() {
   return signals;
 }
 }  // namespace
+
+void secureStandardDescriptors() {
+  for (const int standard : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
+    // What is opened gets the lowest free number, which is this one, as those below it are open by now.
+    if (::fcntl(standard, F_GETFD) < 0 && errno == EBADF) ::open("/dev/null", O_RDWR);
+  }
+}
 
 void enterUtilitySchedulingClass() {
   constexpr int kUtilityNice = 5;

@@ -4,6 +4,9 @@ namespace platform {
 
 // The process's own set-up. All of it is for main's thread, before other threads exist.
 
+// Opens /dev/null in place of standard input, output or error where it is closed: a socket or file that got its number
+// would be printed to, or read as input. Before anything is opened.
+void secureStandardDescriptors();
 // Gives way to interactive work: a background service's scheduling, inherited by every later thread.
 void enterUtilitySchedulingClass();
 // SIGTERM and SIGINT no longer interrupt anything, SIGPIPE never ends the process; inherited by every later thread.

@@ -8,6 +8,7 @@
 #include <string>
 
 #include "platform/Json.h"
+#include "platform/Process.h"
 #include "tools/collector/Collector.h"
 
 // Runs a collector until SIGTERM or SIGINT. Prints one line of JSON when it listens.
@@ -50,6 +51,7 @@ void printReady(const collector::Collector& running) {
 }  // namespace
 
 int main(int argc, char** argv) {
+  platform::secureStandardDescriptors();
   collector::CollectorOptions options;
   options.directory = defaultDirectory();
   options.httpPort = 8480;

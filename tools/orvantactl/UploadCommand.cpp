@@ -26,7 +26,7 @@ struct UploadOptions : ClientOptions {
   std::vector<std::string> files;
 };
 
-// JSON is at most about twice as long as the frame that its values travel in.
+// The values travel in one frame; their JSON may be twice as long.
 constexpr std::size_t kMaximumLogBytes = 2 * kMaximumFrameBytes;
 
 // The daemon answers no more than no, so what can be seen from here is looked at; what is left is the daemon's side.

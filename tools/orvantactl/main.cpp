@@ -1,5 +1,7 @@
 #include <CLI/CLI.hpp>
 
+#include "platform/Process.h"
+#include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
 #include "tools/orvantactl/ExitStatus.h"
 
@@ -21,6 +23,7 @@ constexpr const char* kFooter =
 }  // namespace
 
 int main(int argc, char** argv) {
+  platform::secureStandardDescriptors();
   CLI::App app(kDescription, "orvantactl");
   app.footer(kFooter);
   app.require_subcommand(1);

@@ -6,6 +6,7 @@
 
 #include "platform/Digest.h"
 #include "platform/Json.h"
+#include "platform/Process.h"
 #include "platform/PropertyList.h"
 #include "tools/storebag/StorebagFile.h"
 
@@ -88,6 +89,7 @@ int show(const std::string& path, bool xml) {
 }  // namespace
 
 int main(int argc, char** argv) {
+  platform::secureStandardDescriptors();
   CLI::App app("Makes, checks and prints signed storebags", "orvanta-storebag");
   app.require_subcommand(1);
   std::string input;
