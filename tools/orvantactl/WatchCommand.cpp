@@ -34,23 +34,28 @@ class EndOfWatch {
   }
   bool usable() const { return _finished && _signals; }
 
-  void finish(int status) {
-    _status = status;
+  // Gives whether it was the first to end it; the status of later ones does not count.
+  bool finish(int status) {
+    int undecided = kUndecided;
+    if (!_status.compare_exchange_strong(undecided, status)) return false;
     const std::uint64_t one = 1;
     [[maybe_unused]] const auto written = ::write(_finished.get(), &one, sizeof one);
+    return true;
   }
   // The exit status: 0 after a signal.
   int wait() {
     pollfd waits[] = {{_finished.get(), POLLIN, 0}, {_signals.get(), POLLIN, 0}};
     while (::poll(waits, 2, -1) < 0 && errno == EINTR) {
     }
-    return _status;
+    int decided = kUndecided;
+    return _status.compare_exchange_strong(decided, kAllTaken) ? kAllTaken : decided;
   }
 
  private:
+  static constexpr int kUndecided = -1;
   platform::UniqueFd _finished;
   platform::UniqueFd _signals;
-  std::atomic<int> _status{kAllTaken};
+  std::atomic<int> _status{kUndecided};
 };
 
 int watch(const ClientOptions& options) {
@@ -80,7 +85,10 @@ int watch(const ClientOptions& options) {
                                                      *userInfo ? (*userInfo)->dictionary() : nullptr, nullptr, true);
   if (!set) return complain(set.error());
   printLine(watchingLine(options.hierarchyToken, options.level));
-  connection->setConnectionLostHandler([&end](const CallError& error) { end.finish(complain(error)); });
+  // The daemon closes the connection soon after the end notice, too.
+  connection->setConnectionLostHandler([&end](const CallError& error) {
+    if (end.finish(exitStatusFor(error))) complain(error);
+  });
   return end.wait();
 }
 
