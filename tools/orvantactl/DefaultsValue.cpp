@@ -6,6 +6,7 @@
 #include <string_view>
 #include <system_error>
 
+#include "platform/PropertyList.h"
 #include "tools/orvantactl/JsonValues.h"
 
 namespace orvanta::ctl {
@@ -22,9 +23,7 @@ bool parseWhole(std::string_view text, Number& out) {
   return result.ec == std::errc() && result.ptr == text.data() + text.size();
 }
 
-}  // namespace
-
-Result<Value> parseDefaultsValue(const std::string& text, const std::string& type) {
+Result<Value> valueOf(const std::string& text, const std::string& type) {
   if (type == "string") return Value(text);
   if (type == "int") {
     std::int64_t number = 0;
@@ -47,6 +46,17 @@ Result<Value> parseDefaultsValue(const std::string& text, const std::string& typ
     return parsed;
   }
   return Failure{"'" + type + "' is no type; there are string, int, float, bool and json"};
+}
+
+}  // namespace
+
+Result<Value> parseDefaultsValue(const std::string& text, const std::string& type) {
+  auto value = valueOf(text, type);
+  if (!value) return value;
+  // As it will be stored: null inside, say, has no form there.
+  const auto written = platform::writeXmlPropertyList(*value);
+  if (!written) return Failure{"the value cannot be stored: " + written.error()};
+  return value;
 }
 
 std::string showDefaultsValue(const Value& value) {
