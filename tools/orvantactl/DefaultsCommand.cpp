@@ -1,8 +1,12 @@
+#include <unistd.h>
+
+#include <cerrno>
 #include <cstdlib>
 #include <filesystem>
 #include <memory>
 #include <string>
 #include <string_view>
+#include <system_error>
 #include <utility>
 
 #include "interface/OrvantaConstants.h"
@@ -26,7 +30,15 @@ class ComplainingLog final : public platform::LogSink {
     platform::setLogLevel(platform::LogLevel::warning);
   }
   ~ComplainingLog() override { platform::installLogSink(nullptr); }
-  void write(platform::LogLevel /*level*/, std::string_view line) override { complain(std::string(line)); }
+  void write(platform::LogLevel level, std::string_view line) override {
+    _failed = _failed || level <= platform::LogLevel::error;
+    complain(std::string(line));
+  }
+  // Whether the file could not be read or makes no sense, so that what the store gave is not what lies there.
+  bool failed() const { return _failed; }
+
+ private:
+  bool _failed = false;
 };
 
 struct DefaultsOptions {
@@ -45,14 +57,29 @@ struct DefaultsOptions {
   platform::UserDefaults open() const { return {directory(), std::string(kOrvantaUserDefaultsDomain)}; }
 };
 
+// A store takes a missing directory for an empty one, or makes it; here it is a typing error, or the daemon has never
+// run.
+bool directoryIsThere(const DefaultsOptions& options) {
+  std::error_code error;
+  if (std::filesystem::is_directory(options.directory(), error)) return true;
+  const bool hidden = error && error != std::errc::no_such_file_or_directory;
+  complain(hidden ? "cannot look at " + options.directory() + ": " + error.message()
+                  : "There is no directory " + options.directory());
+  return false;
+}
+
 int read(const DefaultsOptions& options) {
+  const ComplainingLog log;
+  if (!directoryIsThere(options)) return kSomethingNotTaken;
   auto defaults = options.open();
+  const auto all = defaults.all();
+  if (log.failed()) return kSomethingNotTaken;
   if (options.key.empty()) {
-    printLine(writeTaggedJson(defaults.all(), true));
+    printLine(writeTaggedJson(all, true));
     return kAllTaken;
   }
-  const auto value = defaults.value(options.key);
-  if (!value) {
+  const auto* value = all.find(options.key);
+  if (value == nullptr) {
     complain("'" + options.key + "' is not set in " + defaults.path());
     return kSomethingNotTaken;
   }
@@ -61,31 +88,33 @@ int read(const DefaultsOptions& options) {
 }
 
 int store(const DefaultsOptions& options, platform::Value value) {
-  // A store makes its directory; here a missing one is a typing error, or the daemon has never run.
-  if (!std::filesystem::is_directory(options.directory())) {
-    complain("There is no directory " + options.directory());
-    return kSomethingNotTaken;
-  }
   auto defaults = options.open();
   const auto stored = defaults.set(options.key, std::move(value));
   if (stored) return kAllTaken;
-  complain(stored.error() + "; the file belongs to the daemon, so this usually takes its user or root");
+  const bool forbidden = ::access(options.directory().c_str(), R_OK | W_OK | X_OK) != 0 ||
+                         (::access(defaults.path().c_str(), R_OK) != 0 && errno != ENOENT);
+  complain(stored.error() +
+           (forbidden ? "; the file belongs to the daemon, so this usually takes its user or root" : ""));
   return kSomethingNotTaken;
 }
 
 int write(const DefaultsOptions& options) {
   auto value = parseDefaultsValue(options.text, options.type);
-  if (value) return store(options, std::move(*value));
-  complain(value.error());
-  return kUsage;
+  if (!value) {
+    complain(value.error());
+    return kUsage;
+  }
+  const ComplainingLog log;
+  return directoryIsThere(options) ? store(options, std::move(*value)) : kSomethingNotTaken;
 }
 
 int erase(const DefaultsOptions& options) {
-  if (!options.open().value(options.key)) {
-    complain("'" + options.key + "' is not set");
-    return kSomethingNotTaken;
-  }
-  return store(options, nullptr);
+  const ComplainingLog log;
+  if (!directoryIsThere(options)) return kSomethingNotTaken;
+  const bool isSet = options.open().value(options.key).has_value();
+  if (isSet) return store(options, nullptr);
+  if (!log.failed()) complain("'" + options.key + "' is not set");
+  return kSomethingNotTaken;
 }
 
 }  // namespace
@@ -107,10 +136,7 @@ void addDefaultsCommand(CLI::App& app, int& status) {
 
   auto& reading = *command.add_subcommand("read", "Shows one value, or all of them as JSON");
   reading.add_option("KEY", options->key, "The key to show; default: all");
-  reading.callback([options, &status] {
-    const ComplainingLog log;
-    status = read(*options);
-  });
+  reading.callback([options, &status] { status = read(*options); });
 
   auto& writing = *command.add_subcommand("write", "Sets a key");
   writing.add_option("KEY", options->key, "The key to set")->required();
@@ -118,17 +144,11 @@ void addDefaultsCommand(CLI::App& app, int& status) {
   writing.add_option("--type", options->type, "What VALUE is; default: string")
       ->check(CLI::IsMember({"string", "int", "float", "bool", "json"}))
       ->type_name("T");
-  writing.callback([options, &status] {
-    const ComplainingLog log;
-    status = write(*options);
-  });
+  writing.callback([options, &status] { status = write(*options); });
 
   auto& deleting = *command.add_subcommand("delete", "Removes a key");
   deleting.add_option("KEY", options->key, "The key to remove")->required();
-  deleting.callback([options, &status] {
-    const ComplainingLog log;
-    status = erase(*options);
-  });
+  deleting.callback([options, &status] { status = erase(*options); });
 }
 
 }  // namespace orvanta::ctl
