@@ -2,9 +2,11 @@
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
+#include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <string>
 
 #include "platform/Json.h"
@@ -24,12 +26,18 @@ std::string defaultDirectory() {
   return std::string(home != nullptr ? home : ".") + "/.local/state/orvanta-collector";
 }
 
-void printRequest(const collector::ReceivedRequest& request) {
-  fmt::print(stderr, "{:.3f} {} {} {} {} {} bytes{}\n", request.time, request.client, request.method, request.target,
-             request.status, request.rawBody.size(), request.note.empty() ? "" : " (" + request.note + ")");
+// Without exceptions: that standard error takes no more is no reason to stop receiving.
+void tell(const std::string& line) {
+  std::fputs((line + "\n").c_str(), stderr);
 }
 
-void printReady(const collector::Collector& running) {
+void printRequest(const collector::ReceivedRequest& request) {
+  tell(fmt::format("{:.3f} {} {} {} {} {} bytes{}", request.time, request.client, request.method, request.target,
+                   request.status, request.rawBody.size(), request.note.empty() ? "" : " (" + request.note + ")"));
+}
+
+// Whether standard output took it.
+bool printReady(const collector::Collector& running) {
   const platform::Dictionary ready{{"pid", static_cast<std::int64_t>(::getpid())},
                                    {"directory", running.directory()},
                                    {"http", running.httpURL()},
@@ -44,8 +52,7 @@ void printReady(const collector::Collector& running) {
                                    {"caFile", running.caFile()},
                                    {"publicKeyFile", running.publicKeyFile()},
                                    {"databaseFile", running.databaseFile()}};
-  fmt::print("{}\n", platform::writeJson(ready));
-  std::fflush(stdout);
+  return std::fputs((platform::writeJson(ready) + "\n").c_str(), stdout) >= 0 && std::fflush(stdout) == 0;
 }
 
 }  // namespace
@@ -90,10 +97,13 @@ int main(int argc, char** argv) {
 
   const auto running = collector::Collector::start(std::move(options));
   if (!running) {
-    fmt::print(stderr, "orvanta-collector: {}\n", running.error());
+    tell("orvanta-collector: " + running.error());
     return 1;
   }
-  printReady(**running);
+  if (!printReady(**running)) {
+    tell(fmt::format("orvanta-collector: cannot write to standard output: {}", std::strerror(errno)));
+    return 1;
+  }
   int signal = 0;
   ::sigwait(&signals, &signal);
   (*running)->stop();

@@ -2,13 +2,21 @@
 
 #include <fmt/format.h>
 
+#include <atomic>
+#include <cerrno>
 #include <cstdio>
+#include <cstring>
 #include <utility>
 
 #include "tools/orvantactl/ExitStatus.h"
 #include "tools/orvantactl/JsonValues.h"
 
 namespace orvanta::ctl {
+
+namespace {
+// The errno of the first line that was not taken. Lines come from the library's thread, too.
+std::atomic<int> gOutputError{0};
+}  // namespace
 
 void ClientOptions::addConnectionTo(CLI::App& command) {
   command
@@ -85,7 +93,9 @@ std::unique_ptr<OrvantaConnection> connectOrComplain(const ClientOptions& option
 }
 
 void complain(const std::string& text) {
-  fmt::print(stderr, "orvantactl: {}\n", text);
+  // Without exceptions: that nobody takes complaints is no reason to abort.
+  const auto line = fmt::format("orvantactl: {}\n", text);
+  std::fwrite(line.data(), 1, line.size(), stderr);
 }
 
 int complain(const CallError& error) {
@@ -96,7 +106,18 @@ int complain(const CallError& error) {
 bool printLine(const std::string& line) {
   std::fwrite(line.data(), 1, line.size(), stdout);
   std::fputc('\n', stdout);
-  return std::fflush(stdout) == 0 && std::ferror(stdout) == 0;
+  if (std::fflush(stdout) == 0 && std::ferror(stdout) == 0) return true;
+  int none = 0;
+  gOutputError.compare_exchange_strong(none, errno);
+  return false;
+}
+
+int statusAfterOutput(int status) {
+  // The stream remembers a failure, but not its reason.
+  if (std::fflush(stdout) == 0 && std::ferror(stdout) == 0) return status;
+  const int code = gOutputError != 0 ? gOutputError.load() : errno;
+  complain(fmt::format("standard output did not take everything: {}", std::strerror(code)));
+  return status == kAllTaken ? kOutputLost : status;
 }
 
 }  // namespace orvanta::ctl

@@ -43,7 +43,11 @@ std::unique_ptr<OrvantaConnection> connectOrComplain(const ClientOptions& option
 void complain(const std::string& text);
 // The same for a call that failed; gives the exit status that follows.
 int complain(const CallError& error);
-// One line on standard output, written at once. False when nobody reads it any more.
+// One line on standard output, written at once. False when standard output does not take it; main says so, by
+// statusAfterOutput(), so that callers need to look only where they would go on for nothing.
 bool printLine(const std::string& line);
+// The exit status after the last output. When some was lost, on whatever way it was written, says so, and does not let
+// that pass for success.
+int statusAfterOutput(int status);
 
 }  // namespace orvanta::ctl

@@ -33,7 +33,7 @@ void ProgressBar::update(std::uint64_t events, std::uint64_t bytes) {
   if (events < kManyEvents && now < kLongSeconds) return;
   _shownAt = now;
   _shown = true;
-  fmt::print(stderr, "\r\x1b[K{}", renderProgress({events, bytes, _totalBytes, now}));
+  std::fputs(("\r\x1b[K" + renderProgress({events, bytes, _totalBytes, now})).c_str(), stderr);
   std::fflush(stderr);
 }
 

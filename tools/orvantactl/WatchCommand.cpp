@@ -84,7 +84,7 @@ int watch(const ClientOptions& options) {
   const auto set = session.blocking().setSessionInfo(options.sessionInfo().dictionary(),
                                                      *userInfo ? (*userInfo)->dictionary() : nullptr, nullptr, true);
   if (!set) return complain(set.error());
-  printLine(watchingLine(options.hierarchyToken, options.level));
+  if (!printLine(watchingLine(options.hierarchyToken, options.level))) return kAllTaken;  // main says what was lost
   // The daemon closes the connection soon after the end notice, too.
   connection->setConnectionLostHandler([&end](const CallError& error) {
     if (end.finish(exitStatusFor(error))) complain(error);

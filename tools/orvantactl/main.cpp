@@ -18,7 +18,8 @@ constexpr const char* kFooter =
     "  orvantactl COMMAND --help\n"
     "\n"
     "Exit status: 0 the daemon took everything, 1 something was not taken or there is no answer to show,\n"
-    "2 the command line makes no sense, 3 no daemon is there or it turned this user away.";
+    "2 the command line makes no sense, 3 no daemon is there or it turned this user away, 4 the daemon took\n"
+    "everything, but standard output did not take all answers.";
 
 }  // namespace
 
@@ -39,8 +40,7 @@ int main(int argc, char** argv) {
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& error) {
-    const int code = app.exit(error);
-    return code == 0 ? orvanta::ctl::kAllTaken : orvanta::ctl::kUsage;
+    status = app.exit(error) == 0 ? orvanta::ctl::kAllTaken : orvanta::ctl::kUsage;
   }
-  return status;
+  return orvanta::ctl::statusAfterOutput(status);
 }

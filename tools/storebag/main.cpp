@@ -1,7 +1,9 @@
 #include <fmt/format.h>
 
 #include <CLI/CLI.hpp>
+#include <cerrno>
 #include <cstdio>
+#include <cstring>
 #include <string>
 
 #include "platform/Digest.h"
@@ -17,17 +19,23 @@ namespace {
 using namespace orvanta;
 
 int fail(const std::string& text) {
-  fmt::print(stderr, "orvanta-storebag: {}\n", text);
+  std::fputs(fmt::format("orvanta-storebag: {}\n", text).c_str(), stderr);
   return 1;
 }
 
-bool printBytes(const std::string& path, const std::vector<std::uint8_t>& bytes) {
-  if (path != "-") {
-    const auto failure = writeFile(path, bytes);
-    if (failure) fail(failure->text);
-    return !failure;
-  }
-  return std::fwrite(bytes.data(), 1, bytes.size(), stdout) == bytes.size() && std::fflush(stdout) == 0;
+// The exit status.
+int print(const void* bytes, std::size_t size) {
+  if (std::fwrite(bytes, 1, size, stdout) == size && std::fflush(stdout) == 0) return 0;
+  return fail(fmt::format("cannot write to standard output: {}", std::strerror(errno)));
+}
+int print(const std::string& text) {
+  return print(text.data(), text.size());
+}
+
+int printBytes(const std::string& path, const std::vector<std::uint8_t>& bytes) {
+  if (path == "-") return print(bytes.data(), bytes.size());
+  const auto failure = writeFile(path, bytes);
+  return failure ? fail(failure->text) : 0;
 }
 
 int makeKey(const std::string& keyPath, const std::string& publicPath, const std::string& layout) {
@@ -35,7 +43,7 @@ int makeKey(const std::string& keyPath, const std::string& publicPath, const std
   if (!key) return fail(key.error());
   const auto der =
       (*key)->publicKeyDer(layout == "pkcs1" ? PublicKeyLayout::pkcs1 : PublicKeyLayout::subjectPublicKeyInfo);
-  return printBytes(publicPath, der) ? 0 : 1;
+  return printBytes(publicPath, der);
 }
 
 int sign(const std::string& input, const std::string& keyPath, const std::string& output, const std::string& container,
@@ -47,7 +55,7 @@ int sign(const std::string& input, const std::string& keyPath, const std::string
   const auto document =
       makeStorebag(*bag, **key, *propertyListFormFromText(container), *propertyListFormFromText(bagForm));
   if (!document) return fail(fmt::format("{}: {}", input, document.error()));
-  return printBytes(output, *document) ? 0 : 1;
+  return printBytes(output, *document);
 }
 
 platform::Result<StorebagContent> openFile(const std::string& path) {
@@ -69,21 +77,16 @@ int verify(const std::string& path, const std::string& publicPath) {
     return fail(path + ": the signature is not that key's over this bag");
   }
   const platform::Value* version = content->inner.dictionary() ? content->inner.dictionary()->find("version") : nullptr;
-  fmt::print("{}: good signature, version {}\n", path, version ? version->description() : "(none)");
-  return 0;
+  return print(fmt::format("{}: good signature, version {}\n", path, version ? version->description() : "(none)"));
 }
 
 int show(const std::string& path, bool xml) {
   const auto content = openFile(path);
   if (!content) return fail(content.error());
-  if (!xml) {
-    fmt::print("{}\n", platform::writeJson(content->inner, true));
-    return 0;
-  }
+  if (!xml) return print(platform::writeJson(content->inner, true) + "\n");
   const auto text = platform::writeXmlPropertyList(content->inner);
   if (!text) return fail(fmt::format("{}: {}", path, text.error()));
-  fmt::print("{}", *text);
-  return 0;
+  return print(*text);
 }
 
 }  // namespace
