@@ -19,6 +19,7 @@ using platform::Value;
 namespace {
 
 constexpr std::int64_t kHighestMaxAge = 1'000'000'000;
+constexpr const char* kMaxAgeOfBag = "refresh_cycle";
 
 PropertyListForm readForm(SettingsReader& reader, const char* key, PropertyListForm otherwise, bool& wrong) {
   const auto text = reader.text(key);
@@ -36,9 +37,10 @@ Result<StorebagSettings> parseStorebagSettings(const Value& value) {
   settings.bag = readForm(reader, "bag", settings.bag, wrongForm);
   settings.lastModified = reader.boolean("lastModified").value_or(settings.lastModified);
   const Value* maxAge = reader.take("maxAge");
+  settings.maxAgeOfBag = maxAge == nullptr || *maxAge == kMaxAgeOfBag;
   if (maxAge != nullptr && maxAge->isNull()) {
     settings.maxAge = std::nullopt;
-  } else if (maxAge != nullptr) {
+  } else if (!settings.maxAgeOfBag) {
     settings.maxAge = reader.integer("maxAge", -kHighestMaxAge, kHighestMaxAge);
   }
   if (auto failure = reader.finish()) return std::move(*failure);
@@ -50,7 +52,9 @@ Dictionary describe(const StorebagSettings& settings) {
   return Dictionary{{"container", std::string(propertyListFormText(settings.container))},
                     {"bag", std::string(propertyListFormText(settings.bag))},
                     {"lastModified", settings.lastModified},
-                    {"maxAge", settings.maxAge ? Value(*settings.maxAge) : Value()}};
+                    {"maxAge", settings.maxAgeOfBag ? Value(kMaxAgeOfBag)
+                               : settings.maxAge    ? Value(*settings.maxAge)
+                                                    : Value()}};
 }
 
 void answerState(Response& response, const ApiContext& context) {

@@ -23,6 +23,7 @@ namespace {
 
 constexpr std::array<const char*, 2> kExtensions{".json", ".plist"};
 constexpr std::int64_t kNanoseconds = 1'000'000'000;
+constexpr std::int64_t kLongestRefreshCycle = 86'400;  // more does not count for daemons
 
 std::optional<std::int64_t> modifiedNanoseconds(const std::string& path) {
   struct stat status {};
@@ -44,6 +45,12 @@ void replaceAll(std::string& text, std::string_view what, std::string_view with)
 
 HttpAnswer failure(int status, const std::string& reason) {
   return {status, {}, "text/plain", reason + "\n"};
+}
+
+std::optional<std::int64_t> maxAgeFor(const Value& bag, const StorebagSettings& settings) {
+  const Value* cycle =
+      settings.maxAgeOfBag && bag.dictionary() != nullptr ? bag.dictionary()->find("refresh_cycle") : nullptr;
+  return cycle != nullptr ? std::min(cycle->integerValue(), kLongestRefreshCycle) : settings.maxAge;
 }
 
 }  // namespace
@@ -162,8 +169,13 @@ HttpAnswer StorebagServer::answer(const std::string& name, const std::string* if
   if (!source) return failure(404, source.error());
   const StorebagSettings current = settings();
 
+  const auto inner = source->held ? Result<Value>(std::move(*source->held)) : readBagSource(source->identity);
+  if (!inner) return failure(500, inner.error());
+
   HttpAnswer answer;
-  if (current.maxAge) answer.headers.emplace_back("Cache-Control", fmt::format("max-age={}", *current.maxAge));
+  if (const auto maxAge = maxAgeFor(*inner, current)) {
+    answer.headers.emplace_back("Cache-Control", fmt::format("max-age={}", *maxAge));
+  }
   if (current.lastModified) {
     const std::int64_t stamp = stampFor(source->identity, source->modifiedNanoseconds);
     answer.headers.emplace_back("Last-Modified", httpDate(stamp));
@@ -173,10 +185,7 @@ HttpAnswer StorebagServer::answer(const std::string& name, const std::string* if
       return answer;
     }
   }
-  auto inner = source->held ? Result<Value>(std::move(*source->held)) : readBagSource(source->identity);
-  if (!inner) return failure(500, inner.error());
-  const auto document =
-      makeStorebag(fillPlaceholders(inner.value(), _placeholders), *_key, current.container, current.bag);
+  const auto document = makeStorebag(fillPlaceholders(*inner, _placeholders), *_key, current.container, current.bag);
   if (!document) return failure(500, fmt::format("{}: {}", source->identity, document.error()));
   answer.contentType = current.container == PropertyListForm::xml ? "application/xml" : "application/octet-stream";
   answer.body.assign(document->begin(), document->end());

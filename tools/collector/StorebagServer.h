@@ -16,8 +16,12 @@ namespace orvanta::collector {
 struct StorebagSettings {
   PropertyListForm container = PropertyListForm::xml;
   PropertyListForm bag = PropertyListForm::xml;
-  std::optional<std::int64_t> maxAge = 3600;  // seconds, in Cache-Control; none: no such header
-  bool lastModified = true;                   // whether answers carry Last-Modified
+  // Seconds, in Cache-Control; none: no such header. With `maxAgeOfBag` it is the bag's refresh_cycle that goes there,
+  // and this only for a bag that has none: daemons take refresh_cycle from a bag that arrives, but after an answer that
+  // nothing has changed they go by the header, and an edit should reach them as soon then.
+  std::optional<std::int64_t> maxAge = 3600;
+  bool maxAgeOfBag = true;
+  bool lastModified = true;  // whether answers carry Last-Modified
 };
 
 // What "${http}" and the like in a bag's texts stand for.

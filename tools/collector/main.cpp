@@ -7,6 +7,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <optional>
 #include <string>
 
 #include "platform/Json.h"
@@ -68,7 +69,7 @@ int main(int argc, char** argv) {
   bool quiet = false;
   std::string container = "xml";
   std::string bag = "xml";
-  std::int64_t maxAge = options.storebag.maxAge.value_or(0);
+  std::optional<std::int64_t> maxAge;
 
   CLI::App app("Plays the servers that an orvanta daemon talks to, and records what comes in", "orvanta-collector");
   app.add_option("-d,--directory", options.directory, "keys, certificates, bags, database")->capture_default_str();
@@ -77,13 +78,14 @@ int main(int argc, char** argv) {
   app.add_option("--https-port", options.httpsPort, "0: any free one")->capture_default_str();
   app.add_option("--dashboard-port", options.dashboardPort, "UDP; 0: any free one")->capture_default_str();
   app.add_flag("--any-ports", anyPorts, "take free ports for all three");
-  app.add_option("--max-age", maxAge, "seconds for which daemons keep a storebag")->capture_default_str();
+  app.add_option("--max-age", maxAge, "seconds for which daemons keep a storebag; default: its refresh_cycle");
   app.add_option("--container", container, "form of the signed document")->check(CLI::IsMember({"xml", "binary"}));
   app.add_option("--bag", bag, "form of the bag inside")->check(CLI::IsMember({"xml", "binary"}));
   app.add_flag("-q,--quiet", quiet, "no line per request on standard error");
   CLI11_PARSE(app, argc, argv);
   if (anyPorts) options.httpPort = options.httpsPort = options.dashboardPort = 0;
-  options.storebag.maxAge = maxAge;
+  options.storebag.maxAgeOfBag = !maxAge;
+  if (maxAge) options.storebag.maxAge = maxAge;
   options.storebag.container = *propertyListFormFromText(container);
   options.storebag.bag = *propertyListFormFromText(bag);
   if (!quiet) options.observer = printRequest;
