@@ -39,7 +39,9 @@ constexpr const char* kFooter =
     "  {\"event\":LINE,\"reply\":…}             for each event in order, by its line; null: nothing to tell\n"
     "  {\"event\":LINE,\"error\":\"…\"}           the event was not taken\n"
     "  {\"finish\":…}                         the answer to finishing the session\n"
-    "  {\"flush\":{\"result\":…,\"error\":…}}     what was sent at last; \"Nothing to flush\" is no failure";
+    "  {\"flush\":{\"result\":…,\"error\":…}}     what was sent at last; \"Nothing to flush\" is no failure\n"
+    "\n"
+    "Whether the device has an internal build is no option: \"ReleaseType\" in the daemon's device.plist says so.";
 
 struct SessionOptions : ClientOptions {
   std::string file;
