@@ -93,6 +93,7 @@ TEST_F(RelatedSessionsTest, WatchPrintsTheEventsOfItsHierarchyAsJSONLines) {
   child.reset();
   ASSERT_TRUE(daemon->logged("dealloc: OrvantadSession dealloc: 2"));
   EXPECT_EQ(daemon->terminate(), 0);
+  EXPECT_EQ(watcher.wait(), 0) << "the end notice decides, not the closing of the connection after it";
   const std::string output = watcher.output();
   EXPECT_NE(output.find("\"marker\":1"), std::string::npos) << output << watcher.allLines();
 }

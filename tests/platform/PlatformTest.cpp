@@ -1,12 +1,15 @@
 #include "platform/Platform.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include <cstdlib>
 #include <future>
 #include <string>
 #include <vector>
 
+#include "platform/Process.h"
 #include "tests/support/TestPlatform.h"
 
 namespace platform {
@@ -62,6 +65,16 @@ TEST(Platform, makesEachOnceValueOnceWhateverThreadAsks) {
   EXPECT_EQ(made, 1);
   orvanta::test::TestPlatform another;
   EXPECT_EQ(another.get().once<Inner>([] { return Inner{5}; }).value, 5);
+}
+
+TEST(Process, nothingGetsTheNumberOfAClosedStandardDescriptor) {
+  const auto numberAfterSecuring = [] {
+    for (const int standard : {0, 1, 2}) ::close(standard);
+    secureStandardDescriptors();
+    char byte = 0;
+    return ::read(0, &byte, 1) == 0 && ::write(1, "x", 1) == 1 ? ::open("/", O_RDONLY) : -1;
+  };
+  EXPECT_EXIT(::_exit(numberAfterSecuring() > 2 ? 0 : 1), testing::ExitedWithCode(0), "");
 }
 
 using Ends = std::vector<std::string>;
