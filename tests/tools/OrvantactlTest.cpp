@@ -152,7 +152,7 @@ TEST(DefaultsValue, isReadAsItsType) {
   }
   const char* refused[][2] = {{"", "int"},      {"5x", "int"},    {"5.0", "int"},    {"99999999999999999999", "int"},
                               {"inf", "float"}, {"", "float"},    {"maybe", "bool"}, {"", "bool"},
-                              {"{", "json"},    {"null", "json"}, {"5", "number"}};
+                              {"{", "json"},    {"null", "json"}, {"5", "number"},   {"{\"a\":[1,null]}", "json"}};
   for (const auto& row : refused) EXPECT_FALSE(parseDefaultsValue(row[0], row[1])) << row[0] << " " << row[1];
   EXPECT_EQ(showDefaultsValue("plain text"), "plain text");
   EXPECT_EQ(showDefaultsValue(Array{1, true}), "[1,true]");

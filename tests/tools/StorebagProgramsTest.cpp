@@ -9,7 +9,7 @@
 #include "tests/support/TemporaryDirectory.h"
 #include "tools/storebag/StorebagFile.h"
 
-// The programs orvanta-storebag and orvanta-collector, as a user starts them.
+// The programs orvanta-storebag, orvanta-collector and orvantactl, as a user starts them.
 
 namespace orvanta {
 namespace {
@@ -27,7 +27,7 @@ struct Outcome {
 
 Outcome run(const std::string& program, std::vector<std::string> arguments) {
   ChildProcess::Options options;
-  options.program = DaemonProcess::programPath(program);
+  options.program = program.starts_with('/') ? program : DaemonProcess::programPath(program);
   options.arguments = std::move(arguments);
   options.keepOutput = true;
   ChildProcess process(std::move(options));
@@ -80,6 +80,33 @@ TEST(StorebagProgramTest, SaysWhatIsWrong) {
   }
   EXPECT_NE(run("orvanta-storebag", {"sign", good, "-k", key, "--container", "json"}).status, 0);
   EXPECT_NE(run("orvanta-storebag", {}).status, 0);
+}
+
+TEST(OrvantactlProgramTest, TellsByItsStatusWhatWentWrong) {
+  const TemporaryDirectory directory;
+  std::filesystem::create_directories(directory / "unreadable/com.kovalt.orvanta.plist");
+  std::filesystem::create_directory(directory / "empty");
+  const struct {
+    const char* command;  // behind the program's name; $1 is the directory
+    int status;
+    const char* errors;
+  } rows[] = {
+      {"upload-log --client-type 5 $1", 2, "Is a directory"},
+      {"session --client-type 5 --file $1", 2, "Is a directory"},
+      {"defaults --state-dir $1/none read", 1, "no directory"},
+      {"defaults --state-dir $1/unreadable read", 1, "not a regular file"},
+      {"defaults --state-dir $1/unreadable delete key", 1, "not a regular file"},
+      {"defaults --state-dir $1/empty read", 0, ""},
+      {"defaults --state-dir $1/empty read >/dev/full", 4, "No space left"},
+      {"--help >/dev/full", 4, "No space left"},
+      {"defaults --state-dir $1/none read 2>/dev/full", 1, ""},
+  };
+  for (const auto& row : rows) {
+    const auto outcome = run("/bin/sh", {"-c", std::string("\"$0\" ") + row.command,
+                                         DaemonProcess::programPath("orvantactl"), directory / ""});
+    EXPECT_EQ(outcome.status, row.status) << row.command << ": " << outcome.errors;
+    EXPECT_THAT(outcome.errors, HasSubstr(row.errors)) << row.command;
+  }
 }
 
 TEST(StorebagFileTest, RefusesDamagedDocuments) {

@@ -35,7 +35,7 @@ class StorebagServerTest : public CollectorFixture {
 TEST_F(StorebagServerTest, SignsTheDefaultBagWithItsPlacesFilledIn) {
   const auto answer = get("quillon");
   ASSERT_EQ(answer->status, 200);
-  EXPECT_EQ(answer->get_header_value("Cache-Control"), "max-age=3600");
+  EXPECT_EQ(answer->get_header_value("Cache-Control"), "max-age=60") << "the bag's refresh_cycle";
   const Value inner = verified(answer->body, collector->publicKeyFile());
   for (const char* environment : {"development", "kovalt_internal", "seed", "release"}) {
     const Value& clients = at(at(at(inner, environment), "http_post"), "clients");
@@ -57,6 +57,7 @@ TEST_F(StorebagServerTest, AnswersNotModifiedByTheFilesTime) {
   const auto unchanged = since("Tue, 14 Nov 2023 22:13:20 GMT");
   EXPECT_EQ(unchanged->status, 304);
   EXPECT_EQ(unchanged->body, "");
+  EXPECT_EQ(unchanged->get_header_value("Cache-Control"), "max-age=60") << "what daemons then go by";
   EXPECT_EQ(since("Tue, 14 Nov 2023 22:13:19 GMT")->status, 200);
   EXPECT_EQ(since("yesterday")->status, 200);
   // Changed twice within the second that HTTP can tell apart.
@@ -74,6 +75,7 @@ TEST_F(StorebagServerTest, PrefersTheBagsOwnFile) {
   };
   directory.write("brindle.json", R"({"version":"json"})");
   EXPECT_EQ(version("brindle"), "json");
+  EXPECT_EQ(get("brindle")->get_header_value("Cache-Control"), "max-age=3600");
   collector->setBag(Dictionary{{"version", "held for all"}});
   EXPECT_EQ(version("halvora"), "held for all");
   ASSERT_EQ(http().Put("/control/bag?name=brindle", R"({"version":"put"})", "application/json")->status, 204);
