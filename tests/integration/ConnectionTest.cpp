@@ -139,17 +139,15 @@ TEST_F(ConnectionTest, SIGTERMEndsAFetchAndLeavesNoRequestThatWasReadWithoutAnAn
   ASSERT_TRUE(daemon->logged("fetchAndCacheStorebag: Fetching storebag"));
   EXPECT_EQ(daemon->terminate(), 0);
   EXPECT_EQ(daemon->count("sendSynchronousRequest error Aborted: the process is ending"), 1U) << "not after 15 s";
-  std::uint32_t refused = 0;
+  // Usually the end comes before the second turn, whose calls are then refused.
   for (std::uint32_t id = 0; id < kCalls; ++id) {
     const auto answer = client.answer();
     ASSERT_TRUE(answer) << id;
     EXPECT_EQ(answer->messageID, id);
     if (const std::string* error = answer->error.string()) {
       EXPECT_EQ(*error, "fetchDisplayURL: the daemon is ending");
-      ++refused;
     }
   }
-  EXPECT_GT(refused, 0U);
   EXPECT_FALSE(client.answer());
 }
 
