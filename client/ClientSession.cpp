@@ -4,7 +4,7 @@
 
 #include "client/CallChannel.h"
 #include "client/CallMessage.h"
-#include "client/FileURL.h"
+#include "interface/FileURL.h"
 
 namespace orvanta {
 

@@ -1,7 +1,7 @@
 #include <fmt/format.h>
 
 #include "interface/OrvantaLogging.h"
-#include "session/FileURL.h"
+#include "interface/FileURL.h"
 #include "session/OrvantadSession.h"
 #include "util/MessageLog.h"
 
@@ -14,7 +14,7 @@ void OrvantadSession::uploadFileAtPath(std::string fileURL, std::optional<std::s
   const platform::BlockingScope blocking;  // a descriptor may take long to be looked at, and even to be closed
   ORVANTA_LOG(debug, "uploadFileAtPath: Uploading file for session {}", _sessionID);
   OrvantaBackend::UploadFile file;
-  file.path = pathOfFileURL(fileURL).value_or(fileURL);
+  file.path = pathForFileURL(fileURL).value_or(fileURL);
   file.extensionToken = std::move(extensionToken);
   // The descriptor that came with the token: the only way to the file's content. Closed when this call ends.
   platform::UniqueFd descriptor;

@@ -6,6 +6,7 @@
 #include <array>
 #include <cstdlib>
 
+#include "backends/BriskBackend.h"
 #include "backends/HTTPSPostBackend.h"
 #include "tests/backends/HTTPSFixture.h"
 
@@ -80,6 +81,9 @@ TEST_F(OrvantaBackendTest, EachBackendDrawsOnceFromTheGenerator) {
     EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", nullptr, "Parva"), nullptr);
     EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", shared({{"clients", "Mail"}}), "Parva"), nullptr);
     EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", shared(profileOf({})), ""), nullptr);
+    // This one is constructed before it is refused.
+    ::erand48(state.data());
+    EXPECT_EQ(BriskBackend::create(platform, "brisk", nullptr, "Parva", 6), nullptr);
     const double expected = ::erand48(state.data());
     const auto backend = HTTPSPostBackend::create(platform, "http_post", shared(profileOf({})), "Parva");
     EXPECT_EQ(backend->samplingFactor(), expected);

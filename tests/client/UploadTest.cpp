@@ -6,8 +6,8 @@
 #include <filesystem>
 #include <vector>
 
-#include "client/FileURL.h"
 #include "client/UploadTokens.h"
+#include "interface/FileURL.h"
 #include "tests/client/ClientFixture.h"
 
 namespace orvanta::test {
@@ -157,7 +157,7 @@ TEST(FileURLs, readBackAsThePathsTheyCameFrom) {
     EXPECT_EQ(pathForFileURL(fileURLForPath(path)), path);
   }
   EXPECT_EQ(fileURLForPath("/a b/c-d_e.f~"), "file:///a%20b/c-d_e.f~");
-  EXPECT_EQ(pathForFileURL("file://localhost/x"), "/x");
+  EXPECT_EQ(pathForFileURL("file://localhost/x%c3%A4"), "/x\xc3\xa4");
 }
 
 TEST(FileURLs, ofOtherKindsAreRefused) {

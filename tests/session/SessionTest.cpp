@@ -3,7 +3,6 @@
 #include <filesystem>
 #include <fstream>
 
-#include "session/FileURL.h"
 #include "tests/support/SessionFixture.h"
 
 namespace orvanta::test {
@@ -20,7 +19,11 @@ class SessionSetupTest : public SessionFixture {
 
 TEST_F(SessionSetupTest, WithoutAStorebagThereIsNothingToReportTo) {
   const auto session = makeSession();
+  storebag = shared({{"voltmark", Dictionary{}}});
   configure(*session, 7);
+  EXPECT_EQ(start(*session), std::vector<std::string>{"voltmark"});
+  storebag = nullptr;
+  configure(*session, 7, {{"clientType", 6}});
   EXPECT_EQ(start(*session), std::nullopt);
   EXPECT_EQ(session->backends(), nullptr);
   EXPECT_EQ(send(*session, {{"category", 1}, {"type", 1}}), std::nullopt);
@@ -41,6 +44,7 @@ TEST_F(SessionSetupTest, OnlyReportingBackendsAreNamed) {
   const auto other = makeSession();
   configure(*other, 7, {{"requireUserInfo", true}});
   EXPECT_EQ(start(*other), std::vector<std::string>{"voltmark"}) << "http_post waits for user info";
+  EXPECT_TRUE(log.contains("<3>OrvantaBackend(newBackendWithName): http_post2"));
   EXPECT_EQ(displayURL(*other), "http://show");
 }
 
@@ -100,18 +104,6 @@ TEST_F(SessionSetupTest, ATeardownWithoutBackendsSendsNothingAndEndsOnce) {
   for (int i = 0; i < 2; ++i) leave(session);
   EXPECT_EQ(log.count("<7>dealloc: OrvantadSession dealloc: 3"), 1U);
   EXPECT_TRUE(device.http.requests().empty());
-}
-
-TEST(FileURLTest, OnlyWholeLocalFileURLsHaveAPath) {
-  const std::pair<const char*, const char*> rows[] = {{"file:///tmp/a", "/tmp/a"},
-                                                      {"file:///tmp/a%20b%25%c3%A4", "/tmp/a b%\xc3\xa4"},
-                                                      {"file://localhost/tmp/a", "/tmp/a"},
-                                                      {"file:///", "/"}};
-  for (const auto& [url, path] : rows) EXPECT_EQ(pathOfFileURL(url), path) << url;
-  for (const char* url : {"file://", "file://host/tmp/a", "file:/tmp/a", "/tmp/a", "http:///tmp/a", "file:///tmp/%",
-                          "file:///tmp/%2", "file:///tmp/%zz", "file:///tmp/%00", ""}) {
-    EXPECT_EQ(pathOfFileURL(url), std::nullopt) << url;
-  }
 }
 
 // Events through a session whose power-log backend shows what reached the backends.

@@ -1,4 +1,4 @@
-#include "client/FileURL.h"
+#include "interface/FileURL.h"
 
 namespace orvanta {
 
