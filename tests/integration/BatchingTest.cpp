@@ -102,6 +102,14 @@ TEST_F(BatchingTest, FlushesThatCannotSendSayWhy) {
   EXPECT_EQ(flush(*anonymous).error,
             makeOrvantaError("Nothing to flush: batched events were completely filtered out", -1));
   EXPECT_EQ(flush(*anonymous).error, makeOrvantaError("Nothing to flush", -1)) << "the batch is gone";
+  // Its parent reports and lets it report, too, but it has no user info of its own.
+  SessionInfo related = batching();
+  related.hierarchyToken = HierarchyToken{"call", 1};
+  auto child = openSession(related);
+  related.hierarchyToken = HierarchyToken{"call", 0};
+  auto parent = openSession(related, user());
+  send(*child, event(5, 1));
+  EXPECT_EQ(flush(*child).error, makeOrvantaError("Can not flush: userInfo is required", -1));
 }
 
 TEST_F(BatchingTest, AServerErrorAnswersTheFlushAndDisables) {
@@ -126,9 +134,12 @@ TEST_F(BatchingTest, AFilteredFieldIsInNoBodyOnAnyPath) {
   setSection({{"http_post",
                httpPost(clientSection({{"event_threshold", 3},
                                        {"filters", Array{Dictionary{{"key", "PassPhrase"}, {"action", "remove"}},
+                                                         Dictionary{{"key", "clientName"}, {"action", "remove"}},
                                                          Dictionary{{"key", "account"}, {"action", "sha256"}}}}}))}});
   startDaemon();
   UserInfo info = user();
+  const std::string client = "Name of the client";
+  info.clientName = client;
   info.others = {{"passphrase", secret}, {"Account", hashedOnly}};
   const Dictionary payload{{"passPhrase", secret}, {"account", hashedOnly}, {"fine", "visible"}};
   auto batchingSession = openSession(batching(), info);
@@ -146,20 +157,24 @@ TEST_F(BatchingTest, AFilteredFieldIsInNoBodyOnAnyPath) {
   EXPECT_EQ(daemon->terminate(), 0);
   EXPECT_EQ(server->requests(RequestKind::storebag).size(), 1U) << "sessions of one client type share it";
   const std::string digest = OrvantaBackend::convertIntoSHA256(hashedOnly);
-  std::size_t visible = 0, hashed = 0;
+  std::size_t visible = 0, hashed = 0, named = 0;
   for (const auto& request : server->requests()) {
     for (const std::string* body : {&request.rawBody, &request.body, &request.target}) {
       EXPECT_EQ(body->find(secret), std::string::npos);
       EXPECT_EQ(body->find(hashedOnly), std::string::npos);
+      EXPECT_EQ(body->find(client), std::string::npos);
       EXPECT_EQ(body->find(OrvantaBackend::convertIntoSHA256(digest)), std::string::npos)
           << "a filter never hashes twice";
     }
     for (const auto& [name, value] : request.headers) EXPECT_EQ(value.find(secret), std::string::npos) << name;
+    const std::string* name = request.header("X-ORV-Client-Name");
+    if (name != nullptr && *name == client) ++named;
     if (request.body.find("visible") != std::string::npos) ++visible;
     if (request.body.find(digest) != std::string::npos) ++hashed;
   }
   EXPECT_GE(visible, 4U);
   EXPECT_GE(hashed, visible);
+  EXPECT_GE(named, visible) << "filters do not reach the headers";
 }
 
 TEST_F(BatchingTest, TenThousandEventsArriveOnceAndInOrderAndLeaveNoMemoryBehind) {

@@ -59,7 +59,9 @@ TEST_F(LifecycleTest, SIGTERMWaitsFiveSecondsForASilentEventServer) {
   send(*session, event(9, 9));
   const auto begin = std::chrono::steady_clock::now();
   EXPECT_EQ(daemon->terminate(), 0);
-  EXPECT_GE(std::chrono::steady_clock::now() - begin, std::chrono::seconds(5));
+  const auto took = std::chrono::steady_clock::now() - begin;
+  EXPECT_GE(took, std::chrono::seconds(5));
+  EXPECT_LT(took, std::chrono::seconds(20)) << "a server may be silent for 60 s at other times";
   EXPECT_TRUE(daemon->logged("post error: Aborted: the HTTP client is shutting down", 2)) << "the event and the end";
 }
 
