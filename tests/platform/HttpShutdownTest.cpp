@@ -3,10 +3,10 @@
 
 #include <atomic>
 #include <cstring>
-#include <thread>
 
 #include "tests/platform/HttpFixture.h"
 #include "tests/platform/Waiting.h"
+#include "tests/support/Threads.h"
 
 // A resolver that hangs on one name until it is let go; libcurl's look-ups come through here.
 namespace {
@@ -102,29 +102,22 @@ TEST_F(HttpShutdownTest, EveryRequestEndsExactlyOnce) {
   RawServer server(answering("200 OK"));
   for (int round = 0; round < 10; ++round) {
     makeClient();
-    std::atomic<int> started{0};
-    std::atomic<int> observed{0};
-    std::atomic<int> completed{0};
-    std::vector<std::thread> threads;
-    for (int i = 0; i < 4; ++i) {
-      threads.emplace_back([&, i] {
-        const auto lane = client().makeLane();
-        for (int n = 0; n < 20; ++n) {
-          if (i == 0) {
-            client().perform(lane, get(server.url()));
-            continue;
-          }
-          ++started;
-          client().start(
-              lane, post(server.url()), [&](const HttpResult&) { return ++observed > 0; },
-              [&](HttpResult) { ++completed; });
+    std::atomic<int> started{0}, observed{0}, completed{0};
+    orvanta::test::inThreads(7, [&](int thread) {
+      if (thread == 4) return client().abortBlockingRequests();
+      if (thread > 4) return client().shutdown(milliseconds(round * (thread - 4)));
+      const auto lane = client().makeLane();
+      for (int n = 0; n < 20; ++n) {
+        if (thread == 0) {
+          client().perform(lane, get(server.url()));
+          continue;
         }
-      });
-    }
-    threads.emplace_back([&] { client().abortBlockingRequests(); });
-    threads.emplace_back([&] { client().shutdown(milliseconds(round)); });
-    client().shutdown(milliseconds(round * 2));
-    for (auto& thread : threads) thread.join();
+        ++started;
+        client().start(
+            lane, post(server.url()), [&](const HttpResult&) { return ++observed > 0; },
+            [&](HttpResult) { ++completed; });
+      }
+    });
     EXPECT_EQ(observed, started);
     ASSERT_TRUE(_pool.drain(seconds(30)));
     EXPECT_EQ(completed, started);

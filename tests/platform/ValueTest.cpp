@@ -76,24 +76,5 @@ TEST(Value, Descriptions) {
   }
 }
 
-TEST(Dictionary, KeepsKeysSortedAndUnique) {
-  Dictionary d{{"b", 1}, {"c", 2}, {"a", 3}, {"b", 4}};
-  d.set("aa", 5);
-  d.set("c", 6);
-  EXPECT_TRUE(d.erase("a"));
-  EXPECT_FALSE(d.erase("a"));
-  EXPECT_EQ(Value(d).description(), "{aa = 5, b = 4, c = 6}");
-  ASSERT_NE(d.find("b"), nullptr);
-  EXPECT_EQ(*d.find("b"), Value(4));
-  EXPECT_EQ(d.find("bb"), nullptr);
-}
-
-TEST(Dictionary, MergePrefersTheOthersValues) {
-  Dictionary merged{{"a", 1}, {"c", 1}};
-  merged.merge({{"b", 2}, {"c", 2}, {"d", 2}});
-  merged.merge({});
-  EXPECT_EQ(merged, (Dictionary{{"a", 1}, {"b", 2}, {"c", 2}, {"d", 2}}));
-}
-
 }  // namespace
 }  // namespace platform

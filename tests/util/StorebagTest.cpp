@@ -202,9 +202,6 @@ TEST_F(StorebagFetchTest, everyFormOfDocumentBagAndKeyIsRead) {
 
 class StorebagSelectionTest : public StorebagFixture {
  protected:
-  platform::SharedDictionary select(std::int32_t clientType = 5) {
-    return fetchStorebagForEnvironmentAndClientType(platform, clientType, fetch);
-  }
   static Dictionary section(const char* mark) { return {{"dashboard", Dictionary{{"mark", mark}}}}; }
 };
 
@@ -268,7 +265,7 @@ TEST_F(StorebagSelectionTest, theBagsRefreshCycleOverridesTheServersMaxAge) {
     if (!refreshCycle.isNull()) bag.set("refresh_cycle", refreshCycle);
     serve(signer.document(bag), {{"Cache-Control", "max-age=1200"}});
     log.clear();
-    EXPECT_TRUE(select());
+    EXPECT_TRUE(fetchStorebagForEnvironmentAndClientType(platform, 5, fetch));
     EXPECT_EQ(fetch.maxAge, expected);
     EXPECT_EQ(fetch.version, "12");
     EXPECT_EQ(log.contains("<6>fetchStorebagForEnvironmentAndClientType: Store bag override MaxAge=" +
@@ -281,7 +278,7 @@ TEST_F(StorebagSelectionTest, refusesTypesWithoutAStorebagBeforeAnyRequest) {
   const std::string line = "<3>fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type ";
   for (const std::int32_t clientType : {4, 19, -1}) {
     log.clear();
-    EXPECT_FALSE(select(clientType));
+    EXPECT_FALSE(fetchStorebagForEnvironmentAndClientType(platform, clientType, fetch));
     EXPECT_THAT(log.lines(), ElementsAre(line + std::to_string(clientType)));
   }
   EXPECT_TRUE(platform.http.requests().empty());
