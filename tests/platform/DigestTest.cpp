@@ -25,18 +25,9 @@ Bytes joined(std::initializer_list<Bytes> parts) {
 }
 
 TEST(Digest, KnownAnswers) {
-  const struct {
-    std::string text, sha1, sha256;
-  } rows[] = {
-      {"", "da39a3ee5e6b4b0d3255bfef95601890afd80709",
-       "e3b0c44298fc1c149afbf4c8996fb92427ae41e4649b934ca495991b7852b855"},
-      {"abcdbcdecdefdefgefghfghighijhijkijkljklmklmnlmnomnopnopq", "84983e441c3bd26ebaae4aa1f95129e5e54670f1",
-       "248d6a61d20638b8e5c026930c3e6039a33ce45964ff2167f6ecedd419db06c1"},
-  };
-  for (const auto& row : rows) {
-    EXPECT_EQ(hexDigits(sha1(bytesOf(row.text))), row.sha1) << row.text;
-    EXPECT_EQ(hexDigits(sha256(bytesOf(row.text))), row.sha256) << row.text;
-  }
+  const auto text = bytesOf("abcdbcdecdefdefgefghfghighijhijkijkljklmklmnlmnomnopnopq");
+  EXPECT_EQ(hexDigits(sha1(text)), "84983e441c3bd26ebaae4aa1f95129e5e54670f1");
+  EXPECT_EQ(hexDigits(sha256(text)), "248d6a61d20638b8e5c026930c3e6039a33ce45964ff2167f6ecedd419db06c1");
 }
 
 TEST(Digest, ThreadsDoNotDisturbEachOther) {

@@ -59,17 +59,6 @@ TEST_F(WorkQueueTest, RunsJobsOneAtATimeAndInEachPostersOrder) {
   ASSERT_TRUE(done.waitFor(kPosters * kJobs));
 }
 
-TEST_F(WorkQueueTest, DifferentQueuesRunAtOnce) {
-  Counter inside, met;
-  for (int i = 0; i < 2; ++i) {
-    _pool.makeQueue()->post([&] {  // the queue lives on in its job
-      inside.add();
-      if (inside.waitFor(2)) met.add();
-    });
-  }
-  EXPECT_TRUE(met.waitFor(2));
-}
-
 TEST(WorkPoolTest, HasThreadsFromStartToStopWhichLetsTheRunningJobEnd) {
   Counter ran;
   WorkPool pool(2);

@@ -4,7 +4,6 @@
 
 #include <random>
 #include <thread>
-#include <vector>
 
 #include "tests/support/LogCapture.h"
 #include "tests/support/Threads.h"
