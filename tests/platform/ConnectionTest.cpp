@@ -84,6 +84,7 @@ TEST_F(ConnectionTest, AFailedWriteOnlyStopsWriting) {
   made.peer.close();
   ASSERT_TRUE(made.delegate->waitForInvalidation());
   EXPECT_FALSE(sent.back());
+  EXPECT_TRUE(eventually([&] { return made.connection->outbox()->isClosed(); }));
 }
 
 TEST_F(ConnectionTest, GathersTheAnswersOfATurnUntilItBlocks) {

@@ -143,13 +143,6 @@ TEST(Landlock, handlesNoMoreRightsThanTheKernelsAbiKnows) {
   for (const auto& [abi, rights] : rows) EXPECT_EQ(landlockRightsOfAbi(abi), rights) << abi;
 }
 
-TEST(Landlock, leavesOutOfAFilesRuleWhatOnlyDirectoriesHave) {
-  EXPECT_EQ(landlockFileRights(~std::uint64_t{0}),
-            kLandlockExecute | kLandlockWriteFile | kLandlockReadFile | kLandlockTruncate | kLandlockIoctlDevice);
-  EXPECT_EQ(landlockFileRights(kLandlockReadFile | kLandlockReadDirectory), kLandlockReadFile);
-  EXPECT_EQ(landlockFileRights(kLandlockMakeSocket | kLandlockRemoveFile), 0);
-}
-
 TEST(SandboxProfile, theShippedProfileIsWellFormed) {
   const auto document =
       readPropertyListFile(ORVANTA_SOURCE_DIR "/packaging/share/orvanta/sandbox/com.kovalt.orvantad.plist");

@@ -185,7 +185,7 @@ TEST_F(SandboxTest, aFilesRealDirectoryIsOpenedSoThatItsReplacementIsReadable) {
   const Array access{"read", "create", "remove"};
   writeProfile({Dictionary{{"directoriesOf", Array{directory / "etc/resolv.conf"}}, {"access", access}}});
   EXPECT_EQ(entered([&] {
-              fs::rename(fresh, file);
+              if (::rename(fresh.c_str(), file.c_str()) != 0) return "renaming: " + outcome(false);
               return opening(directory / "etc/resolv.conf", O_RDONLY);
             }),
             "done");
@@ -196,9 +196,6 @@ TEST_F(SandboxTest, failsWithTheStepAndTheReason) {
   const auto failure = [&] { return entered([] { return "entered"; }); };
   EXPECT_THAT(failure(), testing::AllOf(testing::StartsWith(start), testing::HasSubstr(kFile),
                                         testing::HasSubstr("No such file or directory")));
-  writeProfile({Dictionary{{"paths", Array{"/"}}, {"acess", Array{"read"}}}});
-  EXPECT_EQ(failure(),
-            "sandbox profile " + directory / kFile + ": files[0]: unknown key \"acess\", did you mean \"access\"?");
 
   const struct {
     const char* key;

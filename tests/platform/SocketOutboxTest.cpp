@@ -5,7 +5,6 @@
 
 #include <algorithm>
 #include <atomic>
-#include <future>
 
 #include "platform/Connection.h"
 #include "tests/platform/ConnectionFixture.h"
@@ -73,32 +72,6 @@ TEST_F(OutboxTest, WritesWhileItsConnectionIsBusy) {
   EXPECT_EQ(made.peer.read(sent.size()), sent);
   EXPECT_TRUE(eventually([&] { return made.connection->outbox()->pending() == 0; }));
   release.add();
-}
-
-TEST_F(OutboxTest, DropsOnlyDroppableMessagesWhole) {
-  const std::size_t limit = ConnectionLimits{}.maximumDroppable;
-  auto made = open();
-  const Bytes event = notification("event", {std::string(10'000, 'e')});
-  const Bytes notice = notification("notice");
-  Outbox& outbox = *made.connection->outbox();
-  Bytes expected;
-  while (outbox.send(event, Outbox::Urgency::droppable)) append(expected, event);
-  EXPECT_LE(outbox.pending(), limit);
-  EXPECT_GT(outbox.pending(), limit - 2 * event.size());
-  EXPECT_TRUE(outbox.send(event));  // a reply is never dropped
-  EXPECT_FALSE(outbox.send(event, Outbox::Urgency::droppable));
-  EXPECT_FALSE(outbox.isClosed());
-  EXPECT_TRUE(outbox.send(notice));
-  expected = std::move(expected) + event + notice;
-  EXPECT_EQ(made.peer.read(expected.size()), expected);
-  EXPECT_TRUE(outbox.send(event, Outbox::Urgency::droppable));
-  EXPECT_EQ(made.peer.read(event.size()), event);
-  EXPECT_FALSE(made.peer.hasBytes());
-  made.peer.close();
-  ASSERT_TRUE(made.delegate->waitForInvalidation());
-  std::promise<bool> behind;  // the job that tells the delegate closes the outbox at its end
-  made.connection->queue()->post([&] { behind.set_value(outbox.isClosed()); });
-  EXPECT_TRUE(behind.get_future().get());
 }
 
 TEST_F(OutboxTest, LeavesNoDescriptorBehindAfterBackPressure) {
