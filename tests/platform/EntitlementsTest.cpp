@@ -111,12 +111,6 @@ TEST(EntitlementsTest, AnyMatchingGrantThatReadsAsTrueCounts) {
   EXPECT_TRUE(entitlements.holds(somebody(), kGranted)) << "read anew each time";
 }
 
-TEST(EntitlementsTest, AnAbsentDirectoryGrantsNothing) {
-  LogCapture log;
-  EXPECT_FALSE(Entitlements("/nonexistent/entitlements.d").holds(somebody(), kGranted));
-  EXPECT_EQ(log.count("<5>Entitlements: /nonexistent/entitlements.d cannot be read"), 1U);
-}
-
 // Without a security module every label is empty: that must not match anything.
 TEST(EntitlementsTest, APeerWithoutALabelMatchesNoLabel) {
   const TemporaryDirectory directory;

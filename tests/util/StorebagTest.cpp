@@ -200,10 +200,11 @@ TEST_F(StorebagFetchTest, everyFormOfDocumentBagAndKeyIsRead) {
   }
 }
 
-class StorebagSelectionTest : public StorebagFixture {
- protected:
-  static Dictionary section(const char* mark) { return {{"dashboard", Dictionary{{"mark", mark}}}}; }
-};
+using StorebagSelectionTest = StorebagFixture;
+
+Dictionary section(const char* mark) {
+  return {{"dashboard", Dictionary{{"mark", mark}}}};
+}
 
 TEST_F(StorebagSelectionTest, takesTheEnvironmentsSection) {
   const Dictionary all{{"development", section("development")},
