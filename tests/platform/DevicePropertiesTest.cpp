@@ -47,11 +47,6 @@ TEST(SystemFacts, CountryOfALocale) {
   for (const auto& [locale, expected] : rows) EXPECT_EQ(countryOfLocale(locale), expected) << locale;
 }
 
-TEST(SystemFacts, FirmwareTexts) {
-  const Texts rows = {{" padded  \n", "padded"}, {"To Be Filled By O.E.M.\n", {}}, {"\n", {}}, {"", {}}};
-  for (const auto& [content, expected] : rows) EXPECT_EQ(firmwareText(content), expected) << content;
-}
-
 TEST(SystemFacts, DerivedIdentifiers) {
   const Text first = deriveDeviceIdentifier(kMachineId, "app.one");
   ASSERT_TRUE(first);
@@ -104,9 +99,9 @@ TEST_F(DevicePropertiesTest, FactsAreConfiguredOrStandInTheSystemsFilesOrAreUnkn
   _root.write("proc/device-tree/serial-number", std::string("SN77\0", 5));
   for (const auto& row : rows) EXPECT_EQ((device.*row.get)(), row.board) << row.key;
   _root.write("etc/os-release", "VERSION_ID=12\nBUILD_ID=b9\n");
-  _root.write("sys/class/dmi/id/product_name", "Machine 9\n");
+  _root.write("sys/class/dmi/id/product_name", " Machine 9  \n");
   _root.write("sys/class/dmi/id/product_serial", "Default string\n");
-  _root.write("sys/class/dmi/id/product_family", "Machines\n");
+  _root.write("sys/class/dmi/id/product_family", "Machines");
   for (const auto& row : rows) EXPECT_EQ((device.*row.get)(), row.machine) << row.key;
 
   configure(plist(entries + "<key>CountryCode</key><string>FR</string><key>AutomaticTimeZone</key><false/>"));

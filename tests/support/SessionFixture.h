@@ -48,7 +48,6 @@ using KeptFlush = Kept<std::optional<std::string>, std::optional<OrvantaError>>;
 // The real agent and real sessions on a test device; the storebag comes from the test.
 class SessionFixture : public ::testing::Test {
  protected:
-  SessionFixture() = default;
   ~SessionFixture() override {
     for (const auto& session : _sessions) leave(session);
   }
