@@ -230,7 +230,6 @@ TEST_F(StorebagSelectionTest, takesTheEnvironmentsSection) {
       {3, false, all, "seed"},
       {{}, false, all, "seed"},
       {{}, true, all, "internal"},
-      {7, false, all, "internal", {"<3>userDefaultsEnvironment: Invalid environment type 7"}},
       {3, false, releaseOnly, "release", {seedMissing}},
       {{}, false, wrongType, "release", {seedMissing}},
       {{}, false, {}, nullptr, {seedMissing, notFound("release")}},
