@@ -1,12 +1,9 @@
 #include "daemon/DaemonPlatform.h"
 
-#include <chrono>
 #include <cstdlib>
 #include <filesystem>
 #include <string_view>
 
-#include "backends/PendingPosts.h"
-#include "backends/UploadBudget.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/JsonLinesPowerLog.h"
@@ -72,18 +69,10 @@ std::unique_ptr<platform::Sandbox> enterDaemonSandbox(const platform::FileLocati
   return std::move(*entered);
 }
 
-void endWaiting(platform::Platform& platform) {
-  platform.http().abortBlockingRequests();
-  UploadBudget::of(platform).close();
-  PendingPosts::of(platform)->stopWaiting();
-}
-
-void finishDeliveries(platform::Platform& platform) {
-  using std::chrono::milliseconds;
-  // Datagrams and posts are jobs by now; then they are requests in flight.
-  platform.pool().drain(milliseconds(2000));
-  platform.http().shutdown(milliseconds(5000));
-  platform.pool().drain(milliseconds(1000));
+bool closeDaemonSandbox(platform::Sandbox& sandbox) {
+  const auto started = sandbox.started();
+  if (!started) ORVANTA_LOG(error, "main: Failed to enter sandbox {}: {}", kOrvantaServiceName, started.error());
+  return started.ok();
 }
 
 }  // namespace orvanta

@@ -17,10 +17,8 @@ std::map<std::string, std::string> sandboxVariables(const platform::FileLocation
 
 // Enters the service's sandbox, or says why not and returns null. ORVANTA_SANDBOX=off stays outside, with a warning.
 std::unique_ptr<platform::Sandbox> enterDaemonSandbox(const platform::FileLocations& files);
-
-// For ending, on the main thread. Calls that wait for a server or for memory get their errors, now and from now on.
-void endWaiting(platform::Platform& platform);
-// Gives what the sessions' ends made a few seconds to leave, and ends the HTTP client.
-void finishDeliveries(platform::Platform& platform);
+// What the sandbox does once the daemon has its socket: from then on nobody listens anywhere else. Before the first
+// thread, so that it holds for all. False, with the reason in the log, when it cannot.
+bool closeDaemonSandbox(platform::Sandbox& sandbox);
 
 }  // namespace orvanta

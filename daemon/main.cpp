@@ -2,6 +2,7 @@
 #include <utility>
 
 #include "daemon/DaemonPlatform.h"
+#include "daemon/Ending.h"
 #include "daemon/OrvantadAgent.h"
 #include "daemon/StartupChecks.h"
 #include "interface/OrvantaConstants.h"
@@ -30,11 +31,7 @@ int main() {
     ORVANTA_LOG(error, "main: {}", socket.error());
     return 1;
   }
-  // Before the first thread, so that it holds for all: nobody listens anywhere else.
-  if (const auto started = sandbox->started(); !started) {
-    ORVANTA_LOG(error, "main: Failed to enter sandbox {}: {}", kOrvantaServiceName, started.error());
-    return -1;
-  }
+  if (!closeDaemonSandbox(*sandbox)) return -1;
   const auto device = makeDaemonPlatform(files);
   OrvantadAgent agent(*device);
   auto listener =
@@ -51,12 +48,7 @@ int main() {
   const int signal = platform::waitForTermination();
   ORVANTA_LOG(info, "main: Ending on signal {}", signal);
   platform::KeepAlive::stopping();
-  bool ended = listener->stop();
-  endWaiting(*device);
-  ended = agent.endAllSessions() && ended;
-  finishDeliveries(*device);
-  agent.waitForClients();
-  if (!ended) std::_Exit(0);  // a thread that is stuck in a call cannot be joined
+  if (!endService(*listener, *device, agent)) std::_Exit(0);
   listener.reset();
   device->pool().stop();
   sandbox.reset();  // its watcher logs, too

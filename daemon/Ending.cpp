@@ -1,0 +1,38 @@
+#include "daemon/Ending.h"
+
+#include <chrono>
+
+#include "backends/PendingPosts.h"
+#include "backends/UploadBudget.h"
+
+namespace orvanta {
+
+namespace {
+
+// Calls that wait for a server or for memory get their errors, now and from now on.
+void endWaiting(platform::Platform& platform) {
+  platform.http().abortBlockingRequests();
+  UploadBudget::of(platform).close();
+  PendingPosts::of(platform)->stopWaiting();
+}
+
+void finishDeliveries(platform::Platform& platform) {
+  using std::chrono::milliseconds;
+  // Datagrams and posts are jobs by now; then they are requests in flight.
+  platform.pool().drain(milliseconds(2000));
+  platform.http().shutdown(milliseconds(5000));
+  platform.pool().drain(milliseconds(1000));
+}
+
+}  // namespace
+
+bool endService(platform::Listener& listener, platform::Platform& platform, OrvantadAgent& agent) {
+  const bool nobodyAtTheDoor = listener.stop();
+  endWaiting(platform);
+  const bool sessionsEnded = agent.endAllSessions();
+  finishDeliveries(platform);
+  agent.waitForClients();
+  return nobodyAtTheDoor && sessionsEnded;
+}
+
+}  // namespace orvanta
