@@ -4,10 +4,13 @@
 #include <dlfcn.h>
 #include <fcntl.h>
 #include <gmock/gmock.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
 #include <netdb.h>
 #include <pwd.h>
 #include <sys/prctl.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -294,6 +297,20 @@ TEST_F(ShippedSandboxTest, aRefusedCallIsLoggedOnceByItsName) {
   EXPECT_THAT(lines,
               testing::MatchesRegex("<4>sandbox: Refused system call inotify_init1 \\([0-9]+\\)" + end +
                                     "<4>sandbox: Refused system call socket \\([0-9]+\\) with such arguments" + end));
+}
+
+// As in some containers: the kernel takes one watcher only, and calls are then refused without a line.
+TEST_F(ShippedSandboxTest, whereSomebodyElseWatchesAlreadyCallsAreRefusedAllTheSame) {
+  const std::string result = inChild([&] {
+    sock_filter allow = BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW);
+    const sock_fprog program{1, &allow};
+    ::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0);
+    const UniqueFd watcher(
+        static_cast<int>(::syscall(SYS_seccomp, SECCOMP_SET_MODE_FILTER, SECCOMP_FILTER_FLAG_NEW_LISTENER, &program)));
+    if (!watcher) return "no watcher: " + outcome(false);
+    return work([] { return outcome(::inotify_init1(0) >= 0); });
+  });
+  EXPECT_EQ(result, "Function not implemented");
 }
 
 }  // namespace
