@@ -12,7 +12,7 @@ namespace orvanta {
 
 namespace {
 
-// Files of /proc and /sys do not tell their size. So much of one is read.
+// Files of /proc and /sys do not tell their size. One is taken up to this.
 constexpr std::uint64_t kUnsizedBytes = 1U << 20U;
 
 std::optional<std::string> textAt(const SharedDictionary& dictionary, std::string_view key) {
@@ -24,9 +24,15 @@ std::optional<std::string> textAt(const SharedDictionary& dictionary, std::strin
 // The file's content, compressed; none when there is nothing to send, with the reason in the log.
 std::optional<std::string> compressedContent(const platform::ExtensionHandle& handle, std::uint64_t size) {
   const platform::BlockingScope blocking;  // a slow file system, and seconds of compression
-  const std::optional<std::string> content = handle.read(static_cast<std::size_t>(size));
+  // One byte beyond the bound tells a whole file from the start of one.
+  const std::optional<std::string> content = handle.read(static_cast<std::size_t>(size > 0 ? size : kUnsizedBytes + 1));
   if (!content || content->empty()) {
     ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): Input file is empty");
+    return std::nullopt;
+  }
+  if (size == 0 && content->size() > kUnsizedBytes) {
+    ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): The file does not tell its size and has more than {} bytes.",
+                kUnsizedBytes);
     return std::nullopt;
   }
   return gzipDeflate(*content);
@@ -90,7 +96,7 @@ bool UploadBackend::uploadFileAtPath(const UploadFile& file) {
     ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): The daemon is ending.");
     return false;
   }
-  std::optional<std::string> body = compressedContent(handle, expected);
+  std::optional<std::string> body = compressedContent(handle, *size);
   if (!body) return false;
   share->shrinkTo(body->size());
 

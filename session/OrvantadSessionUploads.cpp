@@ -1,7 +1,7 @@
 #include <fmt/format.h>
 
-#include "interface/OrvantaLogging.h"
 #include "interface/FileURL.h"
+#include "interface/OrvantaLogging.h"
 #include "session/OrvantadSession.h"
 #include "util/MessageLog.h"
 

@@ -29,17 +29,18 @@ struct UploadOptions : ClientOptions {
 // The values travel in one frame; their JSON may be twice as long.
 constexpr std::size_t kMaximumLogBytes = 2 * kMaximumFrameBytes;
 
-// The daemon answers no more than no, so what can be seen from here is looked at; what is left is the daemon's side.
+// The daemon answers no more than no. What can be seen from here is looked at; what is left is the daemon's side.
 std::string reasonNotTaken(const std::string& file) {
   struct stat facts {};
   if (::stat(file.c_str(), &facts) != 0) return std::strerror(errno);
   if (!S_ISREG(facts.st_mode)) return "it is not a regular file";
-  if (facts.st_size == 0) return "it is empty";
   if (static_cast<std::uint64_t>(facts.st_size) > kMaximumUploadBytes) {
     return fmt::format("it has {} bytes, and the daemon takes at most {} MiB", facts.st_size,
                        kMaximumUploadBytes >> 20U);
   }
-  return "the client type's storebag must have an \"upload_server\" with a \"post_url\". The daemon's log says more";
+  return "the client type's storebag must have an \"upload_server\" with a \"post_url\", and the file must not be "
+         "empty; the "
+         "daemon's log says more";
 }
 
 int upload(const UploadOptions& options) {
