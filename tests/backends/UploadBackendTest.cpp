@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/mman.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 
@@ -87,6 +88,22 @@ TEST_F(UploadBackendTest, OnlyAnAnswerThatSaysSuccessDeletes) {
     EXPECT_EQ(removals, expected) << line;
     EXPECT_EQ(log.count(line), 1U) << line;
   }
+}
+
+// The description of a process's memory grows with it.
+TEST_F(UploadBackendTest, AFileThatDoesNotTellItsSizeGoesWholeOrNotAtAll) {
+  EXPECT_TRUE(uploadOpened("/proc/self/stat"));
+  ASSERT_EQ(platform.http.requests().size(), 1U);
+  constexpr std::size_t kPage = 4096, kPages = 6000;
+  void* const memory = ::mmap(nullptr, kPages * kPage, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
+  ASSERT_NE(memory, MAP_FAILED);
+  for (std::size_t page = 0; page < kPages; page += 2) {
+    ASSERT_EQ(::mprotect(static_cast<char*>(memory) + page * kPage, kPage, PROT_READ), 0);
+  }
+  EXPECT_FALSE(uploadOpened("/proc/self/smaps"));
+  EXPECT_EQ(::munmap(memory, kPages * kPage), 0);
+  EXPECT_EQ(log.count("<3>UploadBackend(uploadFileAtPath): The file does not tell its size and has more than "), 1U);
+  EXPECT_EQ(platform.http.requests().size(), 1U);
 }
 
 TEST_F(UploadBackendTest, RefusesWhatIsNoReadableRegularFile) {
