@@ -15,6 +15,11 @@ namespace {
 // Files of /proc and /sys do not tell their size. One is taken up to this.
 constexpr std::uint64_t kUnsizedBytes = 1U << 20U;
 
+// What is read at most. One byte beyond the bound tells a whole file from the start of one.
+std::uint64_t bytesToRead(std::uint64_t size) {
+  return size > 0 ? size : kUnsizedBytes + 1;
+}
+
 std::optional<std::string> textAt(const SharedDictionary& dictionary, std::string_view key) {
   const platform::Value* value = dictionary ? dictionary->find(key) : nullptr;
   const std::string* text = value == nullptr ? nullptr : value->string();
@@ -24,8 +29,7 @@ std::optional<std::string> textAt(const SharedDictionary& dictionary, std::strin
 // The file's content, compressed; none when there is nothing to send, with the reason in the log.
 std::optional<std::string> compressedContent(const platform::ExtensionHandle& handle, std::uint64_t size) {
   const platform::BlockingScope blocking;  // a slow file system, and seconds of compression
-  // One byte beyond the bound tells a whole file from the start of one.
-  const std::optional<std::string> content = handle.read(static_cast<std::size_t>(size > 0 ? size : kUnsizedBytes + 1));
+  const std::optional<std::string> content = handle.read(static_cast<std::size_t>(bytesToRead(size)));
   if (!content || content->empty()) {
     ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): Input file is empty");
     return std::nullopt;
@@ -86,11 +90,10 @@ bool UploadBackend::uploadFileAtPath(const UploadFile& file) {
     return false;
   }
 
-  const std::uint64_t expected = *size > 0 ? *size : kUnsizedBytes;
   std::unique_ptr<UploadBudget::Share> share;
   {
     const platform::BlockingScope waitingForOthers;
-    share = UploadBudget::Share::take(UploadBudget::of(platform()), UploadBudget::kCopies * expected);
+    share = UploadBudget::Share::take(UploadBudget::of(platform()), UploadBudget::kCopies * bytesToRead(*size));
   }
   if (!share) {
     ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): The daemon is ending.");

@@ -4,6 +4,7 @@
 
 #include "backends/PendingPosts.h"
 #include "backends/UploadBudget.h"
+#include "interface/OrvantaLogging.h"
 
 namespace orvanta {
 
@@ -28,6 +29,7 @@ void finishDeliveries(platform::Platform& platform) {
 
 bool endService(platform::Listener& listener, platform::Platform& platform, OrvantadAgent& agent) {
   const bool nobodyAtTheDoor = listener.stop();
+  if (!nobodyAtTheDoor) ORVANTA_LOG(error, "main: A connection is still being admitted and is left behind");
   endWaiting(platform);
   const bool sessionsEnded = agent.endAllSessions();
   finishDeliveries(platform);

@@ -307,7 +307,7 @@ TEST_F(ShippedSandboxTest, whereSomebodyElseWatchesAlreadyCallsAreRefusedAllTheS
     ::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0);
     const UniqueFd watcher(
         static_cast<int>(::syscall(SYS_seccomp, SECCOMP_SET_MODE_FILTER, SECCOMP_FILTER_FLAG_NEW_LISTENER, &program)));
-    if (!watcher) return "no watcher: " + outcome(false);
+    if (!watcher && errno != EBUSY) return "no watcher: " + outcome(false);  // busy: it is such a container
     return work([] { return outcome(::inotify_init1(0) >= 0); });
   });
   EXPECT_EQ(result, "Function not implemented");

@@ -3,6 +3,7 @@
 
 #include <cerrno>
 #include <cstring>
+#include <fstream>
 #include <memory>
 #include <string>
 #include <utility>
@@ -38,9 +39,9 @@ std::string reasonNotTaken(const std::string& file) {
     return fmt::format("it has {} bytes, and the daemon takes at most {} MiB", facts.st_size,
                        kMaximumUploadBytes >> 20U);
   }
-  return "the client type's storebag must have an \"upload_server\" with a \"post_url\", and the file must not be "
-         "empty; the "
-         "daemon's log says more";
+  // Files of /proc have no size, but content.
+  if (facts.st_size == 0 && std::ifstream(file).peek() == std::ifstream::traits_type::eof()) return "it is empty";
+  return "the client type's storebag must have an \"upload_server\" with a \"post_url\"; the daemon's log says more";
 }
 
 int upload(const UploadOptions& options) {
