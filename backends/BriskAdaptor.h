@@ -6,7 +6,7 @@
 
 #include "interface/PluginBundle.h"
 #include "platform/Platform.h"
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace orvanta {
 

@@ -7,7 +7,7 @@
 
 #include "backends/OrvantaBackend.h"
 #include "backends/StringMatching.h"
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace orvanta {
 

@@ -11,7 +11,7 @@
 #include "backends/DashboardDatagram.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/PropertyList.h"
-#include "platform/Utf8.h"
+#include "platform/core/Utf8.h"
 #include "util/Conversions.h"
 
 namespace orvanta {

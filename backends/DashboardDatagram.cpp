@@ -6,7 +6,7 @@
 #include <cstring>
 #include <iterator>
 
-#include "platform/Utf8.h"
+#include "platform/core/Utf8.h"
 #include "util/ClientTypes.h"
 
 namespace orvanta {

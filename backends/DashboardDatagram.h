@@ -10,9 +10,9 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Clock.h"
-#include "platform/Result.h"
-#include "platform/Value.h"
+#include "platform/core/Clock.h"
+#include "platform/core/Result.h"
+#include "platform/core/Value.h"
 
 namespace orvanta {
 

@@ -7,7 +7,7 @@
 #include <string_view>
 
 #include "backends/ReservedKeys.h"
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace orvanta {
 

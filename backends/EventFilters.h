@@ -6,8 +6,8 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Result.h"
-#include "platform/Value.h"
+#include "platform/core/Result.h"
+#include "platform/core/Value.h"
 
 namespace orvanta {
 

@@ -11,10 +11,10 @@
 #include <vector>
 
 #include "interface/OrvantaError.h"
-#include "platform/Clock.h"
 #include "platform/Platform.h"
-#include "platform/UniqueFunction.h"
-#include "platform/Value.h"
+#include "platform/core/Clock.h"
+#include "platform/core/UniqueFunction.h"
+#include "platform/core/Value.h"
 #include "util/DeviceInfo.h"
 
 namespace orvanta {

@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "backends/ReservedKeys.h"
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace orvanta {
 

@@ -5,7 +5,7 @@
 #include "backends/UploadBudget.h"
 #include "backends/UploadURL.h"
 #include "interface/OrvantaLogging.h"
-#include "platform/Utf8.h"
+#include "platform/core/Utf8.h"
 #include "util/Compression.h"
 
 namespace orvanta {

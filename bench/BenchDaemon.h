@@ -3,7 +3,7 @@
 #include <memory>
 
 #include "bench/RawPeers.h"
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tools/collector/Collector.h"

@@ -4,8 +4,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/UniqueFd.h"
-#include "platform/Value.h"
+#include "platform/core/UniqueFd.h"
+#include "platform/core/Value.h"
 
 namespace orvanta::bench {
 

@@ -19,7 +19,7 @@
 #include "bench/RawPeers.h"
 #include "bench/Stages.h"
 #include "platform/FrameDecoder.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 #include "tests/support/TestPlatform.h"
 #include "util/MessageLog.h"
 

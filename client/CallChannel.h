@@ -17,7 +17,7 @@
 #include "client/UploadTokens.h"
 #include "interface/AggregatedEvent.h"
 #include "platform/Connection.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 
 namespace orvanta {
 

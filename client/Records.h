@@ -4,7 +4,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace orvanta {
 

@@ -11,7 +11,7 @@
 
 #include "client/CallResult.h"
 #include "interface/WireLimits.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 
 namespace orvanta {
 

@@ -3,7 +3,7 @@
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/Entitlements.h"
-#include "platform/NearestWord.h"
+#include "platform/core/NearestWord.h"
 #include "util/Orvanta.h"
 #include "util/UserDefaultKeys.h"
 

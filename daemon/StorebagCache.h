@@ -6,8 +6,8 @@
 #include <optional>
 #include <string>
 
-#include "platform/Clock.h"
-#include "platform/Value.h"
+#include "platform/core/Clock.h"
+#include "platform/core/Value.h"
 #include "util/Storebag.h"
 
 namespace orvanta {

@@ -7,7 +7,7 @@
 
 #include "interface/OrvantaError.h"
 #include "interface/Reply.h"
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace orvanta {
 

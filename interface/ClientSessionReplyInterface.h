@@ -2,7 +2,7 @@
 
 #include <cstdint>
 
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace orvanta {
 

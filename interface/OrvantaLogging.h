@@ -2,9 +2,9 @@
 
 #include <string>
 
-#include "platform/Log.h"
+#include "platform/core/Log.h"
 
-// The daemon's log lines go through this; see platform/Log.h.
+// The daemon's log lines go through this; see platform/core/Log.h.
 #define ORVANTA_LOG(LEVEL, ...) PLATFORM_LOG(LEVEL, __VA_ARGS__)
 
 namespace orvanta {

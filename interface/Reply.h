@@ -5,7 +5,7 @@
 #include <tuple>
 #include <utility>
 
-#include "platform/UniqueFunction.h"
+#include "platform/core/UniqueFunction.h"
 
 namespace orvanta {
 

@@ -6,7 +6,7 @@
 
 #include "platform/BinaryPropertyListFormat.h"
 #include "platform/PropertyList.h"
-#include "platform/Utf8.h"
+#include "platform/core/Utf8.h"
 
 namespace platform {
 

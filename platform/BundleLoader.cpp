@@ -5,7 +5,7 @@
 #include <filesystem>
 #include <system_error>
 
-#include "platform/Log.h"
+#include "platform/core/Log.h"
 
 namespace platform {
 

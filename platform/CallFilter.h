@@ -2,8 +2,8 @@
 
 #include <cstddef>
 
-#include "platform/Result.h"
 #include "platform/SandboxCalls.h"
+#include "platform/core/Result.h"
 
 namespace platform {
 

@@ -9,7 +9,7 @@
 
 #include "platform/JobCount.h"
 #include "platform/PoolThreads.h"
-#include "platform/UniqueFunction.h"
+#include "platform/core/UniqueFunction.h"
 
 namespace platform {
 

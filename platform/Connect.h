@@ -2,8 +2,8 @@
 
 #include <string>
 
-#include "platform/Result.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/Result.h"
+#include "platform/core/UniqueFd.h"
 
 namespace platform {
 

@@ -11,11 +11,11 @@
 
 #include <fmt/format.h>
 
-#include "platform/FileStamp.h"
-#include "platform/Log.h"
-#include "platform/NearestWord.h"
 #include "platform/PropertyList.h"
 #include "platform/SystemFacts.h"
+#include "platform/core/FileStamp.h"
+#include "platform/core/Log.h"
+#include "platform/core/NearestWord.h"
 
 namespace platform {
 

@@ -9,7 +9,7 @@
 #include <algorithm>
 #include <cstdlib>
 
-#include "platform/Log.h"
+#include "platform/core/Log.h"
 
 namespace platform {
 

@@ -14,10 +14,10 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Log.h"
-#include "platform/NearestWord.h"
 #include "platform/PropertyList.h"
 #include "platform/WorkQueue.h"
+#include "platform/core/Log.h"
+#include "platform/core/NearestWord.h"
 
 namespace platform {
 

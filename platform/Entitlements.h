@@ -7,7 +7,7 @@
 
 #include "platform/PeerIdentity.h"
 #include "platform/Platform.h"
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace platform {
 

@@ -9,7 +9,7 @@
 #include <vector>
 
 #include "platform/MessagePack.h"
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace platform {
 

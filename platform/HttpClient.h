@@ -9,8 +9,8 @@
 #include <utility>
 #include <vector>
 
-#include "platform/UniqueFunction.h"
 #include "platform/WorkQueue.h"
+#include "platform/core/UniqueFunction.h"
 
 namespace platform {
 

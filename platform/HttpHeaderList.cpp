@@ -7,7 +7,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Log.h"
+#include "platform/core/Log.h"
 
 namespace platform {
 

@@ -8,7 +8,7 @@
 #include <utility>
 
 #include "platform/HttpRedirect.h"
-#include "platform/Log.h"
+#include "platform/core/Log.h"
 
 namespace platform {
 

@@ -3,9 +3,9 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Result.h"
-#include "platform/Utf8.h"
-#include "platform/Value.h"
+#include "platform/core/Result.h"
+#include "platform/core/Utf8.h"
+#include "platform/core/Value.h"
 
 namespace platform {
 

@@ -10,7 +10,7 @@
 #include <utility>
 
 #include "platform/Json.h"
-#include "platform/Log.h"
+#include "platform/core/Log.h"
 
 namespace platform {
 

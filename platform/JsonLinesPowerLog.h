@@ -7,9 +7,9 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Clock.h"
 #include "platform/PowerLog.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/Clock.h"
+#include "platform/core/UniqueFd.h"
 
 namespace platform {
 

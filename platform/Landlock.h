@@ -2,8 +2,8 @@
 
 #include <cstdint>
 
-#include "platform/Result.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/Result.h"
+#include "platform/core/UniqueFd.h"
 
 namespace platform {
 

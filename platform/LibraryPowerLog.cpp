@@ -5,9 +5,9 @@
 #include <string>
 #include <vector>
 
-#include "platform/Log.h"
 #include "platform/MessagePack.h"
 #include "platform/WorkQueue.h"
+#include "platform/core/Log.h"
 
 namespace platform {
 

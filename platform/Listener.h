@@ -7,9 +7,9 @@
 
 #include "platform/Connection.h"
 #include "platform/PeerIdentity.h"
-#include "platform/Result.h"
 #include "platform/ServiceSocket.h"
 #include "platform/WorkQueue.h"
+#include "platform/core/Result.h"
 
 namespace platform {
 

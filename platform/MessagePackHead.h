@@ -7,7 +7,7 @@
 #include <cstring>
 #include <span>
 
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace platform {
 

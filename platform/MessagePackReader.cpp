@@ -5,7 +5,7 @@
 
 #include <fmt/format.h>
 
-#include "platform/Utf8.h"
+#include "platform/core/Utf8.h"
 
 namespace platform {
 

@@ -9,7 +9,7 @@
 
 #include "platform/MessagePack.h"
 #include "platform/MessagePackHead.h"
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace platform {
 

@@ -6,13 +6,13 @@
 #include <typeindex>
 #include <unordered_map>
 
-#include "platform/Clock.h"
 #include "platform/DeviceProperties.h"
 #include "platform/HttpClient.h"
 #include "platform/KeepAlive.h"
 #include "platform/PowerLog.h"
 #include "platform/UserDefaults.h"
 #include "platform/WorkQueue.h"
+#include "platform/core/Clock.h"
 
 namespace platform {
 

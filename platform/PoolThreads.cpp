@@ -7,7 +7,7 @@
 #include <system_error>
 #include <utility>
 
-#include "platform/Log.h"
+#include "platform/core/Log.h"
 
 namespace platform {
 

@@ -8,7 +8,7 @@
 #include <cerrno>
 #include <csignal>
 
-#include "platform/Log.h"
+#include "platform/core/Log.h"
 
 namespace platform {
 

@@ -8,8 +8,8 @@
 
 #include <fmt/format.h>
 
-#include "platform/UniqueFd.h"
-#include "platform/WholeFile.h"
+#include "platform/core/UniqueFd.h"
+#include "platform/core/WholeFile.h"
 
 namespace platform {
 

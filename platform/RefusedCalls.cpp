@@ -21,7 +21,7 @@
 #include <vector>
 
 #include "platform/CallFilter.h"
-#include "platform/Log.h"
+#include "platform/core/Log.h"
 
 namespace platform {
 

@@ -5,9 +5,9 @@
 #include <thread>
 #include <vector>
 
-#include "platform/Result.h"
 #include "platform/SandboxCalls.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/Result.h"
+#include "platform/core/UniqueFd.h"
 
 namespace platform {
 

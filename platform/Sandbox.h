@@ -6,8 +6,8 @@
 #include <utility>
 
 #include "platform/RefusedCalls.h"
-#include "platform/Result.h"
 #include "platform/SandboxCalls.h"
+#include "platform/core/Result.h"
 
 namespace platform {
 

@@ -18,7 +18,7 @@
 #include <string_view>
 #include <utility>
 
-#include "platform/NearestWord.h"
+#include "platform/core/NearestWord.h"
 
 namespace platform {
 

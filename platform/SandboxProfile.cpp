@@ -6,7 +6,7 @@
 #include <utility>
 
 #include "platform/Landlock.h"
-#include "platform/NearestWord.h"
+#include "platform/core/NearestWord.h"
 
 namespace platform {
 

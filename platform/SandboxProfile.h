@@ -8,9 +8,9 @@
 #include <vector>
 
 #include "platform/Landlock.h"
-#include "platform/Result.h"
 #include "platform/SandboxCalls.h"
-#include "platform/Value.h"
+#include "platform/core/Result.h"
+#include "platform/core/Value.h"
 
 namespace platform {
 

@@ -7,8 +7,8 @@
 #include <cstring>
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/SocketConnection.h"
+#include "platform/core/Log.h"
 
 namespace platform {
 

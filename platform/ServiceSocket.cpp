@@ -13,9 +13,9 @@
 #include <utility>
 
 #include "platform/Connect.h"
-#include "platform/Log.h"
 #include "platform/PeerIdentity.h"
 #include "platform/UnixAddress.h"
+#include "platform/core/Log.h"
 
 namespace platform {
 

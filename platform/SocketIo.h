@@ -5,7 +5,7 @@
 #include <span>
 #include <vector>
 
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 
 namespace platform {
 

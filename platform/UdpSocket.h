@@ -7,7 +7,7 @@
 #include <optional>
 #include <span>
 
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 
 namespace platform {
 

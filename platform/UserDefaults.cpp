@@ -11,10 +11,10 @@
 #include <filesystem>
 #include <system_error>
 
-#include "platform/Log.h"
 #include "platform/PropertyList.h"
-#include "platform/UniqueFd.h"
 #include "platform/WorkQueue.h"
+#include "platform/core/Log.h"
+#include "platform/core/UniqueFd.h"
 
 namespace platform {
 

@@ -6,9 +6,9 @@
 #include <string_view>
 #include <utility>
 
-#include "platform/FileStamp.h"
-#include "platform/Result.h"
-#include "platform/Value.h"
+#include "platform/core/FileStamp.h"
+#include "platform/core/Result.h"
+#include "platform/core/Value.h"
 
 namespace platform {
 

@@ -13,8 +13,8 @@
 #include <utility>
 
 #include "platform/JobCount.h"
-#include "platform/Log.h"
 #include "platform/PoolThreads.h"
+#include "platform/core/Log.h"
 
 namespace platform {
 

@@ -5,7 +5,7 @@
 #include <memory>
 
 #include "platform/ComputeQueue.h"
-#include "platform/UniqueFunction.h"
+#include "platform/core/UniqueFunction.h"
 
 namespace platform {
 

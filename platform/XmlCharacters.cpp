@@ -1,6 +1,6 @@
 #include "platform/XmlCharacters.h"
 
-#include "platform/Utf8.h"
+#include "platform/core/Utf8.h"
 
 namespace platform {
 

@@ -9,9 +9,9 @@
 #include <pugixml.hpp>
 
 #include "platform/PropertyList.h"
-#include "platform/PropertyListDate.h"
-#include "platform/Utf8.h"
 #include "platform/XmlCharacters.h"
+#include "platform/core/PropertyListDate.h"
+#include "platform/core/Utf8.h"
 
 namespace platform {
 

@@ -4,8 +4,8 @@
 #include <fmt/format.h>
 
 #include "platform/PropertyList.h"
-#include "platform/PropertyListDate.h"
 #include "platform/XmlCharacters.h"
+#include "platform/core/PropertyListDate.h"
 
 namespace platform {
 

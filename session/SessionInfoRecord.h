@@ -5,7 +5,7 @@
 #include <string>
 
 #include "interface/OrvantaConstants.h"
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace orvanta {
 

@@ -5,7 +5,7 @@
 #include <cstdint>
 #include <string_view>
 
-#include "platform/Clock.h"
+#include "platform/core/Clock.h"
 
 namespace orvanta {
 

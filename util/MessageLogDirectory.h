@@ -6,7 +6,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 
 namespace orvanta {
 

@@ -11,9 +11,9 @@
 #include <vector>
 
 #include "interface/OrvantaLogging.h"
-#include "platform/NearestWord.h"
 #include "platform/PropertyList.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/NearestWord.h"
+#include "platform/core/UniqueFd.h"
 #include "util/UserDefaultKeys.h"
 
 namespace orvanta {

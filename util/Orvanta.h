@@ -5,7 +5,7 @@
 
 #include "platform/Digest.h"
 #include "platform/Platform.h"
-#include "platform/Result.h"
+#include "platform/core/Result.h"
 
 namespace orvanta {
 

@@ -11,7 +11,7 @@
 #include <vector>
 
 #include "backends/HTTPSPostBackend.h"
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
 

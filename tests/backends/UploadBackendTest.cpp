@@ -11,7 +11,7 @@
 
 #include "backends/UploadBudget.h"
 #include "backends/UploadURL.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 #include "tests/backends/HTTPSFixture.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"

@@ -11,8 +11,8 @@
 
 #include "daemon/OrvantadAgent.h"
 #include "interface/OrvantaConstants.h"
-#include "platform/LogSink.h"
 #include "platform/PropertyList.h"
+#include "platform/core/LogSink.h"
 #include "tests/support/TestPlatform.h"
 
 namespace orvanta::test {

@@ -3,7 +3,7 @@
 
 #include "backends/DashboardDatagram.h"
 #include "backends/ReliableDelivery.h"
-#include "platform/Utf8.h"
+#include "platform/core/Utf8.h"
 #include "tests/fuzz/Require.h"
 
 namespace {

@@ -2,7 +2,7 @@
 #include <string>
 
 #include "backends/HTTPSPostBackend.h"
-#include "platform/LogSink.h"
+#include "platform/core/LogSink.h"
 #include "tests/fuzz/Require.h"
 #include "tests/support/TestPlatform.h"
 #include "tests/util/SignedStorebag.h"

@@ -7,7 +7,7 @@
 #include <memory>
 #include <vector>
 
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 #include "tests/platform/Waiting.h"
 #include "tests/support/Threads.h"
 

@@ -22,7 +22,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 
 namespace orvanta::test {
 

@@ -8,7 +8,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 #include "tests/support/ChildProcess.h"
 #include "tests/support/TemporaryDirectory.h"
 

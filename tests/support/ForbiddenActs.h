@@ -15,8 +15,8 @@
 #include <cstring>
 #include <string>
 
-#include "platform/UniqueFd.h"
 #include "platform/UnixAddress.h"
+#include "platform/core/UniqueFd.h"
 
 namespace orvanta::test {
 

@@ -6,7 +6,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/LogSink.h"
+#include "platform/core/LogSink.h"
 
 namespace orvanta::test {
 

@@ -18,7 +18,7 @@
 #include "platform/FrameDecoder.h"
 #include "platform/MessagePack.h"
 #include "platform/SocketIo.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 
 namespace orvanta::test {
 

@@ -18,7 +18,7 @@
 #include <thread>
 #include <vector>
 
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 
 namespace orvanta::test {
 

@@ -8,8 +8,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/UniqueFd.h"
 #include "platform/UnixAddress.h"
+#include "platform/core/UniqueFd.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace orvanta::test {

@@ -3,7 +3,7 @@
 #include <atomic>
 #include <cmath>
 
-#include "platform/Clock.h"
+#include "platform/core/Clock.h"
 
 namespace orvanta::test {
 

@@ -2,8 +2,8 @@
 
 #include <chrono>
 
-#include "platform/Result.h"
-#include "platform/Value.h"
+#include "platform/core/Result.h"
+#include "platform/core/Value.h"
 
 namespace orvanta::collector {
 

@@ -5,7 +5,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 #include "tools/collector/ApiServer.h"
 
 namespace orvanta::collector {

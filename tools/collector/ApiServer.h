@@ -5,7 +5,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/Result.h"
+#include "platform/core/Result.h"
 #include "tools/collector/Behaviours.h"
 #include "tools/collector/DashboardServer.h"
 #include "tools/collector/Exchanges.h"

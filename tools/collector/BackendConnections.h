@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/Result.h"
+#include "platform/core/Result.h"
 #include "tools/collector/HttpMessage.h"
 #include "tools/collector/Transport.h"
 

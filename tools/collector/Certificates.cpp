@@ -17,8 +17,8 @@
 #include <optional>
 #include <utility>
 
-#include "platform/UniqueFd.h"
-#include "platform/WholeFile.h"
+#include "platform/core/UniqueFd.h"
+#include "platform/core/WholeFile.h"
 
 namespace orvanta::collector {
 

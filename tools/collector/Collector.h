@@ -6,8 +6,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/Result.h"
-#include "platform/Value.h"
+#include "platform/core/Result.h"
+#include "platform/core/Value.h"
 #include "tools/collector/AcknowledgementSettings.h"
 #include "tools/collector/Behaviours.h"
 #include "tools/collector/CollectorOptions.h"

@@ -12,8 +12,8 @@
 #include <thread>
 #include <vector>
 
-#include "platform/Result.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/Result.h"
+#include "platform/core/UniqueFd.h"
 #include "tools/collector/AcknowledgementSettings.h"
 #include "tools/collector/Inbox.h"
 

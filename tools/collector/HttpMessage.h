@@ -6,7 +6,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Result.h"
+#include "platform/core/Result.h"
 #include "tools/collector/ReceivedRecords.h"
 
 namespace orvanta::collector {

@@ -10,7 +10,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/Result.h"
+#include "platform/core/Result.h"
 #include "tools/collector/Database.h"
 #include "tools/collector/ReceivedRecords.h"
 

@@ -4,7 +4,7 @@
 #include <optional>
 #include <utility>
 
-#include "platform/WholeFile.h"
+#include "platform/core/WholeFile.h"
 #include "tools/collector/ApiRoutes.h"
 #include "tools/collector/Listings.h"
 

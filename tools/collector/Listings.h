@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 #include "tools/collector/ReceivedRecords.h"
 
 namespace orvanta::collector {

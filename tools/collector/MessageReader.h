@@ -4,7 +4,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/Result.h"
+#include "platform/core/Result.h"
 #include "tools/collector/Transport.h"
 
 namespace orvanta::collector {

@@ -8,7 +8,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace orvanta::collector {
 

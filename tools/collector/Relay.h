@@ -8,8 +8,8 @@
 #include <string>
 #include <thread>
 
-#include "platform/Result.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/Result.h"
+#include "platform/core/UniqueFd.h"
 #include "tools/collector/RelayConnection.h"
 #include "tools/collector/TlsServer.h"
 

@@ -5,8 +5,8 @@
 #include <cstdint>
 #include <string>
 
-#include "platform/Result.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/Result.h"
+#include "platform/core/UniqueFd.h"
 
 namespace orvanta::collector {
 

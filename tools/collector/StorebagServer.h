@@ -7,7 +7,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/Result.h"
+#include "platform/core/Result.h"
 #include "tools/collector/ReceivedRecords.h"
 #include "tools/storebag/StorebagFile.h"
 

@@ -3,7 +3,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/Result.h"
+#include "platform/core/Result.h"
 #include "tools/collector/Certificates.h"
 #include "tools/collector/Transport.h"
 

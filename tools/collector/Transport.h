@@ -6,7 +6,7 @@
 #include <optional>
 #include <string_view>
 
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 
 namespace orvanta::collector {
 

@@ -8,7 +8,7 @@
 
 #include "client/OrvantaConnection.h"
 #include "client/Records.h"
-#include "platform/Result.h"
+#include "platform/core/Result.h"
 
 namespace orvanta::ctl {
 

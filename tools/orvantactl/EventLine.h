@@ -3,7 +3,7 @@
 #include <string_view>
 
 #include "client/Records.h"
-#include "platform/Result.h"
+#include "platform/core/Result.h"
 
 namespace orvanta::ctl {
 

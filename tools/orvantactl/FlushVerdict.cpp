@@ -5,7 +5,7 @@
 #include <utility>
 
 #include "platform/Json.h"
-#include "platform/Value.h"
+#include "platform/core/Value.h"
 
 namespace orvanta::ctl {
 

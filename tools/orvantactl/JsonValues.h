@@ -3,8 +3,8 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Result.h"
-#include "platform/Value.h"
+#include "platform/core/Result.h"
+#include "platform/core/Value.h"
 
 namespace orvanta::ctl {
 

@@ -12,7 +12,7 @@
 #include <string_view>
 
 #include "platform/Json.h"
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 #include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
 #include "tools/orvantactl/EventLine.h"

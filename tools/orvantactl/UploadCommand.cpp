@@ -12,7 +12,7 @@
 #include "interface/WireLimits.h"
 #include "platform/Json.h"
 #include "platform/PropertyList.h"
-#include "platform/WholeFile.h"
+#include "platform/core/WholeFile.h"
 #include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
 #include "tools/orvantactl/ConfiguredSession.h"

@@ -11,7 +11,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 #include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
 #include "tools/orvantactl/EventJson.h"

@@ -17,7 +17,7 @@
 #include <utility>
 
 #include "platform/Digest.h"
-#include "platform/WholeFile.h"
+#include "platform/core/WholeFile.h"
 
 namespace orvanta {
 

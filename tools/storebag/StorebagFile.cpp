@@ -9,7 +9,7 @@
 
 #include "platform/Json.h"
 #include "platform/PropertyList.h"
-#include "platform/WholeFile.h"
+#include "platform/core/WholeFile.h"
 
 namespace orvanta {
 

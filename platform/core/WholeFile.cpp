@@ -1,4 +1,4 @@
-#include "platform/WholeFile.h"
+#include "platform/core/WholeFile.h"
 
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -9,7 +9,7 @@
 #include <cerrno>
 #include <system_error>
 
-#include "platform/UniqueFd.h"
+#include "platform/core/UniqueFd.h"
 
 namespace platform {
 

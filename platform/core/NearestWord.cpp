@@ -1,4 +1,4 @@
-#include "platform/NearestWord.h"
+#include "platform/core/NearestWord.h"
 
 #include <fmt/format.h>
 

@@ -6,7 +6,7 @@
 #include <ctime>
 #include <string>
 
-#include "platform/Result.h"
+#include "platform/core/Result.h"
 
 namespace platform {
 

@@ -4,8 +4,8 @@
 
 #include <fmt/format.h>
 
-#include "platform/PropertyListDate.h"
-#include "platform/Value.h"
+#include "platform/core/PropertyListDate.h"
+#include "platform/core/Value.h"
 
 namespace platform {
 

@@ -1,4 +1,4 @@
-#include "platform/LogSink.h"
+#include "platform/core/LogSink.h"
 
 #include <string>
 

@@ -1,4 +1,4 @@
-#include "platform/FileStamp.h"
+#include "platform/core/FileStamp.h"
 
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -8,8 +8,8 @@
 #include <system_error>
 #include <utility>
 
-#include "platform/UniqueFd.h"
-#include "platform/WholeFile.h"
+#include "platform/core/UniqueFd.h"
+#include "platform/core/WholeFile.h"
 
 namespace platform {
 

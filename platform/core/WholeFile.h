@@ -3,7 +3,7 @@
 #include <cstddef>
 #include <string>
 
-#include "platform/Result.h"
+#include "platform/core/Result.h"
 
 namespace platform {
 

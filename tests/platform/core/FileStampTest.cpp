@@ -1,4 +1,4 @@
-#include "platform/FileStamp.h"
+#include "platform/core/FileStamp.h"
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>

@@ -1,4 +1,4 @@
-#include "platform/PropertyListDate.h"
+#include "platform/core/PropertyListDate.h"
 
 #include <chrono>
 #include <cmath>

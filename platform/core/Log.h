@@ -4,7 +4,7 @@
 
 #include <iterator>
 
-#include "platform/LogSink.h"
+#include "platform/core/LogSink.h"
 
 // Logs one line. The arguments are neither evaluated nor formatted when the level is off.
 #define PLATFORM_LOG(LEVEL, ...)                                          \
