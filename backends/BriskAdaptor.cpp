@@ -4,7 +4,7 @@
 
 #include "interface/OrvantaLogging.h"
 #include "platform/BundleLoader.h"
-#include "platform/MessagePack.h"
+#include "platform/codec/MessagePack.h"
 
 namespace orvanta {
 

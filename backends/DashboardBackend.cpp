@@ -10,7 +10,7 @@
 
 #include "backends/DashboardDatagram.h"
 #include "interface/OrvantaLogging.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 #include "platform/core/Utf8.h"
 #include "util/Conversions.h"
 

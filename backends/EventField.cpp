@@ -3,7 +3,7 @@
 #include <cmath>
 
 #include "interface/OrvantaLogging.h"
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "util/Conversions.h"
 
 namespace orvanta {

@@ -1,7 +1,7 @@
 #include "backends/PostMessage.h"
 
 #include "backends/EventField.h"
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "util/Conversions.h"
 
 namespace orvanta {

@@ -1,7 +1,7 @@
 #include "backends/RecordLayer.h"
 
 #include "backends/EventField.h"
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 
 namespace orvanta {
 

@@ -11,7 +11,7 @@
 
 #include "platform/Connection.h"
 #include "platform/FrameDecoder.h"
-#include "platform/MessagePack.h"
+#include "platform/codec/MessagePack.h"
 
 namespace orvanta::bench {
 

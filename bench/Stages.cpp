@@ -21,7 +21,7 @@
 #include "bench/CallDriver.h"
 #include "bench/RawPeers.h"
 #include "platform/FrameDecoder.h"
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tests/support/TestPlatform.h"
 #include "util/Compression.h"
 

@@ -8,7 +8,7 @@
 #include "interface/WireLimits.h"
 #include "platform/Connection.h"
 #include "platform/FrameDecoder.h"
-#include "platform/MessagePack.h"
+#include "platform/codec/MessagePack.h"
 
 namespace orvanta {
 

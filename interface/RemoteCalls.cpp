@@ -5,7 +5,7 @@
 #include <limits>
 
 #include "interface/OrvantaLogging.h"
-#include "platform/MessagePack.h"
+#include "platform/codec/MessagePack.h"
 
 namespace orvanta {
 

@@ -11,8 +11,8 @@
 
 #include <fmt/format.h>
 
-#include "platform/PropertyList.h"
 #include "platform/SystemFacts.h"
+#include "platform/codec/PropertyList.h"
 #include "platform/core/FileStamp.h"
 #include "platform/core/Log.h"
 #include "platform/core/NearestWord.h"

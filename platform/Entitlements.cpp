@@ -14,8 +14,8 @@
 #include <utility>
 #include <vector>
 
-#include "platform/PropertyList.h"
 #include "platform/WorkQueue.h"
+#include "platform/codec/PropertyList.h"
 #include "platform/core/Log.h"
 #include "platform/core/NearestWord.h"
 

@@ -6,7 +6,7 @@
 
 #include <fmt/format.h>
 
-#include "platform/MessagePackReader.h"
+#include "platform/codec/MessagePackReader.h"
 
 namespace platform {
 

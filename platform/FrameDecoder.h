@@ -8,7 +8,7 @@
 #include <variant>
 #include <vector>
 
-#include "platform/MessagePack.h"
+#include "platform/codec/MessagePack.h"
 #include "platform/core/Value.h"
 
 namespace platform {

@@ -1,5 +1,5 @@
 #include "platform/Connection.h"
-#include "platform/MessagePack.h"
+#include "platform/codec/MessagePack.h"
 
 namespace platform {
 

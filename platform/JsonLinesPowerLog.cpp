@@ -9,7 +9,7 @@
 #include <system_error>
 #include <utility>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "platform/core/Log.h"
 
 namespace platform {

@@ -5,8 +5,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/MessagePack.h"
 #include "platform/WorkQueue.h"
+#include "platform/codec/MessagePack.h"
 #include "platform/core/Log.h"
 
 namespace platform {

@@ -14,8 +14,8 @@
 
 #include "platform/CallFilter.h"
 #include "platform/Landlock.h"
-#include "platform/PropertyList.h"
 #include "platform/SandboxProfile.h"
+#include "platform/codec/PropertyList.h"
 
 namespace platform {
 

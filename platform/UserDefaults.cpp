@@ -11,8 +11,8 @@
 #include <filesystem>
 #include <system_error>
 
-#include "platform/PropertyList.h"
 #include "platform/WorkQueue.h"
+#include "platform/codec/PropertyList.h"
 #include "platform/core/Log.h"
 #include "platform/core/UniqueFd.h"
 

@@ -4,7 +4,7 @@
 
 #include "interface/OrvantaLogging.h"
 #include "platform/Digest.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 
 namespace orvanta {
 

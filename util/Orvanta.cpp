@@ -11,7 +11,7 @@
 #include <vector>
 
 #include "interface/OrvantaLogging.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 #include "platform/core/NearestWord.h"
 #include "platform/core/UniqueFd.h"
 #include "util/UserDefaultKeys.h"

@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "interface/OrvantaLogging.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 #include "util/ClientTypes.h"
 #include "util/DeviceInfo.h"
 #include "util/Environment.h"

@@ -8,7 +8,7 @@
 
 #include "backends/EventField.h"
 #include "backends/PostMessage.h"
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tests/backends/HTTPSFixture.h"
 #include "tests/support/LogCapture.h"
 

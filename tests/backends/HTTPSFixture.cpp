@@ -1,6 +1,6 @@
 #include "tests/backends/HTTPSFixture.h"
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tools/collector/BodyDecoder.h"
 
 namespace orvanta::test {

@@ -7,7 +7,7 @@
 #include <utility>
 
 #include "interface/OrvantaConstants.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 #include "tests/platform/Waiting.h"
 #include "tests/support/SessionFixture.h"
 

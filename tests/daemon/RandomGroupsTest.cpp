@@ -11,7 +11,7 @@
 
 #include "daemon/OrvantadAgent.h"
 #include "interface/OrvantaConstants.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 #include "platform/core/LogSink.h"
 #include "tests/support/TestPlatform.h"
 

@@ -1,4 +1,4 @@
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tests/fuzz/Require.h"
 
 // What can be read is the same when it is written, in either way, and read again; any bytes make a JSON text.

@@ -1,4 +1,4 @@
-#include "platform/MessagePack.h"
+#include "platform/codec/MessagePack.h"
 #include "tests/fuzz/Require.h"
 
 // What can be read is the same when it is written and read again, and takes no more bytes.

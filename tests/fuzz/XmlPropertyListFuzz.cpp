@@ -1,4 +1,4 @@
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 #include "tests/fuzz/Require.h"
 
 // What can be read is the same when it is written and read again.

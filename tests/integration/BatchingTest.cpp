@@ -3,7 +3,7 @@
 #include <map>
 
 #include "backends/OrvantaBackend.h"
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tests/integration/IntegrationFixture.h"
 
 namespace orvanta::test {

@@ -1,6 +1,6 @@
 #include <gtest/gtest.h>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tests/integration/IntegrationFixture.h"
 
 namespace orvanta::test {

@@ -4,7 +4,7 @@
 #include <csignal>
 #include <filesystem>
 
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 #include "tests/integration/IntegrationFixture.h"
 
 namespace orvanta::test {

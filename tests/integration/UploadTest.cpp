@@ -10,7 +10,7 @@
 #include <future>
 #include <thread>
 
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 #include "tests/integration/IntegrationFixture.h"
 #include "tests/integration/RawClient.h"
 #include "tests/support/ForbiddenActs.h"

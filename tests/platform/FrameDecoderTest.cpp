@@ -4,7 +4,7 @@
 #include <limits>
 
 #include "platform/Connection.h"
-#include "tests/platform/CodecRows.h"
+#include "tests/platform/codec/CodecRows.h"
 #include "tests/support/Bytes.h"
 
 namespace platform {

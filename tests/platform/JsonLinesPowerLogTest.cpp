@@ -9,8 +9,8 @@
 #include <set>
 #include <vector>
 
-#include "platform/Json.h"
 #include "platform/LibraryPowerLog.h"
+#include "platform/codec/Json.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/TestClock.h"

@@ -5,7 +5,7 @@
 #include <sys/syscall.h>
 
 #include "platform/Landlock.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 
 namespace platform {
 namespace {

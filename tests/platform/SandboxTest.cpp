@@ -21,7 +21,7 @@
 #include <functional>
 
 #include "platform/Landlock.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 #include "tests/support/ForbiddenActs.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"

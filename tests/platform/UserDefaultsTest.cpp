@@ -9,7 +9,7 @@
 #include <filesystem>
 #include <vector>
 
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 #include "tests/platform/Waiting.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"

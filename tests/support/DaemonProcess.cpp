@@ -9,7 +9,7 @@
 #include <thread>
 
 #include "platform/Connect.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 
 namespace orvanta::test {
 

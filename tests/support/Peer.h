@@ -16,8 +16,8 @@
 
 #include "platform/Connection.h"
 #include "platform/FrameDecoder.h"
-#include "platform/MessagePack.h"
 #include "platform/SocketIo.h"
+#include "platform/codec/MessagePack.h"
 #include "platform/core/UniqueFd.h"
 
 namespace orvanta::test {

@@ -10,7 +10,7 @@
 #include <string>
 #include <utility>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tools/collector/Collector.h"
 #include "tools/collector/Transport.h"

@@ -2,7 +2,7 @@
 
 #include <gmock/gmock.h>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace orvanta::collector {

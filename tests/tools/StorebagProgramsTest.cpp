@@ -3,7 +3,7 @@
 #include <csignal>
 #include <filesystem>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tests/support/ChildProcess.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/TemporaryDirectory.h"

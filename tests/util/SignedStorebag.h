@@ -7,7 +7,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 #include "tests/support/TestPlatform.h"
 #include "tools/storebag/SigningKey.h"
 #include "tools/storebag/StorebagFile.h"

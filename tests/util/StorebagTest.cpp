@@ -2,7 +2,7 @@
 
 #include <gmock/gmock.h>
 
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
 #include "tests/util/SignedStorebag.h"

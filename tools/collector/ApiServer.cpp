@@ -5,7 +5,7 @@
 #include <thread>
 #include <utility>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tools/collector/ApiRoutes.h"
 #include "tools/collector/BackendConnections.h"
 

@@ -1,7 +1,7 @@
 #include <functional>
 #include <utility>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tools/collector/ApiRoutes.h"
 #include "tools/collector/SettingsReader.h"
 

@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <utility>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 
 namespace orvanta::collector {
 

@@ -6,8 +6,8 @@
 #include <utility>
 
 #include "backends/DashboardDatagram.h"
-#include "platform/Json.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/Json.h"
+#include "platform/codec/PropertyList.h"
 
 namespace orvanta::collector {
 

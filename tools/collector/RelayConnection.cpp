@@ -8,7 +8,7 @@
 #include <chrono>
 #include <utility>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tools/collector/BodyDecoder.h"
 
 namespace orvanta::collector {

@@ -6,7 +6,7 @@
 #include <string_view>
 #include <system_error>
 
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 #include "tools/orvantactl/JsonValues.h"
 
 namespace orvanta::ctl {

@@ -2,7 +2,7 @@
 
 #include <fmt/format.h>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tools/orvantactl/JsonValues.h"
 
 namespace orvanta::ctl {

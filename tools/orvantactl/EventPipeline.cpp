@@ -4,7 +4,7 @@
 
 #include <utility>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 
 namespace orvanta::ctl {
 

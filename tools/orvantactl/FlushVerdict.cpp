@@ -4,7 +4,7 @@
 
 #include <utility>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "platform/core/Value.h"
 
 namespace orvanta::ctl {

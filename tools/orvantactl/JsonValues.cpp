@@ -3,8 +3,8 @@
 #include <optional>
 #include <utility>
 
-#include "platform/Json.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/Json.h"
+#include "platform/codec/PropertyList.h"
 
 namespace orvanta::ctl {
 

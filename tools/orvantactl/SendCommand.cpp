@@ -3,7 +3,7 @@
 #include <string>
 #include <utility>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
 #include "tools/orvantactl/ExitStatus.h"

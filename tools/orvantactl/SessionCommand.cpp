@@ -11,7 +11,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "platform/core/UniqueFd.h"
 #include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"

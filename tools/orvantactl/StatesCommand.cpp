@@ -2,7 +2,7 @@
 #include <optional>
 #include <utility>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 #include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
 #include "tools/orvantactl/ConfiguredSession.h"

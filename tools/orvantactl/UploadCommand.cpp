@@ -10,8 +10,8 @@
 #include <vector>
 
 #include "interface/WireLimits.h"
-#include "platform/Json.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/Json.h"
+#include "platform/codec/PropertyList.h"
 #include "platform/core/WholeFile.h"
 #include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"

@@ -7,8 +7,8 @@
 #include <filesystem>
 #include <fstream>
 
-#include "platform/Json.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/Json.h"
+#include "platform/codec/PropertyList.h"
 #include "platform/core/WholeFile.h"
 
 namespace orvanta {

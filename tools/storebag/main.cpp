@@ -7,9 +7,9 @@
 #include <string>
 
 #include "platform/Digest.h"
-#include "platform/Json.h"
 #include "platform/Process.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/Json.h"
+#include "platform/codec/PropertyList.h"
 #include "tools/storebag/StorebagFile.h"
 
 // Makes, checks and prints signed storebags without a server.

@@ -1,4 +1,4 @@
-#include "platform/XmlCharacters.h"
+#include "platform/codec/XmlCharacters.h"
 
 #include "platform/core/Utf8.h"
 

@@ -1,4 +1,4 @@
-#include "platform/MessagePackReader.h"
+#include "platform/codec/MessagePackReader.h"
 
 #include <bit>
 #include <utility>

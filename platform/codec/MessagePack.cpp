@@ -1,4 +1,4 @@
-#include "platform/MessagePack.h"
+#include "platform/codec/MessagePack.h"
 
 #include <bit>
 #include <cmath>
@@ -6,7 +6,7 @@
 
 #include <fmt/format.h>
 
-#include "platform/MessagePackReader.h"
+#include "platform/codec/MessagePackReader.h"
 
 namespace platform {
 

@@ -4,8 +4,8 @@
 #include <limits>
 #include <unordered_map>
 
-#include "platform/BinaryPropertyListFormat.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/BinaryPropertyListFormat.h"
+#include "platform/codec/PropertyList.h"
 #include "platform/core/Utf8.h"
 
 namespace platform {

@@ -1,8 +1,8 @@
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 
 #include <sys/stat.h>
 
-#include "tests/platform/CodecRows.h"
+#include "tests/platform/codec/CodecRows.h"
 #include "tests/support/Bytes.h"
 #include "tests/support/TemporaryDirectory.h"
 

@@ -8,8 +8,8 @@
 #include <fmt/format.h>
 #include <pugixml.hpp>
 
-#include "platform/PropertyList.h"
-#include "platform/XmlCharacters.h"
+#include "platform/codec/PropertyList.h"
+#include "platform/codec/XmlCharacters.h"
 #include "platform/core/PropertyListDate.h"
 #include "platform/core/Utf8.h"
 

@@ -1,7 +1,7 @@
 #include <array>
 #include <cstdint>
 
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 
 namespace platform {
 

@@ -6,8 +6,8 @@
 
 #include <fmt/format.h>
 
-#include "platform/BinaryPropertyListFormat.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/BinaryPropertyListFormat.h"
+#include "platform/codec/PropertyList.h"
 #include "platform/core/Utf8.h"
 
 namespace platform {

@@ -3,8 +3,8 @@
 
 #include <fmt/format.h>
 
-#include "platform/PropertyList.h"
-#include "platform/XmlCharacters.h"
+#include "platform/codec/PropertyList.h"
+#include "platform/codec/XmlCharacters.h"
 #include "platform/core/PropertyListDate.h"
 
 namespace platform {

@@ -1,7 +1,7 @@
 #include <limits>
 
-#include "platform/PropertyList.h"
-#include "tests/platform/CodecRows.h"
+#include "platform/codec/PropertyList.h"
+#include "tests/platform/codec/CodecRows.h"
 #include "tests/support/Bytes.h"
 
 namespace platform {

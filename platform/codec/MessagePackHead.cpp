@@ -1,4 +1,4 @@
-#include "platform/MessagePackHead.h"
+#include "platform/codec/MessagePackHead.h"
 
 #include <array>
 

@@ -7,8 +7,8 @@
 #include <string>
 #include <string_view>
 
-#include "platform/MessagePack.h"
-#include "platform/MessagePackHead.h"
+#include "platform/codec/MessagePack.h"
+#include "platform/codec/MessagePackHead.h"
 #include "platform/core/Value.h"
 
 namespace platform {

@@ -1,11 +1,11 @@
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 
 #include <charconv>
 #include <cmath>
 #include <cstdint>
 #include <cstring>
 
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 
 namespace platform {
 

@@ -11,7 +11,7 @@
 
 #include <fmt/format.h>
 
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 
 namespace platform {
 

@@ -1,9 +1,9 @@
-#include "platform/Json.h"
+#include "platform/codec/Json.h"
 
 #include <cmath>
 #include <limits>
 
-#include "tests/platform/CodecRows.h"
+#include "tests/platform/codec/CodecRows.h"
 
 namespace platform {
 namespace {

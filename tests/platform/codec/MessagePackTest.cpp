@@ -1,9 +1,9 @@
-#include "platform/MessagePack.h"
+#include "platform/codec/MessagePack.h"
 
 #include <cmath>
 #include <limits>
 
-#include "tests/platform/CodecRows.h"
+#include "tests/platform/codec/CodecRows.h"
 #include "tests/support/Bytes.h"
 
 namespace platform {
