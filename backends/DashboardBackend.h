@@ -10,7 +10,7 @@
 #include "backends/OrvantaBackend.h"
 #include "backends/ReliableDelivery.h"
 #include "platform/UdpSocket.h"
-#include "platform/WorkQueue.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace orvanta {
 

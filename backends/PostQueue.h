@@ -8,7 +8,7 @@
 #include "backends/OrvantaBackend.h"
 #include "backends/PendingPosts.h"
 #include "platform/HttpClient.h"
-#include "platform/WorkQueue.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace orvanta {
 

@@ -6,7 +6,7 @@
 #include <future>
 #include <string>
 
-#include "platform/WorkQueue.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace orvanta {
 

@@ -2,7 +2,7 @@
 
 #include <memory>
 
-#include "platform/WorkQueue.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace orvanta {
 

@@ -11,8 +11,8 @@
 #include <vector>
 
 #include "platform/FrameDecoder.h"
-#include "platform/WorkQueue.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace platform {
 

@@ -14,10 +14,10 @@
 #include <utility>
 #include <vector>
 
-#include "platform/WorkQueue.h"
 #include "platform/codec/PropertyList.h"
 #include "platform/core/Log.h"
 #include "platform/core/NearestWord.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace platform {
 

@@ -9,8 +9,8 @@
 #include <utility>
 #include <vector>
 
-#include "platform/WorkQueue.h"
 #include "platform/core/UniqueFunction.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace platform {
 

@@ -5,9 +5,9 @@
 #include <string>
 #include <vector>
 
-#include "platform/WorkQueue.h"
 #include "platform/codec/MessagePack.h"
 #include "platform/core/Log.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace platform {
 

@@ -8,8 +8,8 @@
 #include "platform/Connection.h"
 #include "platform/PeerIdentity.h"
 #include "platform/ServiceSocket.h"
-#include "platform/WorkQueue.h"
 #include "platform/core/Result.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace platform {
 

@@ -11,8 +11,8 @@
 #include "platform/KeepAlive.h"
 #include "platform/PowerLog.h"
 #include "platform/UserDefaults.h"
-#include "platform/WorkQueue.h"
 #include "platform/core/Clock.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace platform {
 

@@ -11,7 +11,7 @@
 #include "platform/ConnectionQuota.h"
 #include "platform/Listener.h"
 #include "platform/ServiceSocket.h"
-#include "platform/WorkQueue.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace platform {
 

@@ -8,8 +8,8 @@
 #include "platform/Connection.h"
 #include "platform/FrameDecoder.h"
 #include "platform/SocketOutbox.h"
-#include "platform/WorkQueue.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace platform {
 

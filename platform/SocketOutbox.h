@@ -12,8 +12,8 @@
 
 #include "platform/Connection.h"
 #include "platform/SocketIo.h"
-#include "platform/WorkQueue.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace platform {
 

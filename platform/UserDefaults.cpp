@@ -11,10 +11,10 @@
 #include <filesystem>
 #include <system_error>
 
-#include "platform/WorkQueue.h"
 #include "platform/codec/PropertyList.h"
 #include "platform/core/Log.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace platform {
 

@@ -2,7 +2,7 @@
 
 #include <mutex>
 
-#include "platform/WorkQueue.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace orvanta {
 

@@ -14,7 +14,7 @@
 #include <vector>
 
 #include "platform/Connection.h"
-#include "platform/WorkQueue.h"
+#include "platform/queue/WorkQueue.h"
 #include "tests/platform/Waiting.h"
 #include "tests/support/Peer.h"
 

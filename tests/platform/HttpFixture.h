@@ -10,7 +10,7 @@
 #include <vector>
 
 #include "platform/HttpClient.h"
-#include "platform/WorkQueue.h"
+#include "platform/queue/WorkQueue.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/RawServer.h"
 

@@ -1,4 +1,4 @@
-#include "platform/WorkQueue.h"
+#include "platform/queue/WorkQueue.h"
 
 #include <gtest/gtest.h>
 #include <sys/socket.h>

@@ -1,4 +1,4 @@
-#include "platform/PoolThreads.h"
+#include "platform/queue/PoolThreads.h"
 
 #include <pthread.h>
 

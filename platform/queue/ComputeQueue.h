@@ -7,9 +7,9 @@
 #include <memory>
 #include <mutex>
 
-#include "platform/JobCount.h"
-#include "platform/PoolThreads.h"
 #include "platform/core/UniqueFunction.h"
+#include "platform/queue/JobCount.h"
+#include "platform/queue/PoolThreads.h"
 
 namespace platform {
 

@@ -1,4 +1,4 @@
-#include "platform/ComputeQueue.h"
+#include "platform/queue/ComputeQueue.h"
 
 #include <gtest/gtest.h>
 #include <unistd.h>
@@ -13,7 +13,7 @@
 #include <thread>
 #include <vector>
 
-#include "platform/WorkQueue.h"
+#include "platform/queue/WorkQueue.h"
 #include "tests/platform/Waiting.h"
 
 namespace platform {

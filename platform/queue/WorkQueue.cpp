@@ -1,4 +1,4 @@
-#include "platform/WorkQueue.h"
+#include "platform/queue/WorkQueue.h"
 
 #include <asio/bind_executor.hpp>
 #include <asio/executor_work_guard.hpp>
@@ -12,9 +12,9 @@
 #include <stdexcept>
 #include <utility>
 
-#include "platform/JobCount.h"
-#include "platform/PoolThreads.h"
 #include "platform/core/Log.h"
+#include "platform/queue/JobCount.h"
+#include "platform/queue/PoolThreads.h"
 
 namespace platform {
 

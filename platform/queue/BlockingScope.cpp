@@ -1,7 +1,7 @@
 #include <utility>
 
-#include "platform/PoolThreads.h"
-#include "platform/WorkQueue.h"
+#include "platform/queue/PoolThreads.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace platform {
 

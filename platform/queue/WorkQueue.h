@@ -4,8 +4,8 @@
 #include <cstddef>
 #include <memory>
 
-#include "platform/ComputeQueue.h"
 #include "platform/core/UniqueFunction.h"
+#include "platform/queue/ComputeQueue.h"
 
 namespace platform {
 

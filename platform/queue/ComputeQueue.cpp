@@ -1,4 +1,4 @@
-#include "platform/ComputeQueue.h"
+#include "platform/queue/ComputeQueue.h"
 
 #include <utility>
 #include <vector>
