@@ -9,9 +9,9 @@
 #include <random>
 #include <stdexcept>
 
-#include "platform/Connection.h"
-#include "platform/FrameDecoder.h"
 #include "platform/codec/MessagePack.h"
+#include "platform/ipc/Connection.h"
+#include "platform/ipc/FrameDecoder.h"
 
 namespace orvanta::bench {
 

@@ -8,7 +8,7 @@
 #include "bench/CallDriver.h"
 #include "bench/RawPeers.h"
 #include "bench/Stages.h"
-#include "platform/FrameDecoder.h"
+#include "platform/ipc/FrameDecoder.h"
 
 namespace orvanta::bench {
 

@@ -18,8 +18,8 @@
 #include "bench/CallDriver.h"
 #include "bench/RawPeers.h"
 #include "bench/Stages.h"
-#include "platform/FrameDecoder.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/ipc/FrameDecoder.h"
 #include "tests/support/TestPlatform.h"
 #include "util/MessageLog.h"
 

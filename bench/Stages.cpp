@@ -20,8 +20,8 @@
 #include "backends/SessionFields.h"
 #include "bench/CallDriver.h"
 #include "bench/RawPeers.h"
-#include "platform/FrameDecoder.h"
 #include "platform/codec/Json.h"
+#include "platform/ipc/FrameDecoder.h"
 #include "tests/support/TestPlatform.h"
 #include "util/Compression.h"
 

@@ -16,8 +16,8 @@
 #include "client/PendingReplies.h"
 #include "client/UploadTokens.h"
 #include "interface/AggregatedEvent.h"
-#include "platform/Connection.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/ipc/Connection.h"
 
 namespace orvanta {
 

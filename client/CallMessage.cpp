@@ -6,9 +6,9 @@
 #include <variant>
 
 #include "interface/WireLimits.h"
-#include "platform/Connection.h"
-#include "platform/FrameDecoder.h"
 #include "platform/codec/MessagePack.h"
+#include "platform/ipc/Connection.h"
+#include "platform/ipc/FrameDecoder.h"
 
 namespace orvanta {
 

@@ -11,8 +11,8 @@
 #include "client/CallChannel.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/WireLimits.h"
-#include "platform/Connect.h"
-#include "platform/Connection.h"
+#include "platform/ipc/Connect.h"
+#include "platform/ipc/Connection.h"
 
 namespace orvanta {
 

@@ -6,7 +6,7 @@
 #include <variant>
 
 #include "interface/ClientSessionInterface.h"
-#include "platform/FrameDecoder.h"
+#include "platform/ipc/FrameDecoder.h"
 
 namespace orvanta {
 

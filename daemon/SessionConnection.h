@@ -4,7 +4,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/Connection.h"
+#include "platform/ipc/Connection.h"
 #include "session/OrvantadSession.h"
 
 namespace orvanta {

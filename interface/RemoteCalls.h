@@ -12,8 +12,8 @@
 #include "interface/AggregatedEvent.h"
 #include "interface/ClientSessionInterface.h"
 #include "interface/ClientSessionReplyInterface.h"
-#include "platform/Connection.h"
-#include "platform/FrameDecoder.h"
+#include "platform/ipc/Connection.h"
+#include "platform/ipc/FrameDecoder.h"
 
 namespace orvanta {
 

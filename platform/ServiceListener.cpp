@@ -7,8 +7,8 @@
 #include <cstring>
 #include <utility>
 
-#include "platform/SocketConnection.h"
 #include "platform/core/Log.h"
+#include "platform/ipc/SocketConnection.h"
 
 namespace platform {
 

@@ -12,10 +12,10 @@
 #include <optional>
 #include <utility>
 
-#include "platform/Connect.h"
 #include "platform/PeerIdentity.h"
-#include "platform/UnixAddress.h"
 #include "platform/core/Log.h"
+#include "platform/ipc/Connect.h"
+#include "platform/ipc/UnixAddress.h"
 
 namespace platform {
 

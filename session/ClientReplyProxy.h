@@ -5,7 +5,7 @@
 #include <string_view>
 
 #include "interface/ClientSessionReplyInterface.h"
-#include "platform/Connection.h"
+#include "platform/ipc/Connection.h"
 
 namespace orvanta {
 

@@ -9,8 +9,8 @@
 #include <string_view>
 
 #include "interface/ClientSessionInterface.h"
-#include "platform/Connection.h"
 #include "platform/Platform.h"
+#include "platform/ipc/Connection.h"
 #include "session/BackendSet.h"
 #include "session/ClientReplyProxy.h"
 #include "session/OrvantadSessionDelegate.h"

@@ -2,7 +2,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/FrameDecoder.h"
+#include "platform/ipc/FrameDecoder.h"
 #include "tests/fuzz/Require.h"
 
 namespace {

@@ -6,8 +6,8 @@
 #include <fstream>
 #include <sstream>
 
-#include "platform/Connect.h"
 #include "platform/UserDefaults.h"
+#include "platform/ipc/Connect.h"
 #include "tests/integration/IntegrationFixture.h"
 #include "tests/platform/Waiting.h"
 #include "tests/support/ServiceManager.h"

@@ -4,7 +4,7 @@
 #include <string>
 #include <utility>
 
-#include "platform/Connect.h"
+#include "platform/ipc/Connect.h"
 #include "tests/support/Peer.h"
 
 namespace orvanta::test {

@@ -16,11 +16,11 @@
 #include <tuple>
 #include <vector>
 
-#include "platform/Connect.h"
 #include "platform/ServiceListener.h"
 #include "platform/ServiceSocket.h"
-#include "platform/UnixAddress.h"
-#include "tests/platform/ConnectionFixture.h"
+#include "platform/ipc/Connect.h"
+#include "platform/ipc/UnixAddress.h"
+#include "tests/platform/ipc/ConnectionFixture.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 

@@ -8,8 +8,8 @@
 #include <stdexcept>
 #include <thread>
 
-#include "platform/Connect.h"
 #include "platform/codec/PropertyList.h"
+#include "platform/ipc/Connect.h"
 
 namespace orvanta::test {
 

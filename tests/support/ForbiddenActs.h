@@ -15,8 +15,8 @@
 #include <cstring>
 #include <string>
 
-#include "platform/UnixAddress.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/ipc/UnixAddress.h"
 
 namespace orvanta::test {
 

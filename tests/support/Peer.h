@@ -14,11 +14,11 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Connection.h"
-#include "platform/FrameDecoder.h"
-#include "platform/SocketIo.h"
 #include "platform/codec/MessagePack.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/ipc/Connection.h"
+#include "platform/ipc/FrameDecoder.h"
+#include "platform/ipc/SocketIo.h"
 
 namespace orvanta::test {
 

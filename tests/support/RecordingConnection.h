@@ -6,7 +6,7 @@
 #include <vector>
 
 #include "interface/RemoteCalls.h"
-#include "platform/Connection.h"
+#include "platform/ipc/Connection.h"
 
 namespace orvanta::test {
 

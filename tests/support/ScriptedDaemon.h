@@ -8,7 +8,7 @@
 #include <utility>
 
 #include "interface/OrvantaConstants.h"
-#include "platform/UnixAddress.h"
+#include "platform/ipc/UnixAddress.h"
 #include "tests/support/Peer.h"
 #include "tests/support/TemporaryDirectory.h"
 

@@ -8,8 +8,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/UnixAddress.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/ipc/UnixAddress.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace orvanta::test {

@@ -10,9 +10,9 @@
 #include <thread>
 #include <vector>
 
-#include "platform/Connection.h"
-#include "platform/SocketIo.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/ipc/Connection.h"
+#include "platform/ipc/SocketIo.h"
 #include "platform/queue/WorkQueue.h"
 
 namespace platform {

@@ -5,10 +5,10 @@
 #include <string>
 #include <vector>
 
-#include "platform/Connection.h"
-#include "platform/FrameDecoder.h"
-#include "platform/SocketOutbox.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/ipc/Connection.h"
+#include "platform/ipc/FrameDecoder.h"
+#include "platform/ipc/SocketOutbox.h"
 #include "platform/queue/WorkQueue.h"
 
 namespace platform {

@@ -1,4 +1,4 @@
-#include "platform/SocketIo.h"
+#include "platform/ipc/SocketIo.h"
 
 #include <poll.h>
 #include <sys/socket.h>

@@ -1,4 +1,4 @@
-#include "platform/Connection.h"
+#include "platform/ipc/Connection.h"
 
 #include <gtest/gtest.h>
 
@@ -6,7 +6,7 @@
 #include <atomic>
 #include <thread>
 
-#include "tests/platform/ConnectionFixture.h"
+#include "tests/platform/ipc/ConnectionFixture.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/Threads.h"
 

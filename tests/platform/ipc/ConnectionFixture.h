@@ -13,7 +13,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Connection.h"
+#include "platform/ipc/Connection.h"
 #include "platform/queue/WorkQueue.h"
 #include "tests/platform/Waiting.h"
 #include "tests/support/Peer.h"

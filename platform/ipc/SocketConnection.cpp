@@ -1,10 +1,10 @@
-#include "platform/SocketConnection.h"
+#include "platform/ipc/SocketConnection.h"
 
 #include <array>
 #include <utility>
 #include <variant>
 
-#include "platform/SocketIo.h"
+#include "platform/ipc/SocketIo.h"
 
 namespace platform {
 

@@ -1,9 +1,9 @@
-#include "platform/FrameDecoder.h"
+#include "platform/ipc/FrameDecoder.h"
 
 #include <algorithm>
 #include <limits>
 
-#include "platform/Connection.h"
+#include "platform/ipc/Connection.h"
 #include "tests/platform/codec/CodecRows.h"
 #include "tests/support/Bytes.h"
 

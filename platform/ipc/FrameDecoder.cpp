@@ -1,4 +1,4 @@
-#include "platform/FrameDecoder.h"
+#include "platform/ipc/FrameDecoder.h"
 
 #include <algorithm>
 #include <limits>

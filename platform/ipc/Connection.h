@@ -10,8 +10,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/FrameDecoder.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/ipc/FrameDecoder.h"
 #include "platform/queue/WorkQueue.h"
 
 namespace platform {

@@ -1,11 +1,11 @@
-#include "platform/Connect.h"
+#include "platform/ipc/Connect.h"
 
 #include <sys/socket.h>
 
 #include <cerrno>
 #include <cstring>
 
-#include "platform/UnixAddress.h"
+#include "platform/ipc/UnixAddress.h"
 
 namespace platform {
 

@@ -6,8 +6,8 @@
 #include <algorithm>
 #include <atomic>
 
-#include "platform/Connection.h"
-#include "tests/platform/ConnectionFixture.h"
+#include "platform/ipc/Connection.h"
+#include "tests/platform/ipc/ConnectionFixture.h"
 
 namespace orvanta::test {
 namespace {

@@ -1,4 +1,4 @@
-#include "platform/SocketOutbox.h"
+#include "platform/ipc/SocketOutbox.h"
 
 #include <fcntl.h>
 #include <sys/socket.h>

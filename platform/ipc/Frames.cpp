@@ -1,5 +1,5 @@
-#include "platform/Connection.h"
 #include "platform/codec/MessagePack.h"
+#include "platform/ipc/Connection.h"
 
 namespace platform {
 
