@@ -7,7 +7,7 @@
 
 #include "backends/OrvantaBackend.h"
 #include "backends/PendingPosts.h"
-#include "platform/HttpClient.h"
+#include "platform/http/HttpClient.h"
 #include "platform/queue/WorkQueue.h"
 
 namespace orvanta {

@@ -7,11 +7,11 @@
 #include <unordered_map>
 
 #include "platform/DeviceProperties.h"
-#include "platform/HttpClient.h"
 #include "platform/KeepAlive.h"
 #include "platform/PowerLog.h"
 #include "platform/UserDefaults.h"
 #include "platform/core/Clock.h"
+#include "platform/http/HttpClient.h"
 #include "platform/queue/WorkQueue.h"
 
 namespace platform {

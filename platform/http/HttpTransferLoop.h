@@ -9,11 +9,11 @@
 #include <unordered_map>
 #include <vector>
 
-#include "platform/CurlTransfer.h"
-#include "platform/HttpClient.h"
-#include "platform/HttpIntake.h"
-#include "platform/HttpLaneQueue.h"
-#include "platform/PendingHttpRequest.h"
+#include "platform/http/CurlTransfer.h"
+#include "platform/http/HttpClient.h"
+#include "platform/http/HttpIntake.h"
+#include "platform/http/HttpLaneQueue.h"
+#include "platform/http/PendingHttpRequest.h"
 
 namespace platform {
 

@@ -1,4 +1,4 @@
-#include "tests/platform/HttpFixture.h"
+#include "tests/platform/http/HttpFixture.h"
 
 namespace platform {
 namespace {

@@ -4,8 +4,8 @@
 #include <atomic>
 #include <cstring>
 
-#include "tests/platform/HttpFixture.h"
 #include "tests/platform/Waiting.h"
+#include "tests/platform/http/HttpFixture.h"
 #include "tests/support/Threads.h"
 
 // A resolver that hangs on one name until it is let go; libcurl's look-ups come through here.

@@ -1,6 +1,6 @@
 #include <fmt/format.h>
 
-#include "tests/platform/HttpFixture.h"
+#include "tests/platform/http/HttpFixture.h"
 
 namespace platform {
 namespace {

@@ -1,4 +1,4 @@
-#include "platform/HttpClient.h"
+#include "platform/http/HttpClient.h"
 
 #include <strings.h>
 

@@ -1,4 +1,4 @@
-#include "platform/HttpHeaderList.h"
+#include "platform/http/HttpHeaderList.h"
 
 #include <strings.h>
 

@@ -1,4 +1,4 @@
-#include "platform/HttpTransferLoop.h"
+#include "platform/http/HttpTransferLoop.h"
 
 #include <fmt/format.h>
 
@@ -7,8 +7,8 @@
 #include <thread>
 #include <utility>
 
-#include "platform/HttpRedirect.h"
 #include "platform/core/Log.h"
+#include "platform/http/HttpRedirect.h"
 
 namespace platform {
 

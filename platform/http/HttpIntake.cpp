@@ -1,10 +1,10 @@
-#include "platform/HttpIntake.h"
+#include "platform/http/HttpIntake.h"
 
 #include <fmt/format.h>
 
 #include <utility>
 
-#include "platform/HttpLaneQueue.h"
+#include "platform/http/HttpLaneQueue.h"
 
 namespace platform {
 

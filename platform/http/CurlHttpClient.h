@@ -7,9 +7,9 @@
 #include <string>
 #include <thread>
 
-#include "platform/HttpClient.h"
-#include "platform/HttpIntake.h"
-#include "platform/HttpTransferLoop.h"
+#include "platform/http/HttpClient.h"
+#include "platform/http/HttpIntake.h"
+#include "platform/http/HttpTransferLoop.h"
 
 namespace platform {
 

@@ -9,8 +9,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/HttpClient.h"
-#include "platform/PendingHttpRequest.h"
+#include "platform/http/HttpClient.h"
+#include "platform/http/PendingHttpRequest.h"
 
 namespace platform {
 

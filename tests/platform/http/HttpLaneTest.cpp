@@ -5,8 +5,8 @@
 #include <mutex>
 #include <thread>
 
-#include "tests/platform/HttpFixture.h"
 #include "tests/platform/Waiting.h"
+#include "tests/platform/http/HttpFixture.h"
 
 namespace platform {
 namespace {

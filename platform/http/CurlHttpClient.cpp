@@ -1,4 +1,4 @@
-#include "platform/CurlHttpClient.h"
+#include "platform/http/CurlHttpClient.h"
 
 #include <curl/curl.h>
 #include <fmt/format.h>
@@ -11,8 +11,8 @@
 #include <system_error>
 #include <utility>
 
-#include "platform/HttpHeaderList.h"
-#include "platform/HttpRedirect.h"
+#include "platform/http/HttpHeaderList.h"
+#include "platform/http/HttpRedirect.h"
 
 namespace platform {
 

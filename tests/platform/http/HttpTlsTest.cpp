@@ -1,4 +1,4 @@
-#include "tests/platform/HttpFixture.h"
+#include "tests/platform/http/HttpFixture.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tools/collector/Certificates.h"
 #include "tools/collector/Collector.h"

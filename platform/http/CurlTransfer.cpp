@@ -1,4 +1,4 @@
-#include "platform/CurlTransfer.h"
+#include "platform/http/CurlTransfer.h"
 
 #include <fmt/format.h>
 

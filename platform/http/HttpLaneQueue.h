@@ -5,8 +5,8 @@
 #include <memory>
 #include <utility>
 
-#include "platform/HttpClient.h"
-#include "platform/PendingHttpRequest.h"
+#include "platform/http/HttpClient.h"
+#include "platform/http/PendingHttpRequest.h"
 
 namespace platform {
 

@@ -1,6 +1,6 @@
-#include "platform/HttpRedirect.h"
+#include "platform/http/HttpRedirect.h"
 
-#include "tests/platform/HttpFixture.h"
+#include "tests/platform/http/HttpFixture.h"
 
 namespace platform {
 namespace {

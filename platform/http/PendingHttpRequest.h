@@ -6,9 +6,9 @@
 #include <memory>
 #include <optional>
 
-#include "platform/CurlTransfer.h"
-#include "platform/HttpClient.h"
-#include "platform/HttpHeaderList.h"
+#include "platform/http/CurlTransfer.h"
+#include "platform/http/HttpClient.h"
+#include "platform/http/HttpHeaderList.h"
 
 namespace platform {
 

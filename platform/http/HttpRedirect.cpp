@@ -1,4 +1,4 @@
-#include "platform/HttpRedirect.h"
+#include "platform/http/HttpRedirect.h"
 
 #include <fmt/format.h>
 #include <strings.h>

@@ -4,7 +4,7 @@
 
 #include <memory>
 
-#include "platform/HttpClient.h"
+#include "platform/http/HttpClient.h"
 
 namespace platform {
 

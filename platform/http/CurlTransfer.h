@@ -8,8 +8,8 @@
 #include <string>
 #include <string_view>
 
-#include "platform/HttpClient.h"
-#include "platform/HttpHeaderList.h"
+#include "platform/http/HttpClient.h"
+#include "platform/http/HttpHeaderList.h"
 
 namespace platform {
 

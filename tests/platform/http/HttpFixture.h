@@ -9,7 +9,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/HttpClient.h"
+#include "platform/http/HttpClient.h"
 #include "platform/queue/WorkQueue.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/RawServer.h"
