@@ -5,7 +5,7 @@
 #include <string>
 
 #include "platform/Platform.h"
-#include "platform/Sandbox.h"
+#include "platform/sandbox/Sandbox.h"
 
 namespace orvanta {
 

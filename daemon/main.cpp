@@ -11,8 +11,8 @@
 #include "platform/Listener.h"
 #include "platform/MemoryUse.h"
 #include "platform/Process.h"
-#include "platform/Sandbox.h"
 #include "platform/ServiceSocket.h"
+#include "platform/sandbox/Sandbox.h"
 
 int main() {
   using namespace orvanta;

@@ -1,11 +1,11 @@
-#include "platform/SandboxProfile.h"
+#include "platform/sandbox/SandboxProfile.h"
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/syscall.h>
 
-#include "platform/Landlock.h"
 #include "platform/codec/PropertyList.h"
+#include "platform/sandbox/Landlock.h"
 
 namespace platform {
 namespace {

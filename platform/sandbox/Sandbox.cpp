@@ -1,4 +1,4 @@
-#include "platform/Sandbox.h"
+#include "platform/sandbox/Sandbox.h"
 
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -12,10 +12,10 @@
 #include <utility>
 #include <vector>
 
-#include "platform/CallFilter.h"
-#include "platform/Landlock.h"
-#include "platform/SandboxProfile.h"
 #include "platform/codec/PropertyList.h"
+#include "platform/sandbox/CallFilter.h"
+#include "platform/sandbox/Landlock.h"
+#include "platform/sandbox/SandboxProfile.h"
 
 namespace platform {
 

@@ -5,9 +5,9 @@
 #include <string>
 #include <utility>
 
-#include "platform/RefusedCalls.h"
-#include "platform/SandboxCalls.h"
 #include "platform/core/Result.h"
+#include "platform/sandbox/RefusedCalls.h"
+#include "platform/sandbox/SandboxCalls.h"
 
 namespace platform {
 

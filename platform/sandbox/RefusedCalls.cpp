@@ -1,4 +1,4 @@
-#include "platform/RefusedCalls.h"
+#include "platform/sandbox/RefusedCalls.h"
 
 #include <linux/seccomp.h>
 #include <poll.h>
@@ -20,8 +20,8 @@
 #include <system_error>
 #include <vector>
 
-#include "platform/CallFilter.h"
 #include "platform/core/Log.h"
+#include "platform/sandbox/CallFilter.h"
 
 namespace platform {
 

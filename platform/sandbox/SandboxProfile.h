@@ -7,10 +7,10 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Landlock.h"
-#include "platform/SandboxCalls.h"
 #include "platform/core/Result.h"
 #include "platform/core/Value.h"
+#include "platform/sandbox/Landlock.h"
+#include "platform/sandbox/SandboxCalls.h"
 
 namespace platform {
 

@@ -5,9 +5,9 @@
 #include <thread>
 #include <vector>
 
-#include "platform/SandboxCalls.h"
 #include "platform/core/Result.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/sandbox/SandboxCalls.h"
 
 namespace platform {
 

@@ -1,4 +1,4 @@
-#include "platform/Landlock.h"
+#include "platform/sandbox/Landlock.h"
 
 #include <linux/landlock.h>
 #include <sys/stat.h>

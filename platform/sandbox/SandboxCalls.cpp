@@ -1,4 +1,4 @@
-#include "platform/SandboxCalls.h"
+#include "platform/sandbox/SandboxCalls.h"
 
 #include <fcntl.h>
 #include <fmt/format.h>

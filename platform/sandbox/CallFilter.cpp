@@ -1,4 +1,4 @@
-#include "platform/CallFilter.h"
+#include "platform/sandbox/CallFilter.h"
 
 #include <fmt/format.h>
 #include <seccomp.h>

@@ -1,4 +1,4 @@
-#include "platform/Sandbox.h"
+#include "platform/sandbox/Sandbox.h"
 
 #include <dirent.h>
 #include <dlfcn.h>
@@ -20,8 +20,8 @@
 #include <filesystem>
 #include <functional>
 
-#include "platform/Landlock.h"
 #include "platform/codec/PropertyList.h"
+#include "platform/sandbox/Landlock.h"
 #include "tests/support/ForbiddenActs.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"

@@ -2,8 +2,8 @@
 
 #include <cstddef>
 
-#include "platform/SandboxCalls.h"
 #include "platform/core/Result.h"
+#include "platform/sandbox/SandboxCalls.h"
 
 namespace platform {
 

@@ -1,12 +1,12 @@
-#include "platform/SandboxProfile.h"
+#include "platform/sandbox/SandboxProfile.h"
 
 #include <fmt/format.h>
 
 #include <algorithm>
 #include <utility>
 
-#include "platform/Landlock.h"
 #include "platform/core/NearestWord.h"
+#include "platform/sandbox/Landlock.h"
 
 namespace platform {
 
