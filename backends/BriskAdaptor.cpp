@@ -15,7 +15,9 @@ constexpr const char* kBundle = "/Tamberline.bundle/Bundles/HQXPerformance.bundl
 // The plug-in's class; null, with the reason in the log, when there is none to be had.
 const OrvantaPluginClass* findAdaptorClass(platform::Platform& platform) {
   const std::string directory = platform.files().plugInsDirectory + kBundle;
-  const platform::LoadedBundle* loaded = platform::BundleLoader::of(platform).load(directory);
+  const platform::LoadedBundle* loaded =
+      platform.once<std::unique_ptr<platform::BundleLoader>>([] { return std::make_unique<platform::BundleLoader>(); })
+          ->load(directory);
   if (loaded == nullptr) return nullptr;
   const auto* bundle = static_cast<const OrvantaPluginBundle*>(loaded->symbol(ORVANTA_PLUGIN_SYMBOL));
   if (bundle == nullptr) {

@@ -37,6 +37,12 @@ std::unique_ptr<platform::Platform> makeDaemonPlatform(platform::FileLocations f
   return std::make_unique<platform::Platform>(std::move(parts));
 }
 
+platform::Entitlements& entitlementsOf(platform::Platform& platform) {
+  return *platform.once<std::unique_ptr<platform::Entitlements>>([&platform] {
+    return std::make_unique<platform::Entitlements>(platform.files().configurationDirectory + "/entitlements.d");
+  });
+}
+
 std::map<std::string, std::string> sandboxVariables(const platform::FileLocations& files) {
   std::string caDirectory;
   if (!files.caFile.empty()) {

@@ -4,6 +4,7 @@
 #include <memory>
 #include <string>
 
+#include "platform/Entitlements.h"
 #include "platform/Platform.h"
 #include "platform/sandbox/Sandbox.h"
 
@@ -11,6 +12,9 @@ namespace orvanta {
 
 // The Linux device that orvantad runs on. Starts no thread but the HTTP client's; the pool is started by main.
 std::unique_ptr<platform::Platform> makeDaemonPlatform(platform::FileLocations files);
+
+// Who may connect: entitlements.d of the configuration directory, one object per platform.
+platform::Entitlements& entitlementsOf(platform::Platform& platform);
 
 // What the sandbox profile's ${NAME} places stand for.
 std::map<std::string, std::string> sandboxVariables(const platform::FileLocations& files);

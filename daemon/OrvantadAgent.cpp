@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <chrono>
 
+#include "daemon/DaemonPlatform.h"
 #include "daemon/SessionConnection.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
@@ -25,7 +26,7 @@ OrvantadAgent::OrvantadAgent(platform::Platform& platform)
 
 OrvantadAgent::OrvantadAgent(platform::Platform& platform, StorebagCache::Fetch fetch)
     : _platform(platform),
-      _entitlements(platform::Entitlements::of(platform)),
+      _entitlements(entitlementsOf(platform)),
       _status(platform.pool()),
       _storebags(platform.clock(), std::move(fetch)) {}
 

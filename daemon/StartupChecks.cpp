@@ -1,8 +1,8 @@
 #include "daemon/StartupChecks.h"
 
+#include "daemon/DaemonPlatform.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
-#include "platform/Entitlements.h"
 #include "platform/core/NearestWord.h"
 #include "util/Orvanta.h"
 #include "util/UserDefaultKeys.h"
@@ -39,7 +39,7 @@ void warnOfUselessConfiguration(platform::Platform& platform) {
     ORVANTA_LOG(warning, "main: The framework bundle has no usable verification key, no storebag will be accepted: {}",
                 key.error());
   }
-  if (!platform::Entitlements::of(platform).isHeldByAnybody(kOrvantaEntitlement)) {
+  if (!entitlementsOf(platform).isHeldByAnybody(kOrvantaEntitlement)) {
     ORVANTA_LOG(warning,
                 "main: The entitlement {} is granted to nobody in {}/entitlements.d, no client will be admitted",
                 kOrvantaEntitlement, platform.files().configurationDirectory);

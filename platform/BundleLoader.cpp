@@ -13,10 +13,6 @@ const void* LoadedBundle::symbol(const char* name) const {
   return ::dlsym(_library, name);
 }
 
-BundleLoader& BundleLoader::of(Platform& platform) {
-  return *platform.once<std::unique_ptr<BundleLoader>>([] { return std::make_unique<BundleLoader>(); });
-}
-
 const LoadedBundle* BundleLoader::load(const std::string& bundleDirectory) {
   const std::lock_guard lock(_mutex);
   auto& slot = _loaded[bundleDirectory];

@@ -5,8 +5,6 @@
 #include <mutex>
 #include <string>
 
-#include "platform/Platform.h"
-
 namespace platform {
 
 // The code of a plug-in bundle, loaded into the process for good: a plug-in may have threads and handlers of its own,
@@ -21,11 +19,9 @@ class LoadedBundle {
   void* _library;
 };
 
-// Loads plug-in bundles, each once per platform. A bundle is a directory NAME.bundle that holds NAME.so. Thread-safe.
+// Loads plug-in bundles, each once per loader. A bundle is a directory NAME.bundle that holds NAME.so. Thread-safe.
 class BundleLoader {
  public:
-  static BundleLoader& of(Platform& platform);
-
   // The bundle, loaded now unless it was before; null when it cannot be, with the linker's reason in the log. What
   // failed is tried again by the next call, so that a bundle installed later is found.
   const LoadedBundle* load(const std::string& bundleDirectory);

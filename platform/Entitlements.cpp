@@ -127,12 +127,6 @@ std::vector<std::string> grantFiles(const std::string& directory) {
 
 }  // namespace
 
-Entitlements& Entitlements::of(Platform& platform) {
-  return *platform.once<std::unique_ptr<Entitlements>>([&platform] {
-    return std::make_unique<Entitlements>(platform.files().configurationDirectory + "/entitlements.d");
-  });
-}
-
 bool Entitlements::holds(const PeerIdentity& peer, std::string_view entitlement) {
   return isGranted(&peer, entitlement);
 }

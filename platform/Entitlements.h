@@ -6,7 +6,6 @@
 #include <string_view>
 
 #include "platform/PeerIdentity.h"
-#include "platform/Platform.h"
 #include "platform/core/Value.h"
 
 namespace platform {
@@ -17,8 +16,6 @@ namespace platform {
 // changes. Thread-safe.
 class Entitlements {
  public:
-  // The device's, one per platform: entitlements.d of the configuration directory.
-  static Entitlements& of(Platform& platform);
   explicit Entitlements(std::string directory) : _directory(std::move(directory)) {}
 
   // True when any grant that matches the peer gives `entitlement` a value that reads as true.
