@@ -12,7 +12,7 @@ namespace orvanta {
 namespace {
 
 struct Arguments {
-  platform::Platform& platform;
+  Platform& platform;
   const std::string& name;
   const SharedDictionary& profile;
   const std::string& productFamily;
@@ -30,7 +30,7 @@ std::shared_ptr<OrvantaBackend> createBrisk(const Arguments& arguments) {
 }
 
 // Desktop devices have no diagnostics adaptor.
-bool supportsBrisk(platform::Platform& platform) {
+bool supportsBrisk(Platform& platform) {
   return platform.device().productType() != "Deskora";
 }
 
@@ -38,7 +38,7 @@ struct BackendClass {
   std::string_view name;
   // Null where the device does not support the class.
   std::shared_ptr<OrvantaBackend> (*create)(const Arguments& arguments);
-  bool (*isSupported)(platform::Platform& platform) = nullptr;  // null: everywhere
+  bool (*isSupported)(Platform& platform) = nullptr;  // null: everywhere
 };
 
 constexpr BackendClass kBackendClasses[] = {
@@ -49,7 +49,7 @@ constexpr BackendClass kBackendClasses[] = {
 
 }  // namespace
 
-std::shared_ptr<OrvantaBackend> newBackendWithName(platform::Platform& platform, const std::string& name,
+std::shared_ptr<OrvantaBackend> newBackendWithName(Platform& platform, const std::string& name,
                                                    const SharedDictionary& profile, const std::string& productFamily,
                                                    std::int32_t clientType) {
   for (const BackendClass& row : kBackendClasses) {

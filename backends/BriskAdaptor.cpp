@@ -13,7 +13,7 @@ namespace {
 constexpr const char* kBundle = "/Tamberline.bundle/Bundles/HQXPerformance.bundle";
 
 // The plug-in's class; null, with the reason in the log, when there is none to be had.
-const OrvantaPluginClass* findAdaptorClass(platform::Platform& platform) {
+const OrvantaPluginClass* findAdaptorClass(Platform& platform) {
   const std::string directory = platform.files().plugInsDirectory + kBundle;
   const platform::LoadedBundle* loaded =
       platform.once<std::unique_ptr<platform::BundleLoader>>([] { return std::make_unique<platform::BundleLoader>(); })
@@ -45,7 +45,7 @@ OrvantaPluginOperation findForwardingOperation(const OrvantaPluginClass& adaptor
 
 }  // namespace
 
-std::unique_ptr<BriskAdaptor> BriskAdaptor::create(platform::Platform& platform) {
+std::unique_ptr<BriskAdaptor> BriskAdaptor::create(Platform& platform) {
   const platform::BlockingScope blocking;  // what a plug-in does takes as long as it likes, here and below
   const OrvantaPluginClass* adaptorClass = findAdaptorClass(platform);
   if (adaptorClass == nullptr) return nullptr;

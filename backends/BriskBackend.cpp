@@ -6,9 +6,8 @@
 
 namespace orvanta {
 
-std::shared_ptr<BriskBackend> BriskBackend::create(platform::Platform& platform, std::string name,
-                                                   SharedDictionary profile, std::string productFamily,
-                                                   std::int32_t clientType) {
+std::shared_ptr<BriskBackend> BriskBackend::create(Platform& platform, std::string name, SharedDictionary profile,
+                                                   std::string productFamily, std::int32_t clientType) {
   auto backend =
       std::make_shared<BriskBackend>(Made{}, platform, std::move(name), std::move(profile), std::move(productFamily));
   ORVANTA_LOG(info, "BriskBackend(initWithName): Loading Brisk adaptor class for client type {}", clientType);
@@ -20,12 +19,12 @@ std::shared_ptr<BriskBackend> BriskBackend::create(platform::Platform& platform,
   return backend;
 }
 
-std::shared_ptr<BriskBackend> BriskBackend::create(platform::Platform& platform, std::string name,
-                                                   SharedDictionary profile, std::string productFamily) {
+std::shared_ptr<BriskBackend> BriskBackend::create(Platform& platform, std::string name, SharedDictionary profile,
+                                                   std::string productFamily) {
   return create(platform, std::move(name), std::move(profile), std::move(productFamily), 0);
 }
 
-BriskBackend::BriskBackend(Made, platform::Platform& platform, std::string name, SharedDictionary profile,
+BriskBackend::BriskBackend(Made, Platform& platform, std::string name, SharedDictionary profile,
                            std::string productFamily)
     : OrvantaBackend(platform, std::move(name), std::move(profile), std::move(productFamily)) {}
 

@@ -16,13 +16,12 @@ class BriskBackend final : public OrvantaBackend {
 
  public:
   // Null, with a log line, for client types that have no adaptor.
-  static std::shared_ptr<BriskBackend> create(platform::Platform& platform, std::string name, SharedDictionary profile,
+  static std::shared_ptr<BriskBackend> create(Platform& platform, std::string name, SharedDictionary profile,
                                               std::string productFamily, std::int32_t clientType);
   // Client type 0: always null.
-  static std::shared_ptr<BriskBackend> create(platform::Platform& platform, std::string name, SharedDictionary profile,
+  static std::shared_ptr<BriskBackend> create(Platform& platform, std::string name, SharedDictionary profile,
                                               std::string productFamily);
-  BriskBackend(Made, platform::Platform& platform, std::string name, SharedDictionary profile,
-               std::string productFamily);
+  BriskBackend(Made, Platform& platform, std::string name, SharedDictionary profile, std::string productFamily);
 
   static bool isClientTypeAllowed(std::int32_t clientType);
 

@@ -9,10 +9,10 @@
 #include <utility>
 
 #include "backends/DashboardDatagram.h"
+#include "config/Conversions.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/codec/PropertyList.h"
 #include "platform/core/Utf8.h"
-#include "util/Conversions.h"
 
 namespace orvanta {
 
@@ -58,7 +58,7 @@ platform::Result<std::vector<std::uint8_t>> archive(const SharedArray& logData) 
 // Counts the datagrams handed to network queues and not yet sent. One per platform. Thread-safe.
 class DashboardBackend::HandOver {
  public:
-  static HandOver& of(platform::Platform& platform) {
+  static HandOver& of(Platform& platform) {
     return *platform.once<std::unique_ptr<HandOver>>([] { return std::make_unique<HandOver>(); });
   }
   void begin() {
@@ -82,7 +82,7 @@ class DashboardBackend::HandOver {
 
 // --- Set-up ---
 
-std::shared_ptr<DashboardBackend> DashboardBackend::create(platform::Platform& platform, std::string name,
+std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, std::string name,
                                                            SharedDictionary profile, std::string productFamily) {
   const Value* ip = valueAt(profile, "ip");
   const Value* port = valueAt(profile, "port");
@@ -92,14 +92,14 @@ std::shared_ptr<DashboardBackend> DashboardBackend::create(platform::Platform& p
                 port == nullptr ? std::uint16_t{0} : portOf(*port), std::move(productFamily));
 }
 
-std::shared_ptr<DashboardBackend> DashboardBackend::create(platform::Platform& platform, std::string name,
+std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, std::string name,
                                                            std::optional<std::string> serverIP,
                                                            std::uint16_t serverPort, std::string productFamily) {
   if (!serverIP) return nullptr;
   return create(platform, std::move(name), nullptr, std::move(serverIP), serverPort, std::move(productFamily));
 }
 
-std::shared_ptr<DashboardBackend> DashboardBackend::create(platform::Platform& platform, std::string name,
+std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, std::string name,
                                                            SharedDictionary profile,
                                                            std::optional<std::string> serverIP,
                                                            std::uint16_t serverPort, std::string productFamily) {
@@ -128,7 +128,7 @@ std::shared_ptr<DashboardBackend> DashboardBackend::create(platform::Platform& p
   return backend;
 }
 
-DashboardBackend::DashboardBackend(Made, platform::Platform& platform, std::string name, SharedDictionary profile,
+DashboardBackend::DashboardBackend(Made, Platform& platform, std::string name, SharedDictionary profile,
                                    std::string productFamily, platform::UdpSocket socket)
     : OrvantaBackend(platform, std::move(name), std::move(profile), std::move(productFamily)),
       _handOver(HandOver::of(platform)),
@@ -264,7 +264,7 @@ void DashboardBackend::cleanup() {
   });
 }
 
-bool DashboardBackend::waitUntilSent(platform::Platform& platform, milliseconds patience) {
+bool DashboardBackend::waitUntilSent(Platform& platform, milliseconds patience) {
   return HandOver::of(platform).waitForNone(patience);
 }
 

@@ -28,17 +28,17 @@ class DashboardBackend final : public OrvantaBackend {
 
  public:
   // With a profile: its "ip" and "port" name the server. Null when something is missing or fails, with a log line.
-  static std::shared_ptr<DashboardBackend> create(platform::Platform& platform, std::string name,
-                                                  SharedDictionary profile, std::string productFamily);
+  static std::shared_ptr<DashboardBackend> create(Platform& platform, std::string name, SharedDictionary profile,
+                                                  std::string productFamily);
   // The server address counts only without a profile; delivery is then acknowledged.
-  static std::shared_ptr<DashboardBackend> create(platform::Platform& platform, std::string name,
-                                                  SharedDictionary profile, std::optional<std::string> serverIP,
-                                                  std::uint16_t serverPort, std::string productFamily);
-  static std::shared_ptr<DashboardBackend> create(platform::Platform& platform, std::string name,
+  static std::shared_ptr<DashboardBackend> create(Platform& platform, std::string name, SharedDictionary profile,
                                                   std::optional<std::string> serverIP, std::uint16_t serverPort,
                                                   std::string productFamily);
-  DashboardBackend(Made, platform::Platform& platform, std::string name, SharedDictionary profile,
-                   std::string productFamily, platform::UdpSocket socket);
+  static std::shared_ptr<DashboardBackend> create(Platform& platform, std::string name,
+                                                  std::optional<std::string> serverIP, std::uint16_t serverPort,
+                                                  std::string productFamily);
+  DashboardBackend(Made, Platform& platform, std::string name, SharedDictionary profile, std::string productFamily,
+                   platform::UdpSocket socket);
   ~DashboardBackend() override;
 
   // The local log line, before the datagram has gone out; none when it is no text. `flag` does not matter.
@@ -56,7 +56,7 @@ class DashboardBackend final : public OrvantaBackend {
 
   // Waits until every datagram handed to a network queue of this platform has had its first transmission, at most
   // `patience`. For tests. Not from a job of the pool.
-  static bool waitUntilSent(platform::Platform& platform, std::chrono::milliseconds patience);
+  static bool waitUntilSent(Platform& platform, std::chrono::milliseconds patience);
 
   static constexpr std::chrono::milliseconds kDefaultPeriod{500};
   static constexpr std::chrono::milliseconds kLongestPeriod{86'400'000};

@@ -6,8 +6,8 @@
 #include <cstring>
 #include <iterator>
 
+#include "config/ClientTypes.h"
 #include "platform/core/Utf8.h"
-#include "util/ClientTypes.h"
 
 namespace orvanta {
 

@@ -2,9 +2,9 @@
 
 #include <cmath>
 
+#include "config/Conversions.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/codec/Json.h"
-#include "util/Conversions.h"
 
 namespace orvanta {
 namespace {

@@ -3,14 +3,14 @@
 #include <fmt/format.h>
 
 #include "backends/ClientSection.h"
+#include "config/Conversions.h"
+#include "config/DeviceInfo.h"
+#include "config/Environment.h"
+#include "config/Orvanta.h"
+#include "config/Storebag.h"
+#include "config/UserDefaultKeys.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
-#include "util/Conversions.h"
-#include "util/DeviceInfo.h"
-#include "util/Environment.h"
-#include "util/Orvanta.h"
-#include "util/Storebag.h"
-#include "util/UserDefaultKeys.h"
 
 namespace orvanta {
 namespace {
@@ -33,14 +33,14 @@ void completeWithError(FlushCompletion& completion, const char* description) {
   if (completion) completion(std::nullopt, makeOrvantaError(description, kLocalFailure));
 }
 
-bool forcesEventLogging(platform::Platform& platform) {
+bool forcesEventLogging(Platform& platform) {
   const auto text = userDefaultStringForKey(platform, kForceEventLoggingKey);
   return text && platform::Value(*text).boolValue();
 }
 
 }  // namespace
 
-std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::create(platform::Platform& platform, std::string name,
+std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::create(Platform& platform, std::string name,
                                                            SharedDictionary profile, std::string productFamily) {
   if (!profile || productFamily.empty()) return nullptr;
   if (clientSections(*profile) == nullptr) {
@@ -51,7 +51,7 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::create(platform::Platform& p
       new HTTPSPostBackend(platform, std::move(name), std::move(profile), std::move(productFamily)));
 }
 
-HTTPSPostBackend::HTTPSPostBackend(platform::Platform& platform, std::string name, SharedDictionary profile,
+HTTPSPostBackend::HTTPSPostBackend(Platform& platform, std::string name, SharedDictionary profile,
                                    std::string productFamily)
     : OrvantaBackend(platform, std::move(name), std::move(profile), std::move(productFamily)),
       _dnuEnabled(platform.device().diagnosticsSubmissionAllowed()),

@@ -30,8 +30,8 @@ namespace orvanta {
 class HTTPSPostBackend final : public OrvantaBackend {
  public:
   // Null when there is no profile, no product family or (logged) no client list in the profile.
-  static std::shared_ptr<HTTPSPostBackend> create(platform::Platform& platform, std::string name,
-                                                  SharedDictionary profile, std::string productFamily);
+  static std::shared_ptr<HTTPSPostBackend> create(Platform& platform, std::string name, SharedDictionary profile,
+                                                  std::string productFamily);
 
   void updateState() override;
   using OrvantaBackend::sendMessage;
@@ -51,7 +51,7 @@ class HTTPSPostBackend final : public OrvantaBackend {
   static constexpr std::size_t kMaximumBatchBytes = 16U << 20U;
 
  private:
-  HTTPSPostBackend(platform::Platform& platform, std::string name, SharedDictionary profile, std::string productFamily);
+  HTTPSPostBackend(Platform& platform, std::string name, SharedDictionary profile, std::string productFamily);
 
   // HTTPSPostConfiguration.cpp
   std::int32_t updateBackendState();

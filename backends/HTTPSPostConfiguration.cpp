@@ -2,9 +2,9 @@
 
 #include "backends/ClientSection.h"
 #include "backends/HTTPSPostBackend.h"
+#include "config/DeviceInfo.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
-#include "util/DeviceInfo.h"
 
 namespace orvanta {
 namespace {

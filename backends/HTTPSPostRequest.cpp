@@ -3,8 +3,8 @@
 #include <fmt/format.h>
 
 #include "backends/HTTPSPostBackend.h"
+#include "config/ClientTypes.h"
 #include "interface/OrvantaConstants.h"
-#include "util/ClientTypes.h"
 
 namespace orvanta {
 

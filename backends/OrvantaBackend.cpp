@@ -7,8 +7,8 @@
 #include <cstdlib>
 #include <span>
 
+#include "config/Conversions.h"
 #include "platform/Digest.h"
-#include "util/Conversions.h"
 
 namespace orvanta {
 namespace {
@@ -26,7 +26,7 @@ bool holdsCategory(const std::vector<std::int32_t>& list, std::uint16_t category
 
 }  // namespace
 
-OrvantaBackend::OrvantaBackend(platform::Platform& platform, std::string name, SharedDictionary profile,
+OrvantaBackend::OrvantaBackend(Platform& platform, std::string name, SharedDictionary profile,
                                std::string productFamily)
     : _platform(platform),
       _name(std::move(name)),

@@ -10,12 +10,12 @@
 #include <string_view>
 #include <vector>
 
+#include "config/DeviceInfo.h"
+#include "config/Platform.h"
 #include "interface/OrvantaError.h"
-#include "platform/Platform.h"
 #include "platform/core/Clock.h"
 #include "platform/core/UniqueFunction.h"
 #include "platform/core/Value.h"
-#include "util/DeviceInfo.h"
 
 namespace orvanta {
 
@@ -58,7 +58,7 @@ using FlushCompletion = platform::UniqueFunction<void(std::optional<std::string>
 class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
  public:
   // Draws the sampling factor: one draw per backend constructed, from the process's drand48 sequence.
-  OrvantaBackend(platform::Platform& platform, std::string name, SharedDictionary profile, std::string productFamily);
+  OrvantaBackend(Platform& platform, std::string name, SharedDictionary profile, std::string productFamily);
   virtual ~OrvantaBackend();
   OrvantaBackend(const OrvantaBackend&) = delete;
   OrvantaBackend& operator=(const OrvantaBackend&) = delete;
@@ -133,7 +133,7 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
   static std::string convertIntoSHA256(std::string_view text);
 
  protected:
-  platform::Platform& platform() const { return _platform; }
+  Platform& platform() const { return _platform; }
   const SharedDictionary& profile() const { return _profile; }
   void setDisplayURL(std::optional<std::string> url) { _displayURL = std::move(url); }
   void setEventWhitelist(std::optional<std::vector<std::int32_t>> list) { _eventWhitelist = std::move(list); }
@@ -143,7 +143,7 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
   std::mutex& mutex() const { return _mutex; }
 
  private:
-  platform::Platform& _platform;
+  Platform& _platform;
   // Constant after construction (the identity and sampling factor: after set-up).
   const std::string _name;
   const SharedDictionary _profile;

@@ -6,7 +6,7 @@
 
 namespace orvanta {
 
-std::shared_ptr<PendingPosts> PendingPosts::of(platform::Platform& platform) {
+std::shared_ptr<PendingPosts> PendingPosts::of(Platform& platform) {
   struct Holder {
     std::shared_ptr<PendingPosts> posts;
   };

@@ -6,7 +6,7 @@
 #include <memory>
 #include <mutex>
 
-#include "platform/Platform.h"
+#include "config/Platform.h"
 
 namespace orvanta {
 
@@ -21,7 +21,7 @@ class PendingPosts {
   static constexpr std::size_t kMaximumTotalBytes = 64U << 20U;
   static constexpr std::size_t kMaximumWaiters = 16;
 
-  static std::shared_ptr<PendingPosts> of(platform::Platform& platform);
+  static std::shared_ptr<PendingPosts> of(Platform& platform);
 
   // One queue's share. Shared by the queue and its posts.
   struct QueueShare {

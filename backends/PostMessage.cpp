@@ -1,8 +1,8 @@
 #include "backends/PostMessage.h"
 
 #include "backends/EventField.h"
+#include "config/Conversions.h"
 #include "platform/codec/Json.h"
-#include "util/Conversions.h"
 
 namespace orvanta {
 namespace {

@@ -4,9 +4,9 @@
 
 #include <utility>
 
+#include "config/Compression.h"
+#include "config/Platform.h"
 #include "interface/OrvantaLogging.h"
-#include "platform/Platform.h"
-#include "util/Compression.h"
 
 namespace orvanta {
 namespace {
@@ -68,7 +68,7 @@ class PostQueue::Outcome {
   std::shared_ptr<OrvantaBackend> _kept;
 };
 
-PostQueue::PostQueue(platform::Platform& platform, std::weak_ptr<OrvantaBackend> backend, std::string backendName)
+PostQueue::PostQueue(Platform& platform, std::weak_ptr<OrvantaBackend> backend, std::string backendName)
     : _http(platform.http()),
       _pendingPosts(PendingPosts::of(platform)),
       _backend(std::move(backend)),

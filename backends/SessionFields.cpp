@@ -1,8 +1,8 @@
 #include "backends/SessionFields.h"
 
 #include "backends/EventField.h"
-#include "util/ClientTypes.h"
-#include "util/Conversions.h"
+#include "config/ClientTypes.h"
+#include "config/Conversions.h"
 
 namespace orvanta {
 namespace {

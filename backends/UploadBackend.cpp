@@ -4,9 +4,9 @@
 
 #include "backends/UploadBudget.h"
 #include "backends/UploadURL.h"
+#include "config/Compression.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/core/Utf8.h"
-#include "util/Compression.h"
 
 namespace orvanta {
 
@@ -44,8 +44,8 @@ std::optional<std::string> compressedContent(const platform::ExtensionHandle& ha
 
 }  // namespace
 
-std::shared_ptr<UploadBackend> UploadBackend::create(platform::Platform& platform, std::string name,
-                                                     SharedDictionary profile, std::string productFamily) {
+std::shared_ptr<UploadBackend> UploadBackend::create(Platform& platform, std::string name, SharedDictionary profile,
+                                                     std::string productFamily) {
   std::optional<std::string> url = textAt(profile, "post_url");
   if (!url) {
     ORVANTA_LOG(error, "UploadBackend(initWithName): can't resolve upload post URL.");
@@ -57,7 +57,7 @@ std::shared_ptr<UploadBackend> UploadBackend::create(platform::Platform& platfor
   return backend;
 }
 
-UploadBackend::UploadBackend(Made, platform::Platform& platform, std::string name, SharedDictionary profile,
+UploadBackend::UploadBackend(Made, Platform& platform, std::string name, SharedDictionary profile,
                              std::string productFamily)
     : OrvantaBackend(platform, std::move(name), std::move(profile), std::move(productFamily)) {
   setDisplayURL(textAt(this->profile(), "display_url"));

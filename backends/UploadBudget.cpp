@@ -4,7 +4,7 @@
 
 namespace orvanta {
 
-UploadBudget& UploadBudget::of(platform::Platform& platform) {
+UploadBudget& UploadBudget::of(Platform& platform) {
   return *platform.once<std::unique_ptr<UploadBudget>>([] { return std::make_unique<UploadBudget>(); });
 }
 

@@ -5,8 +5,8 @@
 #include <memory>
 #include <mutex>
 
+#include "config/Platform.h"
 #include "interface/WireLimits.h"
-#include "platform/Platform.h"
 
 namespace orvanta {
 
@@ -22,7 +22,7 @@ class UploadBudget {
   static constexpr std::uint64_t kCopies = 3;
   static constexpr std::uint64_t kMaximumTotalBytes = kCopies * kMaximumFileBytes + (64U << 20U);
 
-  static UploadBudget& of(platform::Platform& platform);
+  static UploadBudget& of(Platform& platform);
 
   // Holds `bytes`, at most kMaximumTotalBytes, while it lives.
   class Share {

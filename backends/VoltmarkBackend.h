@@ -13,8 +13,8 @@ namespace orvanta {
 class VoltmarkBackend final : public OrvantaBackend {
  public:
   using OrvantaBackend::OrvantaBackend;
-  static std::shared_ptr<VoltmarkBackend> create(platform::Platform& platform, std::string name,
-                                                 SharedDictionary profile, std::string productFamily) {
+  static std::shared_ptr<VoltmarkBackend> create(Platform& platform, std::string name, SharedDictionary profile,
+                                                 std::string productFamily) {
     return std::make_shared<VoltmarkBackend>(platform, std::move(name), std::move(profile), std::move(productFamily));
   }
 

@@ -18,10 +18,10 @@
 #include "bench/CallDriver.h"
 #include "bench/RawPeers.h"
 #include "bench/Stages.h"
+#include "config/MessageLog.h"
 #include "platform/core/UniqueFd.h"
 #include "platform/ipc/FrameDecoder.h"
 #include "tests/support/TestPlatform.h"
-#include "util/MessageLog.h"
 
 // The dashboard path with its message-log line, and that line alone.
 

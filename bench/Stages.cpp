@@ -20,10 +20,10 @@
 #include "backends/SessionFields.h"
 #include "bench/CallDriver.h"
 #include "bench/RawPeers.h"
+#include "config/Compression.h"
 #include "platform/codec/Json.h"
 #include "platform/ipc/FrameDecoder.h"
 #include "tests/support/TestPlatform.h"
-#include "util/Compression.h"
 
 namespace orvanta::bench {
 

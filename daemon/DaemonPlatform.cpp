@@ -17,8 +17,8 @@ namespace {
 constexpr std::size_t kPoolThreads = 1;
 }  // namespace
 
-std::unique_ptr<platform::Platform> makeDaemonPlatform(platform::FileLocations files) {
-  platform::Platform::Parts parts;
+std::unique_ptr<Platform> makeDaemonPlatform(FileLocations files) {
+  Platform::Parts parts;
   parts.clock = std::make_unique<platform::SystemClock>();
   parts.device =
       std::make_unique<platform::LinuxDeviceProperties>(files.configurationDirectory, std::string(kOrvantaServiceName));
@@ -34,16 +34,16 @@ std::unique_ptr<platform::Platform> makeDaemonPlatform(platform::FileLocations f
         std::make_unique<platform::JsonLinesPowerLog>(files.stateDirectory + "/powerlog.jsonl", *parts.clock);
   }
   parts.files = std::move(files);
-  return std::make_unique<platform::Platform>(std::move(parts));
+  return std::make_unique<Platform>(std::move(parts));
 }
 
-platform::Entitlements& entitlementsOf(platform::Platform& platform) {
+platform::Entitlements& entitlementsOf(Platform& platform) {
   return *platform.once<std::unique_ptr<platform::Entitlements>>([&platform] {
     return std::make_unique<platform::Entitlements>(platform.files().configurationDirectory + "/entitlements.d");
   });
 }
 
-std::map<std::string, std::string> sandboxVariables(const platform::FileLocations& files) {
+std::map<std::string, std::string> sandboxVariables(const FileLocations& files) {
   std::string caDirectory;
   if (!files.caFile.empty()) {
     // The directory that holds the file itself: a link may point elsewhere.
@@ -59,7 +59,7 @@ std::map<std::string, std::string> sandboxVariables(const platform::FileLocation
           {"ORVANTA_CA_DIRECTORY", caDirectory}};
 }
 
-std::unique_ptr<platform::Sandbox> enterDaemonSandbox(const platform::FileLocations& files) {
+std::unique_ptr<platform::Sandbox> enterDaemonSandbox(const FileLocations& files) {
   const char* setting = std::getenv("ORVANTA_SANDBOX");
   if (setting != nullptr && std::string_view(setting) == "off") {
     ORVANTA_LOG(warning, "main: ORVANTA_SANDBOX is off: the daemon runs without its sandbox");

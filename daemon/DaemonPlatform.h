@@ -4,23 +4,23 @@
 #include <memory>
 #include <string>
 
+#include "config/Platform.h"
 #include "platform/Entitlements.h"
-#include "platform/Platform.h"
 #include "platform/sandbox/Sandbox.h"
 
 namespace orvanta {
 
 // The Linux device that orvantad runs on. Starts no thread but the HTTP client's; the pool is started by main.
-std::unique_ptr<platform::Platform> makeDaemonPlatform(platform::FileLocations files);
+std::unique_ptr<Platform> makeDaemonPlatform(FileLocations files);
 
 // Who may connect: entitlements.d of the configuration directory, one object per platform.
-platform::Entitlements& entitlementsOf(platform::Platform& platform);
+platform::Entitlements& entitlementsOf(Platform& platform);
 
 // What the sandbox profile's ${NAME} places stand for.
-std::map<std::string, std::string> sandboxVariables(const platform::FileLocations& files);
+std::map<std::string, std::string> sandboxVariables(const FileLocations& files);
 
 // Enters the service's sandbox, or says why not and returns null. ORVANTA_SANDBOX=off stays outside, with a warning.
-std::unique_ptr<platform::Sandbox> enterDaemonSandbox(const platform::FileLocations& files);
+std::unique_ptr<platform::Sandbox> enterDaemonSandbox(const FileLocations& files);
 // What the sandbox does once the daemon has its socket: from then on nobody listens anywhere else. Before the first
 // thread, so that it holds for all. False, with the reason in the log, when it cannot.
 bool closeDaemonSandbox(platform::Sandbox& sandbox);

@@ -11,13 +11,13 @@ namespace orvanta {
 namespace {
 
 // Calls that wait for a server or for memory get their errors, now and from now on.
-void endWaiting(platform::Platform& platform) {
+void endWaiting(Platform& platform) {
   platform.http().abortBlockingRequests();
   UploadBudget::of(platform).close();
   PendingPosts::of(platform)->stopWaiting();
 }
 
-void finishDeliveries(platform::Platform& platform) {
+void finishDeliveries(Platform& platform) {
   using std::chrono::milliseconds;
   // Datagrams and posts are jobs by now; then they are requests in flight.
   platform.pool().drain(milliseconds(2000));
@@ -27,7 +27,7 @@ void finishDeliveries(platform::Platform& platform) {
 
 }  // namespace
 
-bool endService(platform::Listener& listener, platform::Platform& platform, OrvantadAgent& agent) {
+bool endService(platform::Listener& listener, Platform& platform, OrvantadAgent& agent) {
   const bool nobodyAtTheDoor = listener.stop();
   if (!nobodyAtTheDoor) ORVANTA_LOG(error, "main: A connection is still being admitted and is left behind");
   endWaiting(platform);

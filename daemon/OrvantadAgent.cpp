@@ -19,12 +19,12 @@ constexpr std::chrono::seconds kEndOfSessions{8};
 constexpr std::size_t kLargeGroup = 64;
 }  // namespace
 
-OrvantadAgent::OrvantadAgent(platform::Platform& platform)
+OrvantadAgent::OrvantadAgent(Platform& platform)
     : OrvantadAgent(platform, [&platform](std::int32_t clientType, StorebagFetch& fetch) {
         return fetchStorebagForEnvironmentAndClientType(platform, clientType, fetch);
       }) {}
 
-OrvantadAgent::OrvantadAgent(platform::Platform& platform, StorebagCache::Fetch fetch)
+OrvantadAgent::OrvantadAgent(Platform& platform, StorebagCache::Fetch fetch)
     : _platform(platform),
       _entitlements(entitlementsOf(platform)),
       _status(platform.pool()),

@@ -5,12 +5,12 @@
 #include <mutex>
 #include <vector>
 
+#include "config/Platform.h"
 #include "daemon/SessionCountStatus.h"
 #include "daemon/SessionRegistry.h"
 #include "daemon/StorebagCache.h"
 #include "platform/Entitlements.h"
 #include "platform/Listener.h"
-#include "platform/Platform.h"
 #include "session/OrvantadSession.h"
 #include "session/OrvantadSessionDelegate.h"
 
@@ -25,9 +25,9 @@ class SessionConnection;
 // delegate operations from any session's queue. The session list's lock and the agent's lock are never held together.
 class OrvantadAgent final : public OrvantadSessionDelegate {
  public:
-  explicit OrvantadAgent(platform::Platform& platform);
+  explicit OrvantadAgent(Platform& platform);
   // `fetch` stands for the storebag server.
-  OrvantadAgent(platform::Platform& platform, StorebagCache::Fetch fetch);
+  OrvantadAgent(Platform& platform, StorebagCache::Fetch fetch);
 
   // The listener's handler: whether the peer was admitted. Only peers that hold the entitlement are.
   bool listenerShouldAcceptNewConnection(platform::OfferedConnection&& offered);
@@ -65,7 +65,7 @@ class OrvantadAgent final : public OrvantadSessionDelegate {
 
   void releaseMemoryWhenIdle();  // with _sessionListLock held
 
-  platform::Platform& _platform;
+  Platform& _platform;
   platform::Entitlements& _entitlements;
   SessionCountStatus _status;
 

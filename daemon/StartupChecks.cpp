@@ -1,17 +1,17 @@
 #include "daemon/StartupChecks.h"
 
+#include "config/Orvanta.h"
+#include "config/UserDefaultKeys.h"
 #include "daemon/DaemonPlatform.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/core/NearestWord.h"
-#include "util/Orvanta.h"
-#include "util/UserDefaultKeys.h"
 
 namespace orvanta {
 
 namespace {
 
-void warnOfUnknownUserDefaults(platform::Platform& platform) {
+void warnOfUnknownUserDefaults(Platform& platform) {
   static constexpr std::string_view kKeys[] = {kStorebagURLKey,     kEnvironmentTypeKey,   kPostURLKey,
                                                kRealtimePostURLKey, kForceEventLoggingKey, kRespectConsentKey,
                                                kOverrideConsentKey};
@@ -27,7 +27,7 @@ void warnOfUnknownUserDefaults(platform::Platform& platform) {
 
 }  // namespace
 
-void warnOfUselessConfiguration(platform::Platform& platform) {
+void warnOfUselessConfiguration(Platform& platform) {
   // Whoever reads a file logs the keys in it that nothing reads: the device and the framework read theirs here.
   platform.device().productVersion();
   warnOfUnknownUserDefaults(platform);

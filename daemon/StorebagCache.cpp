@@ -2,8 +2,8 @@
 
 #include <cmath>
 
+#include "config/ClientTypes.h"
 #include "interface/OrvantaLogging.h"
-#include "util/ClientTypes.h"
 
 namespace orvanta {
 

@@ -6,9 +6,9 @@
 #include <optional>
 #include <string>
 
+#include "config/Storebag.h"
 #include "platform/core/Clock.h"
 #include "platform/core/Value.h"
-#include "util/Storebag.h"
 
 namespace orvanta {
 

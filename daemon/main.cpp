@@ -21,7 +21,7 @@ int main() {
   platform::enterUtilitySchedulingClass();
   platform::tuneAllocator();
   OrvantaLogging::startLogging("orvantad", "Daemon");
-  const auto files = platform::FileLocations::fromEnvironment();
+  const auto files = FileLocations::fromEnvironment();
   auto sandbox = enterDaemonSandbox(files);
   if (!sandbox) return -1;
 

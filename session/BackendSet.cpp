@@ -1,14 +1,14 @@
 #include "session/BackendSet.h"
 
 #include "backends/BackendFactory.h"
+#include "config/Orvanta.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
 #include "session/SessionInfoRecord.h"
-#include "util/Orvanta.h"
 
 namespace orvanta {
 
-std::optional<BackendSet> createBackends(platform::Platform& platform, const SharedDictionary& storebag,
+std::optional<BackendSet> createBackends(Platform& platform, const SharedDictionary& storebag,
                                          const SharedDictionary& sessionInfo, const SharedDictionary& userInfo,
                                          const DeviceIDBuffer& deviceID) {
   if (!storebag) {

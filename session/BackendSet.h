@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "backends/OrvantaBackend.h"
-#include "util/DeviceInfo.h"
+#include "config/DeviceInfo.h"
 
 namespace orvanta {
 
@@ -37,7 +37,7 @@ class BackendSet {
 
 // Makes a backend of each entry of the storebag and fills it with the session's and the device's facts. None, with a
 // log line, without a storebag or session info; entries that yield no backend are skipped. On the session's queue.
-std::optional<BackendSet> createBackends(platform::Platform& platform, const SharedDictionary& storebag,
+std::optional<BackendSet> createBackends(Platform& platform, const SharedDictionary& storebag,
                                          const SharedDictionary& sessionInfo, const SharedDictionary& userInfo,
                                          const DeviceIDBuffer& deviceID);
 

@@ -2,8 +2,8 @@
 
 #include <fmt/format.h>
 
+#include "config/MessageLog.h"
 #include "interface/OrvantaLogging.h"
-#include "util/MessageLog.h"
 
 namespace orvanta {
 
@@ -14,7 +14,7 @@ struct FlushLock {
 };
 }  // namespace
 
-FlushRequest::FlushRequest(platform::Platform& platform, std::int32_t backendCount, FlushReply completion)
+FlushRequest::FlushRequest(Platform& platform, std::int32_t backendCount, FlushReply completion)
     : _platform(platform),
       _lock(platform.once<FlushLock>([] { return FlushLock{}; }).mutex),
       _pending(backendCount),

@@ -18,7 +18,7 @@ namespace orvanta {
 // Shared by the completions of the backends, which may run on any thread. Keeps no session alive.
 class FlushRequest : public std::enable_shared_from_this<FlushRequest> {
  public:
-  FlushRequest(platform::Platform& platform, std::int32_t backendCount, FlushReply completion);
+  FlushRequest(Platform& platform, std::int32_t backendCount, FlushReply completion);
 
   // The completion for one backend; `key` is its name in the session's set.
   FlushCompletion completionFor(std::string key, std::string backendName);
@@ -27,7 +27,7 @@ class FlushRequest : public std::enable_shared_from_this<FlushRequest> {
   void finished(const std::string& key, const std::string& backendName, std::optional<std::string> result,
                 std::optional<OrvantaError> error);
 
-  platform::Platform& _platform;
+  Platform& _platform;
   const std::shared_ptr<std::mutex> _lock;  // one for all flushes of the platform
   std::int32_t _pending;                    // guarded by _lock
   FlushReply _completion;                   // guarded by _lock; empty once called

@@ -8,13 +8,12 @@
 
 namespace orvanta {
 
-std::shared_ptr<OrvantadSession> OrvantadSession::create(platform::Platform& platform,
-                                                         OrvantadSessionDelegate& delegate,
+std::shared_ptr<OrvantadSession> OrvantadSession::create(Platform& platform, OrvantadSessionDelegate& delegate,
                                                          std::shared_ptr<platform::Connection> connection) {
   return std::shared_ptr<OrvantadSession>(new OrvantadSession(platform, delegate, std::move(connection)));
 }
 
-OrvantadSession::OrvantadSession(platform::Platform& platform, OrvantadSessionDelegate& delegate,
+OrvantadSession::OrvantadSession(Platform& platform, OrvantadSessionDelegate& delegate,
                                  std::shared_ptr<platform::Connection> connection)
     : _platform(platform),
       _delegate(delegate),

@@ -8,14 +8,14 @@
 #include <string>
 #include <string_view>
 
+#include "config/DeviceInfo.h"
+#include "config/Platform.h"
 #include "interface/ClientSessionInterface.h"
-#include "platform/Platform.h"
 #include "platform/ipc/Connection.h"
 #include "session/BackendSet.h"
 #include "session/ClientReplyProxy.h"
 #include "session/OrvantadSessionDelegate.h"
 #include "session/SessionInfoRecord.h"
-#include "util/DeviceInfo.h"
 
 namespace orvanta {
 
@@ -28,7 +28,7 @@ namespace orvanta {
 class OrvantadSession final : public ClientSessionInterface, public std::enable_shared_from_this<OrvantadSession> {
  public:
   // `connection` may be null for a session without a client (tests): nothing is then handed back to one.
-  static std::shared_ptr<OrvantadSession> create(platform::Platform& platform, OrvantadSessionDelegate& delegate,
+  static std::shared_ptr<OrvantadSession> create(Platform& platform, OrvantadSessionDelegate& delegate,
                                                  std::shared_ptr<platform::Connection> connection);
   ~OrvantadSession() override;
 
@@ -90,7 +90,7 @@ class OrvantadSession final : public ClientSessionInterface, public std::enable_
     std::int32_t flag = 0;
   };
 
-  OrvantadSession(platform::Platform& platform, OrvantadSessionDelegate& delegate,
+  OrvantadSession(Platform& platform, OrvantadSessionDelegate& delegate,
                   std::shared_ptr<platform::Connection> connection);
 
   // Setup.
@@ -111,7 +111,7 @@ class OrvantadSession final : public ClientSessionInterface, public std::enable_
   std::optional<std::string> dispatch(const Message& message);
   std::optional<std::string> send(std::uint16_t category, std::uint16_t type, SharedDictionary payload);
   void internalSendMessage(SharedDictionary payload, std::uint16_t method, std::uint16_t respCode);
-  static void sendSingleMessage(platform::Platform& platform, const SharedDictionary& sessionInfo,
+  static void sendSingleMessage(Platform& platform, const SharedDictionary& sessionInfo,
                                 const SharedDictionary& userInfo, const SharedDictionary& storebag,
                                 const Message& message);
 
@@ -121,7 +121,7 @@ class OrvantadSession final : public ClientSessionInterface, public std::enable_
   void internalFlushMessagesWithCompletion(FlushReply completion);
 
   // Constant after construction.
-  platform::Platform& _platform;
+  Platform& _platform;
   OrvantadSessionDelegate& _delegate;
   const std::shared_ptr<platform::Connection> _connection;
   const std::unique_ptr<ClientReplyProxy> _client;  // used under _aggregationLock; null without a connection

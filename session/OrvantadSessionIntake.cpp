@@ -1,9 +1,9 @@
 #include <fmt/format.h>
 
+#include "config/Conversions.h"
+#include "config/MessageLog.h"
 #include "interface/OrvantaLogging.h"
 #include "session/OrvantadSession.h"
-#include "util/Conversions.h"
-#include "util/MessageLog.h"
 
 // Events on their way in: the checks, the dispatch to the backends, and the one-off send.
 
@@ -129,7 +129,7 @@ void OrvantadSession::sendMessageWithSessionInfo(SharedDictionary sessionInfo, S
   reply("finished");
 }
 
-void OrvantadSession::sendSingleMessage(platform::Platform& platform, const SharedDictionary& sessionInfo,
+void OrvantadSession::sendSingleMessage(Platform& platform, const SharedDictionary& sessionInfo,
                                         const SharedDictionary& userInfo, const SharedDictionary& storebag,
                                         const Message& message) {
   const Value* sessionID = sessionInfo ? sessionInfo->find(kOrvantaSessionInfoSessionID) : nullptr;

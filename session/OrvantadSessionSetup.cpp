@@ -1,8 +1,8 @@
 #include <fmt/format.h>
 
+#include "config/Orvanta.h"
 #include "interface/OrvantaLogging.h"
 #include "session/OrvantadSession.h"
-#include "util/Orvanta.h"
 
 // Configuration: the session's records, its backends, user info, and what follows the parent in a hierarchy.
 

@@ -1,9 +1,9 @@
 #include <fmt/format.h>
 
+#include "config/MessageLog.h"
 #include "interface/FileURL.h"
 #include "interface/OrvantaLogging.h"
 #include "session/OrvantadSession.h"
-#include "util/MessageLog.h"
 
 // Uploads of a client's file and of its log data: every backend is asked, one that takes it is enough.
 

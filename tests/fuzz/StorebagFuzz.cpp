@@ -2,11 +2,11 @@
 #include <string>
 
 #include "backends/HTTPSPostBackend.h"
+#include "config/Storebag.h"
 #include "platform/core/LogSink.h"
+#include "tests/config/SignedStorebag.h"
 #include "tests/fuzz/Require.h"
 #include "tests/support/TestPlatform.h"
-#include "tests/util/SignedStorebag.h"
-#include "util/Storebag.h"
 
 namespace {
 
@@ -32,7 +32,7 @@ struct World {
   std::string document;
 };
 
-void evaluate(platform::Platform& platform, const platform::Value& profile) {
+void evaluate(Platform& platform, const platform::Value& profile) {
   if (profile.dictionary() == nullptr) return;
   const auto backend = HTTPSPostBackend::create(
       platform, "http_post", std::make_shared<const platform::Dictionary>(*profile.dictionary()), "Parva");

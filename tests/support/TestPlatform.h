@@ -10,7 +10,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Platform.h"
+#include "config/Platform.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/TestClock.h"
 
@@ -137,14 +137,14 @@ class TestPlatform {
  public:
   explicit TestPlatform(std::size_t threads = 2) : _platform(make(threads)) {}
 
-  platform::Platform& get() { return *_platform; }
-  operator platform::Platform&() { return *_platform; }  // NOLINT(google-explicit-constructor): stands for the platform
+  Platform& get() { return *_platform; }
+  operator Platform&() { return *_platform; }  // NOLINT(google-explicit-constructor): stands for the platform
 
   TemporaryDirectory directory;
 
  private:
-  std::unique_ptr<platform::Platform> make(std::size_t threads) const {
-    platform::Platform::Parts parts;
+  std::unique_ptr<Platform> make(std::size_t threads) const {
+    Platform::Parts parts;
     parts.files.runtimeDirectory = directory / "run";
     parts.files.stateDirectory = directory / "state";
     parts.files.configurationDirectory = directory / "etc";
@@ -160,9 +160,9 @@ class TestPlatform {
     parts.pool->start();
     parts.http = std::make_unique<ScriptedHttpClient>();
     parts.powerLog = std::make_unique<RecordedPowerLog>();
-    return std::make_unique<platform::Platform>(std::move(parts));
+    return std::make_unique<Platform>(std::move(parts));
   }
-  std::unique_ptr<platform::Platform> _platform;
+  std::unique_ptr<Platform> _platform;
 
  public:
   // Parts of the platform.

@@ -4,8 +4,8 @@
 
 #include <filesystem>
 
+#include "config/Compression.h"
 #include "tests/tools/CollectorFixture.h"
-#include "util/Compression.h"
 
 namespace orvanta::collector {
 namespace {

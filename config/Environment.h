@@ -4,7 +4,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/Platform.h"
+#include "config/Platform.h"
 
 namespace orvanta {
 
@@ -14,6 +14,6 @@ enum class EnvironmentType : std::uint32_t { none = 0, development = 1, internal
 // The section's name in a storebag; null for `none`.
 const char* environmentSectionName(EnvironmentType type);
 // Decided once per platform: the user default "environmentType", else by isInternalBuild. Thread-safe.
-EnvironmentType currentEnvironmentType(platform::Platform& platform);
+EnvironmentType currentEnvironmentType(Platform& platform);
 
 }  // namespace orvanta

@@ -1,4 +1,4 @@
-#include "util/MessageLog.h"
+#include "config/MessageLog.h"
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
@@ -10,10 +10,10 @@
 #include <fstream>
 #include <set>
 
+#include "config/MessageLogDirectory.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
 #include "tests/support/Threads.h"
-#include "util/MessageLogDirectory.h"
 
 namespace orvanta {
 namespace {

@@ -1,4 +1,4 @@
-#include "util/Storebag.h"
+#include "config/Storebag.h"
 
 #include <algorithm>
 #include <chrono>
@@ -7,13 +7,13 @@
 #include <utility>
 #include <vector>
 
+#include "config/ClientTypes.h"
+#include "config/DeviceInfo.h"
+#include "config/Environment.h"
+#include "config/Orvanta.h"
+#include "config/UserDefaultKeys.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/codec/PropertyList.h"
-#include "util/ClientTypes.h"
-#include "util/DeviceInfo.h"
-#include "util/Environment.h"
-#include "util/Orvanta.h"
-#include "util/UserDefaultKeys.h"
 
 namespace orvanta {
 
@@ -74,7 +74,7 @@ std::optional<std::vector<std::uint8_t>> decodedMember(const Dictionary& documen
 }
 
 // The inner bag of a downloaded document, once its signature has been verified; null for anything else.
-SharedDictionary openDocument(platform::Platform& platform, std::string_view body) {
+SharedDictionary openDocument(Platform& platform, std::string_view body) {
   const platform::BlockingScope blocking;  // a document of megabytes takes a while
   const auto document = platform::parsePropertyList(bytesOf(body));
   if (!document) ORVANTA_LOG(error, "fetchStorebagWithName: propertyListWithData error {}", document.error());
@@ -100,11 +100,11 @@ SharedDictionary openDocument(platform::Platform& platform, std::string_view bod
 
 }  // namespace
 
-std::optional<std::string> userDefaultStringForKey(platform::Platform& platform, std::string_view key) {
+std::optional<std::string> userDefaultStringForKey(Platform& platform, std::string_view key) {
   return platform.defaults().text(key);
 }
 
-const std::string& storebagServerURL(platform::Platform& platform) {
+const std::string& storebagServerURL(Platform& platform) {
   return platform
       .once<StorebagServer>([&] {
         auto url = userDefaultStringForKey(platform, kStorebagURLKey);
@@ -137,7 +137,7 @@ std::int32_t maxAgeFromCacheControl(std::optional<std::string_view> cacheControl
   }
 }
 
-SharedDictionary fetchStorebagWithName(platform::Platform& platform, const std::string& name, StorebagFetch& fetch) {
+SharedDictionary fetchStorebagWithName(Platform& platform, const std::string& name, StorebagFetch& fetch) {
   platform::HttpRequest request;
   request.url = storebagServerURL(platform) + "/" + name + "?version=" + Orvanta::of(platform).bundleVersion();
   request.timeout = kRequestTimeout;
@@ -174,7 +174,7 @@ SharedDictionary fetchStorebagWithName(platform::Platform& platform, const std::
   return openDocument(platform, response.body);
 }
 
-SharedDictionary fetchStorebagForEnvironmentAndClientType(platform::Platform& platform, std::int32_t clientType,
+SharedDictionary fetchStorebagForEnvironmentAndClientType(Platform& platform, std::int32_t clientType,
                                                           StorebagFetch& fetch) {
   const auto name = storebagNameForClientType(clientType);
   if (!name) {

@@ -1,8 +1,8 @@
-#include "util/Environment.h"
+#include "config/Environment.h"
 
+#include "config/DeviceInfo.h"
+#include "config/UserDefaultKeys.h"
 #include "interface/OrvantaLogging.h"
-#include "util/DeviceInfo.h"
-#include "util/UserDefaultKeys.h"
 
 namespace orvanta {
 
@@ -14,7 +14,7 @@ struct Environment {
   EnvironmentType type;
 };
 
-EnvironmentType userDefaultsEnvironment(platform::Platform& platform) {
+EnvironmentType userDefaultsEnvironment(Platform& platform) {
   EnvironmentType type = EnvironmentType::none;
   if (const auto setting = platform.defaults().value(kEnvironmentTypeKey)) {
     const std::int64_t number = setting->integerValue();
@@ -51,7 +51,7 @@ const char* environmentSectionName(EnvironmentType type) {
   return nullptr;
 }
 
-EnvironmentType currentEnvironmentType(platform::Platform& platform) {
+EnvironmentType currentEnvironmentType(Platform& platform) {
   return platform.once<Environment>([&] { return Environment{userDefaultsEnvironment(platform)}; }).type;
 }
 

@@ -1,4 +1,4 @@
-#include "util/MessageLog.h"
+#include "config/MessageLog.h"
 
 #include <unistd.h>
 
@@ -8,8 +8,8 @@
 #include <utility>
 #include <vector>
 
+#include "config/MessageLogDirectory.h"
 #include "interface/OrvantaLogging.h"
-#include "util/MessageLogDirectory.h"
 
 namespace orvanta {
 
@@ -74,7 +74,7 @@ bool appendLine(const platform::UniqueFd& file, double now, std::string_view mes
 
 }  // namespace
 
-void writeToLogFile(platform::Platform& platform, std::string_view message) {
+void writeToLogFile(Platform& platform, std::string_view message) {
   std::optional<platform::BlockingScope> large;
   if (message.size() > kLargeMessage) large.emplace();
   const double now = platform.clock().wallSeconds();

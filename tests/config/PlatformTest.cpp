@@ -1,4 +1,4 @@
-#include "platform/Platform.h"
+#include "config/Platform.h"
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
@@ -12,7 +12,7 @@
 #include "platform/Process.h"
 #include "tests/support/TestPlatform.h"
 
-namespace platform {
+namespace orvanta {
 namespace {
 
 TEST(FileLocations, comeFromTheEnvironment) {
@@ -121,4 +121,4 @@ TEST(Platform, endsItsPartsInOrder) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta

@@ -14,7 +14,7 @@
 #include "platform/http/HttpClient.h"
 #include "platform/queue/WorkQueue.h"
 
-namespace platform {
+namespace orvanta {
 
 // Directories and files, from the environment (see docs/operation.md). No trailing slashes.
 struct FileLocations {
@@ -36,12 +36,12 @@ class Platform {
  public:
   struct Parts {
     FileLocations files;
-    std::unique_ptr<Clock> clock;
-    std::unique_ptr<DeviceProperties> device;
-    std::unique_ptr<UserDefaults> defaults;
-    std::unique_ptr<WorkPool> pool;
-    std::unique_ptr<HttpClient> http;
-    std::unique_ptr<PowerLog> powerLog;
+    std::unique_ptr<platform::Clock> clock;
+    std::unique_ptr<platform::DeviceProperties> device;
+    std::unique_ptr<platform::UserDefaults> defaults;
+    std::unique_ptr<platform::WorkPool> pool;
+    std::unique_ptr<platform::HttpClient> http;
+    std::unique_ptr<platform::PowerLog> powerLog;
   };
   explicit Platform(Parts parts) : _parts(std::move(parts)) {}
   Platform(const Platform&) = delete;
@@ -49,13 +49,13 @@ class Platform {
   ~Platform();  // http first, then the pool, then the rest
 
   const FileLocations& files() const { return _parts.files; }
-  Clock& clock() const { return *_parts.clock; }
-  DeviceProperties& device() const { return *_parts.device; }
-  UserDefaults& defaults() const { return *_parts.defaults; }
-  WorkPool& pool() const { return *_parts.pool; }
-  HttpClient& http() const { return *_parts.http; }
-  PowerLog& powerLog() const { return *_parts.powerLog; }
-  KeepAlive& keepAlive() { return _keepAlive; }
+  platform::Clock& clock() const { return *_parts.clock; }
+  platform::DeviceProperties& device() const { return *_parts.device; }
+  platform::UserDefaults& defaults() const { return *_parts.defaults; }
+  platform::WorkPool& pool() const { return *_parts.pool; }
+  platform::HttpClient& http() const { return *_parts.http; }
+  platform::PowerLog& powerLog() const { return *_parts.powerLog; }
+  platform::KeepAlive& keepAlive() { return _keepAlive; }
 
   // The one T of this platform, made by `make` on first use; later calls give the same object. `make` runs under a lock
   // (it may ask for another once-value of the same platform). T lives as long as the platform.
@@ -69,9 +69,9 @@ class Platform {
 
  private:
   Parts _parts;
-  KeepAlive _keepAlive;
+  platform::KeepAlive _keepAlive;
   std::recursive_mutex _onceMutex;
   std::unordered_map<std::type_index, std::shared_ptr<void>> _onceValues;  // guarded by _onceMutex
 };
 
-}  // namespace platform
+}  // namespace orvanta

@@ -1,4 +1,4 @@
-#include "platform/Platform.h"
+#include "config/Platform.h"
 
 #include <algorithm>
 #include <chrono>
@@ -6,7 +6,7 @@
 #include <string>
 #include <utility>
 
-namespace platform {
+namespace orvanta {
 
 namespace {
 
@@ -45,4 +45,4 @@ Platform::~Platform() {
   _parts.pool.reset();
 }
 
-}  // namespace platform
+}  // namespace orvanta

@@ -1,4 +1,4 @@
-#include "util/Conversions.h"
+#include "config/Conversions.h"
 
 #include <arpa/inet.h>
 #include <gtest/gtest.h>
@@ -6,7 +6,7 @@
 #include <limits>
 #include <tuple>
 
-#include "util/ClientTypes.h"
+#include "config/ClientTypes.h"
 
 namespace orvanta {
 namespace {

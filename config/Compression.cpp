@@ -1,4 +1,4 @@
-#include "util/Compression.h"
+#include "config/Compression.h"
 
 #include <zlib.h>
 

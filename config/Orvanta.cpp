@@ -1,4 +1,4 @@
-#include "util/Orvanta.h"
+#include "config/Orvanta.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -10,11 +10,11 @@
 #include <utility>
 #include <vector>
 
+#include "config/UserDefaultKeys.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/codec/PropertyList.h"
 #include "platform/core/NearestWord.h"
 #include "platform/core/UniqueFd.h"
-#include "util/UserDefaultKeys.h"
 
 namespace orvanta {
 
@@ -66,12 +66,12 @@ platform::Result<std::vector<std::uint8_t>> readKeyFile(const std::string& path)
 
 }  // namespace
 
-Orvanta& Orvanta::of(platform::Platform& platform) {
+Orvanta& Orvanta::of(Platform& platform) {
   return *platform.once<OrvantaOfPlatform>([&] { return OrvantaOfPlatform{std::make_unique<Orvanta>(platform)}; })
               .orvanta;
 }
 
-Orvanta::Orvanta(platform::Platform& platform)
+Orvanta::Orvanta(Platform& platform)
     : _platform(platform), _version(readVersion(platform.files().frameworkDirectory)) {}
 
 std::shared_ptr<const platform::RsaPublicKey> Orvanta::publicKey() {

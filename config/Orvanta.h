@@ -3,8 +3,8 @@
 #include <memory>
 #include <string>
 
+#include "config/Platform.h"
 #include "platform/Digest.h"
-#include "platform/Platform.h"
 #include "platform/core/Result.h"
 
 namespace orvanta {
@@ -14,8 +14,8 @@ namespace orvanta {
 // has one. Thread-safe.
 class Orvanta {
  public:
-  static Orvanta& of(platform::Platform& platform);
-  explicit Orvanta(platform::Platform& platform);
+  static Orvanta& of(Platform& platform);
+  explicit Orvanta(Platform& platform);
 
   // framework.plist's "version", or "8.0" when it has none.
   const std::string& bundleVersion() const { return _version; }
@@ -28,7 +28,7 @@ class Orvanta {
   std::string getPersistentIdentifierForDNU(bool respectConsent);
 
  private:
-  platform::Platform& _platform;
+  Platform& _platform;
   std::string _version;  // constant after construction
   std::mutex _mutex;
   std::shared_ptr<const platform::RsaPublicKey> _key;  // guarded by _mutex

@@ -1,12 +1,12 @@
-#include "util/Storebag.h"
+#include "config/Storebag.h"
 
 #include <gmock/gmock.h>
 
+#include "config/DeviceInfo.h"
 #include "platform/codec/PropertyList.h"
+#include "tests/config/SignedStorebag.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
-#include "tests/util/SignedStorebag.h"
-#include "util/DeviceInfo.h"
 
 namespace orvanta::test {
 namespace {

@@ -1,4 +1,4 @@
-#include "util/Conversions.h"
+#include "config/Conversions.h"
 
 #include <arpa/inet.h>
 

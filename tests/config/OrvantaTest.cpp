@@ -1,12 +1,12 @@
-#include "util/Orvanta.h"
+#include "config/Orvanta.h"
 
 #include <gmock/gmock.h>
 
 #include <filesystem>
 
+#include "tests/config/SignedStorebag.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
-#include "tests/util/SignedStorebag.h"
 
 namespace orvanta {
 namespace {

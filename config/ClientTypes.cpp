@@ -1,4 +1,4 @@
-#include "util/ClientTypes.h"
+#include "config/ClientTypes.h"
 
 #include <array>
 

@@ -7,18 +7,18 @@
 #include <string>
 #include <string_view>
 
+#include "config/Platform.h"
 #include "platform/Digest.h"
-#include "platform/Platform.h"
 
 namespace orvanta {
 
 // The signed remote configuration: fetching, verifying, choosing a section. See docs/storebag.md.
 
 // The text of a key of the daemon's user defaults; none when it has no value.
-std::optional<std::string> userDefaultStringForKey(platform::Platform& platform, std::string_view key);
+std::optional<std::string> userDefaultStringForKey(Platform& platform, std::string_view key);
 
 // Base URL of the storebag server; the override "orvanta_storebag_url" is read once per platform.
-const std::string& storebagServerURL(platform::Platform& platform);
+const std::string& storebagServerURL(Platform& platform);
 
 bool verifyStorebagSignature(const platform::RsaPublicKey& key, std::span<const std::uint8_t> bag,
                              std::span<const std::uint8_t> signature);
@@ -38,12 +38,11 @@ struct StorebagFetch {
 
 // One attempt to get the bag of that name: the inner bag, or null. Blocks for the network, at most 15 seconds. Does not
 // write `version`.
-platform::SharedDictionary fetchStorebagWithName(platform::Platform& platform, const std::string& name,
-                                                 StorebagFetch& fetch);
+platform::SharedDictionary fetchStorebagWithName(Platform& platform, const std::string& name, StorebagFetch& fetch);
 
 // The section of the current environment from the bag of that client type: backend name to profile, or null. A client
 // type without a storebag is refused with a log line and no request.
-platform::SharedDictionary fetchStorebagForEnvironmentAndClientType(platform::Platform& platform,
-                                                                    std::int32_t clientType, StorebagFetch& fetch);
+platform::SharedDictionary fetchStorebagForEnvironmentAndClientType(Platform& platform, std::int32_t clientType,
+                                                                    StorebagFetch& fetch);
 
 }  // namespace orvanta

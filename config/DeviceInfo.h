@@ -6,7 +6,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Platform.h"
+#include "config/Platform.h"
 
 namespace orvanta {
 
@@ -14,16 +14,15 @@ namespace orvanta {
 using DeviceIDBuffer = std::array<char, 41>;
 
 // Fills the buffer with the unique device identifier, cut to 40 bytes; left as it was without an answer.
-void copyUniqueDeviceID(platform::Platform& platform, DeviceIDBuffer& buffer);
+void copyUniqueDeviceID(Platform& platform, DeviceIDBuffer& buffer);
 std::string_view deviceIDText(const DeviceIDBuffer& buffer);
 
 // Whether the device's release type is "Internal". Decided once per platform. Thread-safe.
-bool isInternalBuild(platform::Platform& platform);
+bool isInternalBuild(Platform& platform);
 
 // An identifier that stays the same across restarts, per pair of suffix parts (absent counts as empty): made on first
 // request, kept in the user defaults under "uuid:FIRST:SECOND". Never fails; one that cannot be stored is logged.
-std::string getPersistentIdentifierForCustomClientIDSuffix(platform::Platform& platform,
-                                                           const std::optional<std::string>& first,
+std::string getPersistentIdentifierForCustomClientIDSuffix(Platform& platform, const std::optional<std::string>& first,
                                                            const std::optional<std::string>& second);
 
 }  // namespace orvanta

@@ -1,11 +1,11 @@
-#include "util/DeviceInfo.h"
+#include "config/DeviceInfo.h"
 
 #include <algorithm>
 #include <cstring>
 
+#include "config/UserDefaultKeys.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/Digest.h"
-#include "util/UserDefaultKeys.h"
 
 namespace orvanta {
 
@@ -25,7 +25,7 @@ std::string_view cutWhole(std::string_view text, std::size_t limit) {
 
 }  // namespace
 
-void copyUniqueDeviceID(platform::Platform& platform, DeviceIDBuffer& buffer) {
+void copyUniqueDeviceID(Platform& platform, DeviceIDBuffer& buffer) {
   const auto identifier = platform.device().uniqueDeviceID();
   if (!identifier) return;
   const std::string_view text = cutWhole(*identifier, buffer.size() - 1);
@@ -37,13 +37,12 @@ std::string_view deviceIDText(const DeviceIDBuffer& buffer) {
   return {buffer.data(), ::strnlen(buffer.data(), buffer.size())};
 }
 
-bool isInternalBuild(platform::Platform& platform) {
+bool isInternalBuild(Platform& platform) {
   return platform.once<InternalBuild>([&] { return InternalBuild{platform.device().releaseType() == "Internal"}; })
       .value;
 }
 
-std::string getPersistentIdentifierForCustomClientIDSuffix(platform::Platform& platform,
-                                                           const std::optional<std::string>& first,
+std::string getPersistentIdentifierForCustomClientIDSuffix(Platform& platform, const std::optional<std::string>& first,
                                                            const std::optional<std::string>& second) {
   std::string key(kIdentifierPrefix);
   key.append(":").append(first.value_or("")).append(":").append(second.value_or(""));

@@ -1,13 +1,13 @@
-#include "util/DeviceInfo.h"
+#include "config/DeviceInfo.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <set>
 
+#include "config/Environment.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
-#include "util/Environment.h"
 
 namespace orvanta {
 namespace {

@@ -1,4 +1,4 @@
-#include "util/MessageLogDirectory.h"
+#include "config/MessageLogDirectory.h"
 
 #include <dirent.h>
 #include <fcntl.h>
