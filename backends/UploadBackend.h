@@ -5,7 +5,7 @@
 #include <string>
 
 #include "backends/OrvantaBackend.h"
-#include "platform/ExtensionTokens.h"
+#include "platform/listen/ExtensionTokens.h"
 
 namespace orvanta {
 

@@ -5,7 +5,7 @@
 #include <string>
 
 #include "config/Platform.h"
-#include "platform/Entitlements.h"
+#include "platform/listen/Entitlements.h"
 #include "platform/sandbox/Sandbox.h"
 
 namespace orvanta {

@@ -2,7 +2,7 @@
 
 #include "config/Platform.h"
 #include "daemon/OrvantadAgent.h"
-#include "platform/Listener.h"
+#include "platform/listen/Listener.h"
 
 namespace orvanta {
 

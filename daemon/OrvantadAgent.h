@@ -9,8 +9,8 @@
 #include "daemon/SessionCountStatus.h"
 #include "daemon/SessionRegistry.h"
 #include "daemon/StorebagCache.h"
-#include "platform/Entitlements.h"
-#include "platform/Listener.h"
+#include "platform/listen/Entitlements.h"
+#include "platform/listen/Listener.h"
 #include "session/OrvantadSession.h"
 #include "session/OrvantadSessionDelegate.h"
 

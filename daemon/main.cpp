@@ -8,10 +8,10 @@
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/KeepAlive.h"
-#include "platform/Listener.h"
 #include "platform/MemoryUse.h"
 #include "platform/Process.h"
-#include "platform/ServiceSocket.h"
+#include "platform/listen/Listener.h"
+#include "platform/listen/ServiceSocket.h"
 #include "platform/sandbox/Sandbox.h"
 
 int main() {

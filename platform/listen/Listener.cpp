@@ -1,9 +1,9 @@
-#include "platform/Listener.h"
+#include "platform/listen/Listener.h"
 
 #include <utility>
 
-#include "platform/ServiceListener.h"
-#include "platform/ServiceSocket.h"
+#include "platform/listen/ServiceListener.h"
+#include "platform/listen/ServiceSocket.h"
 
 namespace platform {
 

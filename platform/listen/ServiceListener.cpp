@@ -1,4 +1,4 @@
-#include "platform/ServiceListener.h"
+#include "platform/listen/ServiceListener.h"
 
 #include <fmt/format.h>
 #include <sys/socket.h>

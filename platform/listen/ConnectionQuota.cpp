@@ -1,4 +1,4 @@
-#include "platform/ConnectionQuota.h"
+#include "platform/listen/ConnectionQuota.h"
 
 #include <mutex>
 #include <unordered_map>

@@ -5,8 +5,8 @@
 #include <string>
 #include <string_view>
 
-#include "platform/PeerIdentity.h"
 #include "platform/core/Value.h"
+#include "platform/listen/PeerIdentity.h"
 
 namespace platform {
 

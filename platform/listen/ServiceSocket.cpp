@@ -1,4 +1,4 @@
-#include "platform/ServiceSocket.h"
+#include "platform/listen/ServiceSocket.h"
 
 #include <fcntl.h>
 #include <sys/file.h>
@@ -12,10 +12,10 @@
 #include <optional>
 #include <utility>
 
-#include "platform/PeerIdentity.h"
 #include "platform/core/Log.h"
 #include "platform/ipc/Connect.h"
 #include "platform/ipc/UnixAddress.h"
+#include "platform/listen/PeerIdentity.h"
 
 namespace platform {
 

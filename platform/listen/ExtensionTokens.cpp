@@ -1,4 +1,4 @@
-#include "platform/ExtensionTokens.h"
+#include "platform/listen/ExtensionTokens.h"
 
 #include <sys/stat.h>
 #include <unistd.h>

@@ -8,9 +8,9 @@
 #include <mutex>
 #include <optional>
 
-#include "platform/ConnectionQuota.h"
-#include "platform/Listener.h"
-#include "platform/ServiceSocket.h"
+#include "platform/listen/ConnectionQuota.h"
+#include "platform/listen/Listener.h"
+#include "platform/listen/ServiceSocket.h"
 #include "platform/queue/WorkQueue.h"
 
 namespace platform {

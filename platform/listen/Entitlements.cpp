@@ -1,4 +1,4 @@
-#include "platform/Entitlements.h"
+#include "platform/listen/Entitlements.h"
 
 #include <grp.h>
 #include <pwd.h>

@@ -5,10 +5,10 @@
 #include <memory>
 #include <string>
 
-#include "platform/PeerIdentity.h"
-#include "platform/ServiceSocket.h"
 #include "platform/core/Result.h"
 #include "platform/ipc/Connection.h"
+#include "platform/listen/PeerIdentity.h"
+#include "platform/listen/ServiceSocket.h"
 #include "platform/queue/WorkQueue.h"
 
 namespace platform {

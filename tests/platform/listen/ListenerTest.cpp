@@ -1,4 +1,4 @@
-#include "platform/Listener.h"
+#include "platform/listen/Listener.h"
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
@@ -16,10 +16,10 @@
 #include <tuple>
 #include <vector>
 
-#include "platform/ServiceListener.h"
-#include "platform/ServiceSocket.h"
 #include "platform/ipc/Connect.h"
 #include "platform/ipc/UnixAddress.h"
+#include "platform/listen/ServiceListener.h"
+#include "platform/listen/ServiceSocket.h"
 #include "tests/platform/ipc/ConnectionFixture.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"

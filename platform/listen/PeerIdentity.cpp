@@ -1,4 +1,4 @@
-#include "platform/PeerIdentity.h"
+#include "platform/listen/PeerIdentity.h"
 
 #include <sys/socket.h>
 
