@@ -3,8 +3,8 @@
 #include <vector>
 
 #include "interface/OrvantaLogging.h"
-#include "platform/BundleLoader.h"
 #include "platform/codec/MessagePack.h"
+#include "platform/host/BundleLoader.h"
 
 namespace orvanta {
 

@@ -9,7 +9,7 @@
 
 #include "backends/OrvantaBackend.h"
 #include "backends/ReliableDelivery.h"
-#include "platform/UdpSocket.h"
+#include "platform/host/UdpSocket.h"
 #include "platform/queue/WorkQueue.h"
 
 namespace orvanta {

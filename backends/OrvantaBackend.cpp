@@ -8,7 +8,7 @@
 #include <span>
 
 #include "config/Conversions.h"
-#include "platform/Digest.h"
+#include "platform/host/Digest.h"
 
 namespace orvanta {
 namespace {

@@ -5,7 +5,7 @@
 
 #include "config/UserDefaultKeys.h"
 #include "interface/OrvantaLogging.h"
-#include "platform/Digest.h"
+#include "platform/host/Digest.h"
 
 namespace orvanta {
 

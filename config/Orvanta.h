@@ -4,8 +4,8 @@
 #include <string>
 
 #include "config/Platform.h"
-#include "platform/Digest.h"
 #include "platform/core/Result.h"
+#include "platform/host/Digest.h"
 
 namespace orvanta {
 

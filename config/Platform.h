@@ -6,11 +6,11 @@
 #include <typeindex>
 #include <unordered_map>
 
-#include "platform/DeviceProperties.h"
-#include "platform/KeepAlive.h"
-#include "platform/PowerLog.h"
-#include "platform/UserDefaults.h"
 #include "platform/core/Clock.h"
+#include "platform/host/DeviceProperties.h"
+#include "platform/host/KeepAlive.h"
+#include "platform/host/PowerLog.h"
+#include "platform/host/UserDefaults.h"
 #include "platform/http/HttpClient.h"
 #include "platform/queue/WorkQueue.h"
 

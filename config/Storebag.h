@@ -8,7 +8,7 @@
 #include <string_view>
 
 #include "config/Platform.h"
-#include "platform/Digest.h"
+#include "platform/host/Digest.h"
 
 namespace orvanta {
 

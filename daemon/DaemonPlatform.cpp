@@ -6,8 +6,8 @@
 
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
-#include "platform/JsonLinesPowerLog.h"
-#include "platform/LibraryPowerLog.h"
+#include "platform/host/JsonLinesPowerLog.h"
+#include "platform/host/LibraryPowerLog.h"
 
 namespace orvanta {
 

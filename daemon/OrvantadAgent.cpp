@@ -7,7 +7,7 @@
 #include "daemon/SessionConnection.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
-#include "platform/MemoryUse.h"
+#include "platform/host/MemoryUse.h"
 
 namespace orvanta {
 

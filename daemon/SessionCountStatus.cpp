@@ -6,7 +6,7 @@
 #include <mutex>
 #include <utility>
 
-#include "platform/KeepAlive.h"
+#include "platform/host/KeepAlive.h"
 
 namespace orvanta {
 

@@ -3,8 +3,8 @@
 #include <fmt/format.h>
 
 #include "interface/OrvantaLogging.h"
-#include "platform/Digest.h"
 #include "platform/codec/PropertyList.h"
+#include "platform/host/Digest.h"
 
 namespace orvanta {
 

@@ -5,7 +5,7 @@
 #include <limits>
 #include <string>
 
-#include "platform/Digest.h"
+#include "platform/host/Digest.h"
 
 namespace orvanta {
 namespace {

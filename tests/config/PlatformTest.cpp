@@ -9,7 +9,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/Process.h"
+#include "platform/host/Process.h"
 #include "tests/support/TestPlatform.h"
 
 namespace orvanta {

@@ -6,7 +6,7 @@
 #include <fstream>
 #include <sstream>
 
-#include "platform/UserDefaults.h"
+#include "platform/host/UserDefaults.h"
 #include "platform/ipc/Connect.h"
 #include "tests/integration/IntegrationFixture.h"
 #include "tests/platform/Waiting.h"

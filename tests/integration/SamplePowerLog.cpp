@@ -4,7 +4,7 @@
 #include <fstream>
 #include <msgpack.hpp>
 
-#include "platform/PowerLogLibrary.h"
+#include "platform/host/PowerLogLibrary.h"
 
 __attribute__((visibility("default"))) void VMLogRegisteredEvent(int32_t event, const char* sender,
                                                                  const VMPowerLogRecord* record, const void* reserved) {

@@ -4,7 +4,7 @@
 
 #include <filesystem>
 
-#include "platform/Digest.h"
+#include "platform/host/Digest.h"
 #include "tests/support/Bytes.h"
 #include "tests/tools/CollectorFixture.h"
 

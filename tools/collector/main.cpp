@@ -10,8 +10,8 @@
 #include <optional>
 #include <string>
 
-#include "platform/Process.h"
 #include "platform/codec/Json.h"
+#include "platform/host/Process.h"
 #include "tools/collector/Collector.h"
 
 // Runs a collector until SIGTERM or SIGINT. Prints one line of JSON when it listens.

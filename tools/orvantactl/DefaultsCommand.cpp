@@ -10,8 +10,8 @@
 #include <utility>
 
 #include "interface/OrvantaConstants.h"
-#include "platform/UserDefaults.h"
 #include "platform/core/LogSink.h"
+#include "platform/host/UserDefaults.h"
 #include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
 #include "tools/orvantactl/DefaultsValue.h"

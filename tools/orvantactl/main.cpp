@@ -1,6 +1,6 @@
 #include <CLI/CLI.hpp>
 
-#include "platform/Process.h"
+#include "platform/host/Process.h"
 #include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
 #include "tools/orvantactl/ExitStatus.h"

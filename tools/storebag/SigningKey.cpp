@@ -16,8 +16,8 @@
 #include <cstring>
 #include <utility>
 
-#include "platform/Digest.h"
 #include "platform/core/WholeFile.h"
+#include "platform/host/Digest.h"
 
 namespace orvanta {
 

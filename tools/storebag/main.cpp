@@ -6,10 +6,10 @@
 #include <cstring>
 #include <string>
 
-#include "platform/Digest.h"
-#include "platform/Process.h"
 #include "platform/codec/Json.h"
 #include "platform/codec/PropertyList.h"
+#include "platform/host/Digest.h"
+#include "platform/host/Process.h"
 #include "tools/storebag/StorebagFile.h"
 
 // Makes, checks and prints signed storebags without a server.

@@ -7,9 +7,9 @@
 #include <string>
 #include <string_view>
 
-#include "platform/PowerLog.h"
 #include "platform/core/Clock.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/host/PowerLog.h"
 
 namespace platform {
 

@@ -1,4 +1,4 @@
-#include "platform/MemoryUse.h"
+#include "platform/host/MemoryUse.h"
 
 #include <link.h>
 #include <malloc.h>

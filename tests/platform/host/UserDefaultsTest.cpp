@@ -1,4 +1,4 @@
-#include "platform/UserDefaults.h"
+#include "platform/host/UserDefaults.h"
 
 #include <gtest/gtest.h>
 #include <sys/wait.h>

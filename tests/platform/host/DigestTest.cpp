@@ -1,4 +1,4 @@
-#include "platform/Digest.h"
+#include "platform/host/Digest.h"
 
 #include <gtest/gtest.h>
 #include <openssl/evp.h>

@@ -1,4 +1,4 @@
-#include "platform/DeviceProperties.h"
+#include "platform/host/DeviceProperties.h"
 
 #include <gmock/gmock.h>
 #include <sched.h>
@@ -10,7 +10,7 @@
 #include <cstdlib>
 #include <limits>
 
-#include "platform/SystemFacts.h"
+#include "platform/host/SystemFacts.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/Threads.h"

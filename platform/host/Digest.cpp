@@ -1,4 +1,4 @@
-#include "platform/Digest.h"
+#include "platform/host/Digest.h"
 
 #include <openssl/err.h>
 #include <openssl/evp.h>

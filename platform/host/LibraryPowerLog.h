@@ -4,8 +4,8 @@
 #include <memory>
 #include <string_view>
 
-#include "platform/PowerLog.h"
-#include "platform/PowerLogLibrary.h"
+#include "platform/host/PowerLog.h"
+#include "platform/host/PowerLogLibrary.h"
 
 namespace platform {
 

@@ -1,4 +1,4 @@
-#include "platform/Process.h"
+#include "platform/host/Process.h"
 
 #include <fcntl.h>
 #include <pthread.h>

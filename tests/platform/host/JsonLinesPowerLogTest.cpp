@@ -1,4 +1,4 @@
-#include "platform/JsonLinesPowerLog.h"
+#include "platform/host/JsonLinesPowerLog.h"
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
@@ -9,8 +9,8 @@
 #include <set>
 #include <vector>
 
-#include "platform/LibraryPowerLog.h"
 #include "platform/codec/Json.h"
+#include "platform/host/LibraryPowerLog.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/TestClock.h"

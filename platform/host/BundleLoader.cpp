@@ -1,4 +1,4 @@
-#include "platform/BundleLoader.h"
+#include "platform/host/BundleLoader.h"
 
 #include <dlfcn.h>
 

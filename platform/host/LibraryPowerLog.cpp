@@ -1,4 +1,4 @@
-#include "platform/LibraryPowerLog.h"
+#include "platform/host/LibraryPowerLog.h"
 
 #include <dlfcn.h>
 

@@ -1,4 +1,4 @@
-#include "platform/JsonLinesPowerLog.h"
+#include "platform/host/JsonLinesPowerLog.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>

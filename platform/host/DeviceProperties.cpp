@@ -1,4 +1,4 @@
-#include "platform/DeviceProperties.h"
+#include "platform/host/DeviceProperties.h"
 
 #include <algorithm>
 #include <array>
@@ -11,11 +11,11 @@
 
 #include <fmt/format.h>
 
-#include "platform/SystemFacts.h"
 #include "platform/codec/PropertyList.h"
 #include "platform/core/FileStamp.h"
 #include "platform/core/Log.h"
 #include "platform/core/NearestWord.h"
+#include "platform/host/SystemFacts.h"
 
 namespace platform {
 

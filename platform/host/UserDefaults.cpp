@@ -1,4 +1,4 @@
-#include "platform/UserDefaults.h"
+#include "platform/host/UserDefaults.h"
 
 #include <fcntl.h>
 #include <fmt/format.h>

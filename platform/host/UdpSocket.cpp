@@ -1,4 +1,4 @@
-#include "platform/UdpSocket.h"
+#include "platform/host/UdpSocket.h"
 
 #include <sys/socket.h>
 

@@ -1,4 +1,4 @@
-#include "platform/KeepAlive.h"
+#include "platform/host/KeepAlive.h"
 
 #include <systemd/sd-daemon.h>
 

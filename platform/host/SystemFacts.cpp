@@ -1,4 +1,4 @@
-#include "platform/SystemFacts.h"
+#include "platform/host/SystemFacts.h"
 
 #include <algorithm>
 #include <array>
@@ -6,7 +6,7 @@
 #include <cstdlib>
 #include <vector>
 
-#include "platform/Digest.h"
+#include "platform/host/Digest.h"
 
 namespace platform {
 
