@@ -13,7 +13,7 @@
 #include <stdexcept>
 #include <thread>
 
-#include "backends/DashboardDatagram.h"
+#include "backends/dashboard/DashboardDatagram.h"
 #include "bench/BenchDaemon.h"
 #include "bench/CallDriver.h"
 #include "bench/RawPeers.h"

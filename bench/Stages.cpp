@@ -14,10 +14,10 @@
 #include <mutex>
 #include <stdexcept>
 
-#include "backends/EventFilters.h"
-#include "backends/EventRecord.h"
-#include "backends/PostMessage.h"
-#include "backends/SessionFields.h"
+#include "backends/https/EventFilters.h"
+#include "backends/https/EventRecord.h"
+#include "backends/https/PostMessage.h"
+#include "backends/https/SessionFields.h"
 #include "bench/CallDriver.h"
 #include "bench/RawPeers.h"
 #include "config/Compression.h"

@@ -2,8 +2,8 @@
 
 #include <chrono>
 
-#include "backends/PendingPosts.h"
-#include "backends/UploadBudget.h"
+#include "backends/https/PendingPosts.h"
+#include "backends/upload/UploadBudget.h"
 #include "interface/OrvantaLogging.h"
 
 namespace orvanta {

@@ -1,9 +1,9 @@
 #include "session/BackendSet.h"
 
-#include "backends/BackendFactory.h"
 #include "config/Orvanta.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
+#include "session/BackendFactory.h"
 #include "session/SessionInfoRecord.h"
 
 namespace orvanta {

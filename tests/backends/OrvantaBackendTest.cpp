@@ -6,9 +6,9 @@
 #include <array>
 #include <cstdlib>
 
-#include "backends/BriskBackend.h"
-#include "backends/HTTPSPostBackend.h"
-#include "tests/backends/HTTPSFixture.h"
+#include "backends/brisk/BriskBackend.h"
+#include "backends/https/HTTPSPostBackend.h"
+#include "tests/backends/https/HTTPSFixture.h"
 
 namespace orvanta::test {
 namespace {

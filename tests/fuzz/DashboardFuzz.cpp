@@ -1,8 +1,8 @@
 #include <algorithm>
 #include <string>
 
-#include "backends/DashboardDatagram.h"
-#include "backends/ReliableDelivery.h"
+#include "backends/dashboard/DashboardDatagram.h"
+#include "backends/dashboard/ReliableDelivery.h"
 #include "platform/core/Utf8.h"
 #include "tests/fuzz/Require.h"
 

@@ -1,7 +1,7 @@
 #include <memory>
 #include <string>
 
-#include "backends/HTTPSPostBackend.h"
+#include "backends/https/HTTPSPostBackend.h"
 #include "config/Storebag.h"
 #include "platform/core/LogSink.h"
 #include "tests/config/SignedStorebag.h"

@@ -7,7 +7,7 @@
 #include <map>
 #include <thread>
 
-#include "backends/DashboardDatagram.h"
+#include "backends/dashboard/DashboardDatagram.h"
 #include "tests/integration/IntegrationFixture.h"
 #include "tests/support/UdpServer.h"
 

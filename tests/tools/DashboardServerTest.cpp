@@ -4,7 +4,7 @@
 
 #include <string>
 
-#include "backends/DashboardDatagram.h"
+#include "backends/dashboard/DashboardDatagram.h"
 #include "tests/support/Bytes.h"
 #include "tests/support/UdpServer.h"
 #include "tests/tools/CollectorFixture.h"

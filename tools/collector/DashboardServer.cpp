@@ -11,7 +11,7 @@
 #include <cstring>
 #include <utility>
 
-#include "backends/DashboardDatagram.h"
+#include "backends/dashboard/DashboardDatagram.h"
 #include "tools/collector/Sockets.h"
 
 namespace orvanta::collector {

@@ -5,7 +5,7 @@
 #include <span>
 #include <utility>
 
-#include "backends/DashboardDatagram.h"
+#include "backends/dashboard/DashboardDatagram.h"
 #include "platform/codec/Json.h"
 #include "platform/codec/PropertyList.h"
 

@@ -1,0 +1,83 @@
+#include "backends/brisk/BriskAdaptor.h"
+
+#include <vector>
+
+#include "interface/OrvantaLogging.h"
+#include "platform/codec/MessagePack.h"
+#include "platform/host/BundleLoader.h"
+
+namespace orvanta {
+
+namespace {
+
+constexpr const char* kBundle = "/Tamberline.bundle/Bundles/HQXPerformance.bundle";
+
+// The plug-in's class; null, with the reason in the log, when there is none to be had.
+const OrvantaPluginClass* findAdaptorClass(Platform& platform) {
+  const std::string directory = platform.files().plugInsDirectory + kBundle;
+  const platform::LoadedBundle* loaded =
+      platform.once<std::unique_ptr<platform::BundleLoader>>([] { return std::make_unique<platform::BundleLoader>(); })
+          ->load(directory);
+  if (loaded == nullptr) return nullptr;
+  const auto* bundle = static_cast<const OrvantaPluginBundle*>(loaded->symbol(ORVANTA_PLUGIN_SYMBOL));
+  if (bundle == nullptr) {
+    ORVANTA_LOG(error, "BriskAdaptor(create): {} exports no {}", directory, ORVANTA_PLUGIN_SYMBOL);
+    return nullptr;
+  }
+  if (bundle->abiVersion != ORVANTA_PLUGIN_ABI_VERSION) {
+    ORVANTA_LOG(error, "BriskAdaptor(create): {} has plug-in interface version {}, this daemon has {}", directory,
+                bundle->abiVersion, ORVANTA_PLUGIN_ABI_VERSION);
+    return nullptr;
+  }
+  const OrvantaPluginClass* adaptorClass =
+      bundle->findClass == nullptr ? nullptr : bundle->findClass(BriskAdaptor::kClassName);
+  if (adaptorClass == nullptr || adaptorClass->create == nullptr) {
+    ORVANTA_LOG(error, "BriskAdaptor(create): {} has no class {}", directory, BriskAdaptor::kClassName);
+    return nullptr;
+  }
+  return adaptorClass;
+}
+
+OrvantaPluginOperation findForwardingOperation(const OrvantaPluginClass& adaptorClass) {
+  if (adaptorClass.findOperation == nullptr) return nullptr;
+  return adaptorClass.findOperation(BriskAdaptor::kForwardingOperation);
+}
+
+}  // namespace
+
+std::unique_ptr<BriskAdaptor> BriskAdaptor::create(Platform& platform) {
+  const platform::BlockingScope blocking;  // what a plug-in does takes as long as it likes, here and below
+  const OrvantaPluginClass* adaptorClass = findAdaptorClass(platform);
+  if (adaptorClass == nullptr) return nullptr;
+  void* const instance = adaptorClass->create();
+  if (instance == nullptr) {
+    ORVANTA_LOG(error, "BriskAdaptor(create): The class {} gave no instance", kClassName);
+    return nullptr;
+  }
+  auto adaptor = std::make_unique<BriskAdaptor>(*adaptorClass, instance);
+  if (!adaptor->respondsToForwarding()) {
+    ORVANTA_LOG(error, "BriskAdaptor(create): The class {} has no operation {}", kClassName, kForwardingOperation);
+  }
+  return adaptor;
+}
+
+BriskAdaptor::BriskAdaptor(const OrvantaPluginClass& adaptorClass, void* instance)
+    : _briskAdaptorClass(adaptorClass), _briskAdaptor(instance), _forward(findForwardingOperation(adaptorClass)) {}
+
+BriskAdaptor::~BriskAdaptor() {
+  const platform::BlockingScope blocking;
+  if (_briskAdaptorClass.destroy != nullptr) _briskAdaptorClass.destroy(_briskAdaptor);
+}
+
+void BriskAdaptor::sendMessage(std::uint16_t method, std::uint16_t respCode, const platform::Dictionary* payload) {
+  const platform::BlockingScope blocking;
+  if (payload == nullptr) {
+    _forward(_briskAdaptor, method, respCode, nullptr, 0);
+    return;
+  }
+  std::vector<std::uint8_t> bytes;
+  platform::MessagePackWriter(bytes).dictionary(*payload);
+  _forward(_briskAdaptor, method, respCode, bytes.data(), bytes.size());
+}
+
+}  // namespace orvanta

@@ -1,0 +1,48 @@
+#include "backends/brisk/BriskBackend.h"
+
+#include <utility>
+
+#include "interface/OrvantaLogging.h"
+
+namespace orvanta {
+
+std::shared_ptr<BriskBackend> BriskBackend::create(Platform& platform, std::string name, SharedDictionary profile,
+                                                   std::string productFamily, std::int32_t clientType) {
+  auto backend =
+      std::make_shared<BriskBackend>(Made{}, platform, std::move(name), std::move(profile), std::move(productFamily));
+  ORVANTA_LOG(info, "BriskBackend(initWithName): Loading Brisk adaptor class for client type {}", clientType);
+  if (!isClientTypeAllowed(clientType)) {
+    ORVANTA_LOG(error, "BriskBackend(initWithName): No matching bundle found for client type {}", clientType);
+    return nullptr;
+  }
+  backend->_briskAdaptor = BriskAdaptor::create(platform);
+  return backend;
+}
+
+std::shared_ptr<BriskBackend> BriskBackend::create(Platform& platform, std::string name, SharedDictionary profile,
+                                                   std::string productFamily) {
+  return create(platform, std::move(name), std::move(profile), std::move(productFamily), 0);
+}
+
+BriskBackend::BriskBackend(Made, Platform& platform, std::string name, SharedDictionary profile,
+                           std::string productFamily)
+    : OrvantaBackend(platform, std::move(name), std::move(profile), std::move(productFamily)) {}
+
+// The client types whose configuration is "confluo".
+bool BriskBackend::isClientTypeAllowed(std::int32_t clientType) {
+  return clientType == 7 || clientType == 11 || clientType == 13;
+}
+
+std::optional<std::string> BriskBackend::sendMessage(const SharedDictionary& payload, platform::TimeValue /*timestamp*/,
+                                                     std::uint16_t method, std::uint16_t respCode,
+                                                     std::uint16_t /*eventID*/, std::int32_t /*flag*/) {
+  if (_briskAdaptor && _briskAdaptor->respondsToForwarding()) {
+    _briskAdaptor->sendMessage(method, respCode, payload.get());
+  } else {
+    ORVANTA_LOG(error, "BriskBackend(sendMessage): Brisk adaptor {} does not respond to forwarding selector {}",
+                _briskAdaptor ? BriskAdaptor::description() : "(null)", BriskAdaptor::kForwardingOperation);
+  }
+  return std::nullopt;
+}
+
+}  // namespace orvanta

@@ -1,0 +1,38 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "backends/OrvantaBackend.h"
+#include "backends/brisk/BriskAdaptor.h"
+
+namespace orvanta {
+
+// Forwards each event to the device's diagnostics adaptor. Called on its session's queue, and so is the adaptor, during
+// the send. Without an adaptor the backend exists all the same, and each event leaves an error line.
+class BriskBackend final : public OrvantaBackend {
+  struct Made {};  // only the factories have one
+
+ public:
+  // Null, with a log line, for client types that have no adaptor.
+  static std::shared_ptr<BriskBackend> create(Platform& platform, std::string name, SharedDictionary profile,
+                                              std::string productFamily, std::int32_t clientType);
+  // Client type 0: always null.
+  static std::shared_ptr<BriskBackend> create(Platform& platform, std::string name, SharedDictionary profile,
+                                              std::string productFamily);
+  BriskBackend(Made, Platform& platform, std::string name, SharedDictionary profile, std::string productFamily);
+
+  static bool isClientTypeAllowed(std::int32_t clientType);
+
+  // Always none.
+  using OrvantaBackend::sendMessage;
+  std::optional<std::string> sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
+                                         std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID,
+                                         std::int32_t flag) override;
+
+ private:
+  std::unique_ptr<BriskAdaptor> _briskAdaptor;  // may be null; constant after set-up
+};
+
+}  // namespace orvanta

@@ -1,0 +1,348 @@
+#include "backends/dashboard/DashboardBackend.h"
+
+#include <algorithm>
+#include <array>
+#include <condition_variable>
+#include <mutex>
+#include <new>
+#include <span>
+#include <utility>
+
+#include "backends/dashboard/DashboardDatagram.h"
+#include "config/Conversions.h"
+#include "interface/OrvantaLogging.h"
+#include "platform/codec/PropertyList.h"
+#include "platform/core/Utf8.h"
+
+namespace orvanta {
+
+namespace {
+
+using platform::Dictionary;
+using platform::Value;
+using std::chrono::milliseconds;
+using std::chrono::steady_clock;
+
+constexpr std::size_t kReceiveBuffer = 1088;
+// A turn of reading ends after so many datagrams, so that a flood leaves other queues their turn. After as many in a
+// row that nothing waited for, each turn waits for the pause, and the system drops what is too much meanwhile.
+constexpr int kReadsPerTurn = 256;
+constexpr milliseconds kFloodPause{2};
+
+std::optional<std::string> textAt(const Dictionary& dictionary, std::string_view key) {
+  const Value* value = dictionary.find(key);
+  const std::string* text = value == nullptr ? nullptr : value->string();
+  return text == nullptr ? std::nullopt : std::optional(*text);
+}
+
+// Null when the key is absent.
+const Value* valueAt(const SharedDictionary& dictionary, std::string_view key) {
+  const Value* value = dictionary ? dictionary->find(key) : nullptr;
+  return value == nullptr || value->isNull() ? nullptr : value;
+}
+
+std::uint16_t portOf(const Value& value) {
+  return static_cast<std::uint16_t>(value.integerValue());
+}
+
+// The array in an archive of our own: the log-data server's contract, see docs/dashboard.md.
+platform::Result<std::vector<std::uint8_t>> archive(const SharedArray& logData) {
+  if (!logData) return platform::Failure{"there is no array"};
+  Dictionary content{{"archiver", "OrvantaArchiver"}, {"version", 1}};
+  content.set("root", *logData);
+  return platform::writeBinaryPropertyList(std::move(content));
+}
+
+}  // namespace
+
+// Counts the datagrams handed to network queues and not yet sent. One per platform. Thread-safe.
+class DashboardBackend::HandOver {
+ public:
+  static HandOver& of(Platform& platform) {
+    return *platform.once<std::unique_ptr<HandOver>>([] { return std::make_unique<HandOver>(); });
+  }
+  void begin() {
+    const std::lock_guard lock(_mutex);
+    ++_pending;
+  }
+  void end() {
+    const std::lock_guard lock(_mutex);
+    if (--_pending == 0) _none.notify_all();
+  }
+  bool waitForNone(milliseconds patience) {
+    std::unique_lock lock(_mutex);
+    return _none.wait_for(lock, patience, [this] { return _pending == 0; });
+  }
+
+ private:
+  std::mutex _mutex;
+  std::condition_variable _none;
+  std::size_t _pending = 0;  // guarded by _mutex
+};
+
+// --- Set-up ---
+
+std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, std::string name,
+                                                           SharedDictionary profile, std::string productFamily) {
+  const Value* ip = valueAt(profile, "ip");
+  const Value* port = valueAt(profile, "port");
+  std::optional<std::string> serverIP;
+  if (ip != nullptr) serverIP = ip->description();
+  return create(platform, std::move(name), std::move(profile), std::move(serverIP),
+                port == nullptr ? std::uint16_t{0} : portOf(*port), std::move(productFamily));
+}
+
+std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, std::string name,
+                                                           std::optional<std::string> serverIP,
+                                                           std::uint16_t serverPort, std::string productFamily) {
+  if (!serverIP) return nullptr;
+  return create(platform, std::move(name), nullptr, std::move(serverIP), serverPort, std::move(productFamily));
+}
+
+std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, std::string name,
+                                                           SharedDictionary profile,
+                                                           std::optional<std::string> serverIP,
+                                                           std::uint16_t serverPort, std::string productFamily) {
+  if (profile) {
+    const Value* ip = valueAt(profile, "ip");
+    if (ip == nullptr) {
+      ORVANTA_LOG(error, "DashboardBackend(initWithName): can't resolve server IP");
+      return nullptr;
+    }
+    const Value* port = valueAt(profile, "port");
+    if (port == nullptr) {
+      ORVANTA_LOG(error, "DashboardBackend(initWithName): can't resolve server port");
+      return nullptr;
+    }
+    serverIP = ip->description();
+    serverPort = portOf(*port);
+  }
+  platform::UdpSocket socket;
+  if (const int error = socket.open(); error != 0) {
+    ORVANTA_LOG(error, "DashboardBackend(initWithName): socket() failed ({})", error);
+    return nullptr;
+  }
+  auto backend = std::make_shared<DashboardBackend>(Made{}, platform, std::move(name), std::move(profile),
+                                                    std::move(productFamily), std::move(socket));
+  if (!backend->setUp(serverIP, serverPort)) return nullptr;
+  return backend;
+}
+
+DashboardBackend::DashboardBackend(Made, Platform& platform, std::string name, SharedDictionary profile,
+                                   std::string productFamily, platform::UdpSocket socket)
+    : OrvantaBackend(platform, std::move(name), std::move(profile), std::move(productFamily)),
+      _handOver(HandOver::of(platform)),
+      _networkProcQueue(platform.pool().makeQueue()),
+      _socket(std::move(socket)) {}
+
+// Nothing is armed any more, since what is armed holds the backend.
+DashboardBackend::~DashboardBackend() = default;
+
+bool DashboardBackend::setUp(const std::optional<std::string>& serverIP, std::uint16_t serverPort) {
+  if (profile()) {
+    _usingProfile = true;
+    setDisplayURL(textAt(*profile(), "display_url"));
+    _postURL = textAt(*profile(), "post_url");
+    if (const Value* reliable = valueAt(profile(), "reliable")) {
+      useReliableUDP();
+      setPeriod(*reliable);
+    }
+  } else if (!serverIP) {
+    ORVANTA_LOG(error, "DashboardBackend(initWithName): initWitName with all null params.");
+    return false;
+  } else {
+    useReliableUDP();
+  }
+  if (_socket.connect(makeIPv4SocketAddress(*serverIP, serverPort)) != 0) {
+    ORVANTA_LOG(error, "DashboardBackend(initWithName): socket connect() failed.");
+    return false;
+  }
+  _timer = _networkProcQueue->makeTimer();
+  if (!_timer) {
+    ORVANTA_LOG(error, "DashboardBackend(initWithName): can't create timer source.");
+    return false;
+  }
+  _createdAt = steady_clock::now();
+  if (_readSource) _networkProcQueue->post([self = self()] { self->watchSocket(); });
+  return true;
+}
+
+void DashboardBackend::useReliableUDP() {
+  if (const int error = _socket.bindAnyPort(); error != 0) {
+    ORVANTA_LOG(error, "DashboardBackend(useReliableUDP): can't bind socket, {}", error);
+    return;
+  }
+  _reliableUDP = true;
+  _delivery.useAcknowledgements();
+  _readSource = _networkProcQueue->makeDescriptorWatch(_socket.descriptor());
+  if (!_readSource) ORVANTA_LOG(error, "DashboardBackend(useReliableUDP): can't create read source");
+}
+
+void DashboardBackend::setPeriod(const Value& reliable) {
+  const milliseconds asked{reliable.integerValue()};
+  if (!reliable.isBool() && asked > milliseconds(0) && asked <= kLongestPeriod) {
+    _period = asked;
+    return;
+  }
+  if (asked > kLongestPeriod) _period = kLongestPeriod;
+  ORVANTA_LOG(warning, "DashboardBackend(initWithName): \"reliable\" is {}, no period in milliseconds; {} is used",
+              reliable.description(), _period.count());
+}
+
+std::shared_ptr<DashboardBackend> DashboardBackend::self() {
+  return std::static_pointer_cast<DashboardBackend>(shared_from_this());
+}
+
+// --- The session's operations ---
+
+std::optional<std::string> DashboardBackend::sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
+                                                         std::uint16_t method, std::uint16_t respCode,
+                                                         std::uint16_t eventID, std::int32_t /*flag*/) {
+  DashboardSender sender;
+  sender.versionMajor = selfVersion().major;
+  sender.clientType = identity().compType;
+  sender.sessionID = identity().sessionID;
+  sender.clientVersion = identity().clientVersion;
+  sender.deviceID = identity().udid;
+  sender.mode = static_cast<std::uint16_t>((_reliableUDP ? tagReportingPacketHeader::kModeAcknowledged : 0) |
+                                           (_usingProfile ? 0 : tagReportingPacketHeader::kModeExplicitServer));
+  std::vector<std::uint8_t> datagram;
+  try {
+    datagram = encodeDashboardDatagram(sender, {payload.get(), timestamp, method, respCode, eventID});
+  } catch (const std::bad_alloc&) {
+    ORVANTA_LOG(error, "DashboardBackend(sendMessage): can't malloc.");
+    return std::nullopt;
+  }
+  std::optional<std::string> line = writeLocalLog(datagram);
+  _handOver.begin();
+  _networkProcQueue->post([self = self(), datagram = std::move(datagram), eventID]() mutable {
+    self->tryToSendMsg(std::move(datagram), eventID);
+    self->_handOver.end();
+  });
+  return line;
+}
+
+bool DashboardBackend::uploadLogData(const SharedArray& logData) {
+  const platform::BlockingScope blocking;  // archives can be large
+  if (!_postURL) {
+    ORVANTA_LOG(error, "DashboardBackend(uploadLogData): Post URL for log data array is nil");
+    return false;
+  }
+  const auto archived = archive(logData);
+  if (!archived) {
+    ORVANTA_LOG(error, "DashboardBackend(uploadLogData): Failed to serialize log data array for upload");
+    ORVANTA_LOG(debug, "DashboardBackend(uploadLogData): {}", archived.error());
+    return false;
+  }
+  platform::HttpRequest request;
+  request.method = "POST";
+  request.url = *_postURL;
+  request.headers = {{"Content-Type", "application/octet-stream"}};
+  request.body.assign(archived->begin(), archived->end());
+  // One request at a time, for which the caller waits; a frame's size bounds it.
+  const auto lane = platform().http().makeLane(platform::HttpClient::LaneKind::unrefused);
+  platform::HttpResult result = platform().http().perform(lane, std::move(request));
+  if (!result.response || result.response->body.empty() || !platform::isValidUtf8(result.response->body)) {
+    ORVANTA_LOG(error, "DashboardBackend(uploadLogData): Error uploading log data array ({})",
+                result.error.empty() ? "(null)" : result.error);
+    return false;
+  }
+  std::string& location = result.response->body;
+  ORVANTA_LOG(debug, "DashboardBackend(uploadLogData): Log data uploaded to {}", location);
+  auto announcement = std::make_shared<const Dictionary>(Dictionary{{"LogDataUploadLocation", std::move(location)}});
+  sendMessage(announcement, platform().clock().timeOfDay(), 0, 2, 0);
+  return true;
+}
+
+void DashboardBackend::cleanup() {
+  _networkProcQueue->post([self = self()] {
+    if (self->_delivery.empty()) {
+      self->cleanupSources();
+    } else if (self->_cleanupState == CleanupState::none) {
+      self->_cleanupState = CleanupState::requested;
+    }
+  });
+}
+
+bool DashboardBackend::waitUntilSent(Platform& platform, milliseconds patience) {
+  return HandOver::of(platform).waitForNone(patience);
+}
+
+// --- On the network queue ---
+
+void DashboardBackend::tryToSendMsg(std::vector<std::uint8_t> datagram, std::uint16_t eventNumber) {
+  if (!_socket.isOpen()) return;
+  const bool whole = _socket.send(datagram);
+  _delivery.sent(std::move(datagram), eventNumber, whole);
+  updateTimer();
+}
+
+void DashboardBackend::myPeriodicTask() {
+  _delivery.tick([this](std::span<const std::uint8_t> datagram) { return _socket.send(datagram); });
+  if (_cleanupState != CleanupState::none) {
+    if (_delivery.empty()) {
+      ORVANTA_LOG(debug, "DashboardBackend(myPeriodicTask): clean up at myPeriodicTask.");
+      cleanupSources();
+    } else if (_cleanupState == CleanupState::requested) {
+      _cleanupState = CleanupState::lastResortScheduled;
+      ORVANTA_LOG(debug, "DashboardBackend(myPeriodicTask): scheduled last resort clean-up in {} ms.",
+                  kLastResortDelay.count());
+      _lastResort = _networkProcQueue->makeTimer();
+      _lastResort->runAfter(kLastResortDelay, [self = self()] { self->cleanupSources(); });
+    }
+  }
+  updateTimer();
+}
+
+void DashboardBackend::processSocketRead() {
+  std::array<std::uint8_t, kReceiveBuffer> buffer;
+  int datagrams = 0;
+  while (datagrams < kReadsPerTurn) {
+    const std::optional<std::size_t> length = _socket.receive(buffer);
+    if (!length) break;
+    ++datagrams;
+    _strays = std::min(_strays + 1, kReadsPerTurn);
+    if (*length < kDashboardEventNumberOffset + 2) continue;  // too short for an event number
+    const std::uint8_t* const number = buffer.data() + kDashboardEventNumberOffset;
+    if (_delivery.acknowledged(static_cast<std::uint16_t>(number[0] << 8U | number[1]))) _strays = 0;
+  }
+  updateTimer();
+  if (_strays < kReadsPerTurn) {
+    watchSocket();
+    return;
+  }
+  if (!_readPause) _readPause = _networkProcQueue->makeTimer();
+  _readPause->runAfter(kFloodPause, [self = self()] { self->watchSocket(); });
+}
+
+void DashboardBackend::watchSocket() {
+  if (_readSource) _readSource->whenReadable([self = self()] { self->processSocketRead(); });
+}
+
+void DashboardBackend::updateTimer() {
+  const bool needed = _timer && (!_delivery.empty() || _cleanupState != CleanupState::none);
+  if (needed == _timerArmed) return;
+  _timerArmed = needed;
+  if (!needed) {
+    if (_timer) _timer->cancel();
+    return;
+  }
+  const auto periods = (steady_clock::now() - _createdAt) / _period + 1;
+  _timer->runAt(_createdAt + periods * _period, [self = self()] {
+    self->_timerArmed = false;
+    self->myPeriodicTask();
+  });
+}
+
+// The sources are cancelled before the socket that they watch is closed.
+void DashboardBackend::cleanupSources() {
+  _timerArmed = false;
+  _timer.reset();
+  _lastResort.reset();
+  _readPause.reset();
+  _readSource.reset();
+  _socket.close();
+  _delivery.clear();
+}
+
+}  // namespace orvanta

@@ -1,0 +1,219 @@
+#include "backends/https/EventRecord.h"
+
+#include <algorithm>
+
+#include "backends/https/EventField.h"
+
+namespace orvanta {
+namespace {
+
+constexpr ReservedKey kOwnKeys[] = {ReservedKey::sessionID,     ReservedKey::eventNumber, ReservedKey::method,
+                                    ReservedKey::status,        ReservedKey::clientTS,    ReservedKey::eventTime,
+                                    ReservedKey::timezoneOffset};
+
+const platform::Dictionary& orEmpty(const platform::SharedDictionary& dictionary) {
+  static const platform::Dictionary kEmpty;
+  return dictionary ? *dictionary : kEmpty;
+}
+
+std::size_t footprintOf(const platform::Dictionary& dictionary);
+
+std::size_t footprintOf(const platform::Value& value) {
+  if (const auto* text = value.string()) return text->size();
+  if (const auto* data = value.data()) return data->bytes.size();
+  if (const auto* dictionary = value.dictionary()) return footprintOf(*dictionary);
+  std::size_t total = 0;
+  if (const auto* array = value.array()) {
+    for (const auto& element : *array) total += sizeof(element) + footprintOf(element);
+  }
+  return total;
+}
+
+std::size_t footprintOf(const platform::Dictionary& dictionary) {
+  std::size_t total = 0;
+  for (const auto& entry : dictionary) total += sizeof(entry) + entry.first.size() + footprintOf(entry.second);
+  return total;
+}
+
+}  // namespace
+
+EventRecord::EventRecord(std::shared_ptr<const SessionFields> fields, platform::SharedDictionary payload,
+                         std::optional<std::string> combinedSessionID, Numbers numbers)
+    : _fields(std::move(fields)),
+      _payload(std::move(payload)),
+      _combinedSessionID(std::move(combinedSessionID)),
+      _numbers(numbers),
+      _category(numbers.method),
+      _present(_fields->present) {
+  for (const ReservedKey key : kOwnKeys) _present |= setOf(key);
+  if (!_combinedSessionID && !_fields->numericSessionID) _present &= ~setOf(ReservedKey::sessionID);
+}
+
+void EventRecord::prepare(std::shared_ptr<const RecordLayer> userInfo, const EventFilters& filters) {
+  _userInfo = std::move(userInfo);
+  if (!filters.empty()) applyFilters(filters);
+  const Change* change = changeOf(nameOf(ReservedKey::method));
+  if (change == nullptr) {
+    _category = visibleNumber(ReservedKey::method);
+  } else {
+    _category = change->digest ? static_cast<std::int32_t>(platform::Value(*change->digest).integerValue()) : 0;
+  }
+}
+
+// Before any filter.
+std::int32_t EventRecord::visibleNumber(ReservedKey key) const {
+  if (_userInfo && (_userInfo->reservedKeys() & setOf(key)) != 0) {
+    return static_cast<std::int32_t>(_userInfo->entries().find(nameOf(key))->integerValue());
+  }
+  return key == ReservedKey::method ? _numbers.method : _numbers.respCode;
+}
+
+platform::Value EventRecord::ownValue(ReservedKey key) const {
+  switch (key) {
+    case ReservedKey::sessionID:
+      if (_fields->numericSessionID) return *_fields->numericSessionID;
+      return _combinedSessionID ? platform::Value(*_combinedSessionID) : platform::Value();
+    case ReservedKey::eventNumber:
+      return static_cast<int>(_numbers.eventID);
+    case ReservedKey::method:
+      return static_cast<int>(_numbers.method);
+    case ReservedKey::status:
+      return static_cast<int>(_numbers.respCode);
+    case ReservedKey::clientTS:
+    case ReservedKey::eventTime:
+      return _numbers.clientTS;
+    case ReservedKey::timezoneOffset:
+      return static_cast<int>(_numbers.timezoneOffset);
+    default:
+      return _fields->value(key);
+  }
+}
+
+void EventRecord::applyFilters(const EventFilters& filters) {
+  const std::int32_t method = visibleNumber(ReservedKey::method);
+  const std::int32_t status = visibleNumber(ReservedKey::status);
+  const auto apply = [&](std::string_view key, const filterTag* tag, const platform::Value& value) {
+    if (tag->action == filterTag::kRemove) _changes.push_back({key, std::nullopt});
+    if (tag->action == filterTag::kSHA256) _changes.push_back({key, digestOf(value)});
+  };
+  ReservedKeys hidden = 0;
+  if (_userInfo) {
+    hidden = _userInfo->reservedKeys();
+    for (const auto& [key, value] : _userInfo->entries()) {
+      if (const auto* tag = filters.find(key, method, status)) apply(key, tag, value);
+    }
+  }
+  if (filters.namesReservedKey()) {
+    for (std::size_t i = 0; i < kReservedKeyCount; ++i) {
+      const auto key = static_cast<ReservedKey>(i);
+      if ((_present & ~hidden & setOf(key)) == 0) continue;
+      if (const auto* tag = filters.find(nameOf(key), method, status)) apply(nameOf(key), tag, ownValue(key));
+    }
+  }
+  hidden |= _present;
+  for (const auto& [key, value] : orEmpty(_payload)) {
+    const auto* tag = filters.find(key, method, status);
+    if (tag == nullptr || (reservedKeyNamed(key) & hidden) != 0) continue;
+    if (!_userInfo || !_userInfo->holds(key)) apply(key, tag, value);
+  }
+  std::sort(_changes.begin(), _changes.end(), [](const Change& a, const Change& b) { return a.key < b.key; });
+}
+
+const EventRecord::Change* EventRecord::changeOf(std::string_view key) const {
+  if (_changes.empty()) return nullptr;
+  const auto found = std::lower_bound(_changes.begin(), _changes.end(), key,
+                                      [](const Change& change, std::string_view k) { return change.key < k; });
+  return found != _changes.end() && found->key == key ? &*found : nullptr;
+}
+
+std::size_t EventRecord::footprint() const {
+  constexpr std::size_t kReservedFieldsAbout = 512;
+  return kReservedFieldsAbout + footprintOf(orEmpty(_payload));
+}
+
+// From the top layer down; a key that was written, or taken away, hides the same key of the layers below.
+void EventRecord::write(FieldWriter& writer, const Overlay& overlay) const {
+  const bool compact = writer.form() == FieldWriter::Form::compact;
+  const auto writeLayer = [&](const RecordLayer& layer) {
+    if (compact) {
+      writer.fragment(layer.json());
+      layer.logUnsendable();
+    } else {
+      for (const auto& [key, value] : layer.entries()) writer.value(key, value);
+    }
+  };
+
+  const RecordLayer* const top = overlay.userInfo;
+  ReservedKeys hidden = 0;
+  if (top != nullptr) {
+    writeLayer(*top);
+    hidden |= top->reservedKeys();
+  }
+  if (overlay.relabelled) {
+    constexpr ReservedKeys kSessionID = setOf(ReservedKey::sessionID);
+    if (overlay.sessionID != nullptr && (hidden & kSessionID) == 0) {
+      writer.text(ReservedKey::sessionID, *overlay.sessionID);
+    }
+    hidden |= kSessionID;
+  }
+  for (const Change& change : _changes) {
+    const ReservedKeys reserved = reservedKeyNamed(change.key);
+    if ((reserved & hidden) != 0 || (top != nullptr && top->holds(change.key))) continue;
+    hidden |= reserved;
+    if (change.digest) writer.text(change.key, *change.digest);
+  }
+  if (_userInfo && _userInfo.get() != top) {
+    if (top == nullptr && _changes.empty() && (hidden & _userInfo->reservedKeys()) == 0) {
+      writeLayer(*_userInfo);
+    } else {
+      for (const auto& [key, value] : _userInfo->entries()) {
+        if ((reservedKeyNamed(key) & hidden) != 0 || (top != nullptr && top->holds(key))) continue;
+        if (changeOf(key) == nullptr) writer.value(key, value);
+      }
+    }
+    hidden |= _userInfo->reservedKeys();
+  }
+  writeReserved(writer, hidden);
+  hidden |= _present;
+  for (const auto& [key, value] : orEmpty(_payload)) {
+    if ((reservedKeyNamed(key) & hidden) != 0) continue;
+    if (_userInfo && _userInfo->holds(key)) continue;
+    if (top != nullptr && top != _userInfo.get() && top->holds(key)) continue;
+    if (changeOf(key) == nullptr) writer.value(key, value);
+  }
+}
+
+void EventRecord::writeReserved(FieldWriter& writer, ReservedKeys hidden) const {
+  if (writer.form() == FieldWriter::Form::compact && (hidden & _fields->present) == 0) {
+    writer.fragment(_fields->json);
+  } else {
+    for (std::size_t i = 0; i <= static_cast<std::size_t>(ReservedKey::reportVers); ++i) {
+      const auto key = static_cast<ReservedKey>(i);
+      if ((_fields->present & ~hidden & setOf(key)) != 0) writer.value(nameOf(key), _fields->value(key));
+    }
+  }
+  const auto visible = [&](ReservedKey key) { return (_present & ~hidden & setOf(key)) != 0; };
+  const auto number = [&](ReservedKey key, std::int64_t value) {
+    if (visible(key)) writer.number(key, value);
+  };
+  if (visible(ReservedKey::sessionID)) {
+    if (_fields->numericSessionID) {
+      writer.number(ReservedKey::sessionID, std::int64_t{*_fields->numericSessionID});
+    } else {
+      writer.text(ReservedKey::sessionID, *_combinedSessionID);
+    }
+  }
+  number(ReservedKey::eventNumber, _numbers.eventID);
+  number(ReservedKey::method, _numbers.method);
+  number(ReservedKey::status, _numbers.respCode);
+  if (visible(ReservedKey::clientTS) && visible(ReservedKey::eventTime)) {
+    writer.number({ReservedKey::clientTS, ReservedKey::eventTime}, _numbers.clientTS);
+  } else if (visible(ReservedKey::clientTS)) {
+    writer.number({ReservedKey::clientTS}, _numbers.clientTS);
+  } else if (visible(ReservedKey::eventTime)) {
+    writer.number({ReservedKey::eventTime}, _numbers.clientTS);
+  }
+  number(ReservedKey::timezoneOffset, _numbers.timezoneOffset);
+}
+
+}  // namespace orvanta

@@ -1,0 +1,312 @@
+#include "backends/https/HTTPSPostBackend.h"
+
+#include <fmt/format.h>
+
+#include "backends/https/ClientSection.h"
+#include "config/Conversions.h"
+#include "config/DeviceInfo.h"
+#include "config/Environment.h"
+#include "config/Orvanta.h"
+#include "config/Storebag.h"
+#include "config/UserDefaultKeys.h"
+#include "interface/OrvantaConstants.h"
+#include "interface/OrvantaLogging.h"
+
+namespace orvanta {
+namespace {
+
+constexpr std::int32_t kLocalFailure = -1;
+// More than that is milliseconds of work to put into a message.
+constexpr std::size_t kLargeBatch = 512U << 10U;
+
+bool isRealtime(std::int32_t flag) {
+  return flag == 1 || flag == 3;
+}
+bool isPromoting(std::int32_t flag) {
+  return flag == 2 || flag == 3;
+}
+bool isSessionEnd(std::uint16_t method, std::uint16_t respCode) {
+  return method == 0 && respCode == 1;
+}
+
+void completeWithError(FlushCompletion& completion, const char* description) {
+  if (completion) completion(std::nullopt, makeOrvantaError(description, kLocalFailure));
+}
+
+bool forcesEventLogging(Platform& platform) {
+  const auto text = userDefaultStringForKey(platform, kForceEventLoggingKey);
+  return text && platform::Value(*text).boolValue();
+}
+
+}  // namespace
+
+std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::create(Platform& platform, std::string name,
+                                                           SharedDictionary profile, std::string productFamily) {
+  if (!profile || productFamily.empty()) return nullptr;
+  if (clientSections(*profile) == nullptr) {
+    ORVANTA_LOG(error, "HTTPSPostBackend(initWithName): can't find the client list.");
+    return nullptr;
+  }
+  return std::shared_ptr<HTTPSPostBackend>(
+      new HTTPSPostBackend(platform, std::move(name), std::move(profile), std::move(productFamily)));
+}
+
+HTTPSPostBackend::HTTPSPostBackend(Platform& platform, std::string name, SharedDictionary profile,
+                                   std::string productFamily)
+    : OrvantaBackend(platform, std::move(name), std::move(profile), std::move(productFamily)),
+      _dnuEnabled(platform.device().diagnosticsSubmissionAllowed()),
+      _forceEventLogging(forcesEventLogging(platform)),
+      _clientIdentity{Orvanta::of(platform).getPersistentIdentifierForDNU(true),
+                      Orvanta::of(platform).getPersistentIdentifierForDNU(false)},
+      _realtimePostURL(userDefaultStringForKey(platform, kRealtimePostURLKey)),
+      _postURL(userDefaultStringForKey(platform, kPostURLKey)) {
+  if (_postURL) {
+    _useDefaultPostURL = true;
+    ORVANTA_LOG(debug, "HTTPSPostBackend(initWithName): Using user default '{}' for postURL", *_postURL);
+  }
+  if (_realtimePostURL) {
+    _useDefaultRealtimePostURL = true;
+    ORVANTA_LOG(debug, "HTTPSPostBackend(initWithName): Using user default '{}' for realtimePostURL",
+                *_realtimePostURL);
+  }
+  if (const std::string* url = textUnder(*this->profile(), "display_url")) setDisplayURL(*url);
+}
+
+void HTTPSPostBackend::setUserInfoDict(SharedDictionary userInfo) {
+  _userInfo = RecordLayer::of(userInfo);
+  OrvantaBackend::setUserInfoDict(std::move(userInfo));
+}
+
+std::optional<std::string> HTTPSPostBackend::sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
+                                                         std::uint16_t method, std::uint16_t respCode,
+                                                         std::uint16_t eventID, std::int32_t flag) {
+  if (state() == kBackendDisabled) return std::nullopt;
+  SharedDictionary sent = isSessionEnd(method, respCode) ? sessionEndPayload(payload) : payload;
+  PreparedEvent event = newEventDictfromPayload(std::move(sent), timestamp, method, respCode, eventID);
+  event.record.prepare(_userInfo, _filters);
+
+  if (isPromoting(flag)) {
+    // Only a held backend is promoted: the server may have disabled it this moment.
+    std::int32_t held = kBackendSampledOut;
+    stateCell().compare_exchange_strong(held, kBackendEnabled);
+  }
+  const bool realtime = isRealtime(flag);
+  ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): realtime is {:d}", realtime);
+  const std::int32_t now = state();
+  const bool mayPost = now != kBackendWaiting && now != kBackendSampledOut;
+  const bool hasInfo = !identity().requireUserInfo || userInfoDict() != nullptr;
+  if (mayPost && (realtime || !batchEvents()) && hasInfo) return sendDirectly(event.record, method, respCode, flag);
+
+  ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): Batching {}, {:d}, {:d}", now, batchEvents(),
+              identity().requireUserInfo);
+  return batchEvent(std::move(event));
+}
+
+SharedDictionary HTTPSPostBackend::sessionEndPayload(const SharedDictionary& payload) const {
+  ORVANTA_LOG(debug,
+              "HTTPSPostBackend(sendMessage): Adding dnu type and sampling threshold to SESSION_TYPE_STOP message "
+              "dictionary");
+  if (!payload) {
+    ORVANTA_LOG(error, "HTTPSPostBackend(sendMessage): SESSION_TYPE_STOP message dictionary is nil");
+    return payload;
+  }
+  const auto numberOrNone = [](std::optional<double> number) {
+    return number ? platform::Value(*number) : platform::Value(-1);
+  };
+  auto extended = std::make_shared<platform::Dictionary>(*payload);
+  extended->set("Opt", static_cast<int>(_clientIdentity.dnuType()));
+  extended->set("SamplingThreshold", numberOrNone(samplingThreshold()));
+  extended->set("OverrideSampling", numberOrNone(_overrideSampling));
+  extended->set("Batch", batchEvents() ? 1 : 0);
+  return extended;
+}
+
+HTTPSPostBackend::PreparedEvent HTTPSPostBackend::newEventDictfromPayload(SharedDictionary payload,
+                                                                          platform::TimeValue timestamp,
+                                                                          std::uint16_t method, std::uint16_t respCode,
+                                                                          std::uint16_t eventID) {
+  if (!_sessionFields) _sessionFields = SessionFields::of(*this, isInternalBuild(platform()));
+  std::uint64_t labelsSeen = 0;
+  {
+    // Before the identifier is read, so that a relabelling in between is taken for one that the record missed.
+    const std::lock_guard lock(mutex());
+    labelsSeen = _batchedEvents.labels();
+  }
+  EventRecord::Numbers numbers;
+  numbers.method = method;
+  numbers.respCode = respCode;
+  numbers.eventID = eventID;
+  numbers.timezoneOffset = platform().device().timeZoneOffset(platform().clock().wallSeconds());
+  numbers.clientTS = _sessionFields->clientTS(timestamp);
+  return {EventRecord(_sessionFields, std::move(payload), combinedSessionIDString(), numbers), labelsSeen};
+}
+
+std::optional<std::string> HTTPSPostBackend::batchEvent(PreparedEvent event) {
+  const std::int32_t category = event.record.category();
+  const std::size_t footprint = event.record.footprint();
+  std::int32_t count = 0;
+  std::size_t waitingBytes = 0;
+  const auto look = [&] {
+    const std::lock_guard lock(mutex());
+    count = _batchedEvents.countOf(category);
+    waitingBytes = _batchedEvents.footprint();
+  };
+  look();
+  const bool reached = count > _eventThreshold;
+  // Held back events cannot be flushed; what that costs them is told below.
+  const bool tooLarge =
+      waitingBytes != 0 && waitingBytes + footprint > kMaximumBatchBytes && state() == kBackendEnabled;
+  std::optional<std::string> flushed;
+  if (reached || tooLarge) {
+    if (reached) {
+      ORVANTA_LOG(
+          debug,
+          "HTTPSPostBackend(batchEvent): Flushing all batched events as we reached event threshold for method {}",
+          category);
+    } else {
+      ORVANTA_LOG(notice, "HTTPSPostBackend(batchEvent): Flushing all batched events as they take {} bytes",
+                  waitingBytes);
+    }
+    flushed = flushMessagesWithCompletion({});
+    look();
+    if (reached) count = 0;
+  }
+  EventBatch::Events dropped;
+  const std::lock_guard lock(mutex());
+  if (waitingBytes != 0 && waitingBytes + footprint > kMaximumBatchBytes) {
+    // A flush keeps what it must not send; that must not grow for ever.
+    ORVANTA_LOG(warning, "HTTPSPostBackend(batchEvent): Dropping all batched events as they take {} bytes",
+                waitingBytes);
+    dropped = _batchedEvents.take();
+  }
+  _batchedEvents.append(std::move(event.record), footprint, count, event.labelsSeen);
+  return flushed;
+}
+
+std::optional<std::string> HTTPSPostBackend::sendDirectly(const EventRecord& record, std::uint16_t method,
+                                                          std::uint16_t respCode, std::int32_t flag) {
+  std::optional<std::string> flushed;
+  if (state() == kBackendEnabled && isRealtime(flag) && hasBatched()) {
+    ORVANTA_LOG(debug,
+                "HTTPSPostBackend(sendMessage): Got a realtime event and some events have already been batched. "
+                "Forcing Flush here to keep events in order.");
+    flushed = flushMessagesWithCompletion({});
+  }
+  ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): Sending {}, {:d}, {:d}", state(), batchEvents(),
+              identity().requireUserInfo);
+  const OutgoingEvent event{&record, {}};
+  PostMessage message = buildMessage({&event, 1});
+  std::optional<std::string> result = std::move(message.prettyJsonString);
+  if (flushed) {
+    result = fmt::format("Flushed events:\n{}\nStandalone event:\n{}", *flushed, result.value_or("(null)"));
+  }
+  postJSONMessage(std::move(message.json), flag, EventMap{method, respCode}, {});
+  if (flushed) _immutable = true;
+  return result;
+}
+
+std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCompletion completion) {
+  if (hasBatched()) {
+    std::optional<platform::BlockingScope> large;
+    if (batchedBytes() > kLargeBatch) large.emplace();
+    if (state() == kBackendEnabled) return flushEnabled(std::move(completion));
+    EventBatch::Events dropped;
+    const std::lock_guard lock(mutex());
+    dropped = _batchedEvents.take();
+  }
+  completeWithError(completion, "Nothing to flush");
+  return std::nullopt;
+}
+
+std::optional<std::string> HTTPSPostBackend::flushEnabled(FlushCompletion completion) {
+  if (identity().requireUserInfo && !userInfoDict()) {
+    completeWithError(completion, "Can not flush: userInfo is required");
+    return std::nullopt;
+  }
+  ORVANTA_LOG(debug, "HTTPSPostBackend(flushMessagesWithCompletion): called");
+  std::shared_ptr<const RecordLayer> userInfo = _userInfo;
+  if (userInfo && !_filters.empty()) {
+    auto filtered = std::make_shared<platform::Dictionary>(userInfo->entries());
+    _filters.filterEvent(*filtered);
+    userInfo = RecordLayer::of(std::move(filtered));
+  }
+  EventBatch::Events events;
+  {
+    const std::lock_guard lock(mutex());
+    events = _batchedEvents.take();
+    _batchedEvents.clearCounts();
+  }
+  const std::vector<OutgoingEvent> outgoing = outgoingEvents(events, userInfo.get());
+  if (outgoing.empty()) {
+    completeWithError(completion, "Nothing to flush: batched events were completely filtered out");
+    return std::nullopt;
+  }
+  PostMessage message = buildMessage(outgoing);
+  std::optional<std::string> text = message.prettyJsonString;
+  PostCompletion posted;
+  if (completion) {
+    posted = [completion = std::move(completion), text = std::move(message.prettyJsonString)](
+                 std::optional<OrvantaError> error) mutable { completion(std::move(text), std::move(error)); };
+  }
+  postJSONMessage(std::move(message.json), 0, std::nullopt, std::move(posted));
+  if (text) _immutable = true;
+  return text;
+}
+
+std::vector<OutgoingEvent> HTTPSPostBackend::outgoingEvents(const EventBatch::Events& events,
+                                                            const RecordLayer* userInfo) const {
+  std::vector<OutgoingEvent> outgoing;
+  outgoing.reserve(events.records.size());
+  for (std::size_t i = 0; i < events.records.size(); ++i) {
+    const EventRecord& record = events.records[i];
+    const auto category = static_cast<std::uint16_t>(record.category());
+    if (!isWhitelistedEvent(category)) {
+      ORVANTA_LOG(
+          debug, "flushMessagesWithCompletion: Dropping event with category {} as it is not whitelisted for backend {}",
+          category, name());
+      continue;
+    }
+    if (isBlacklistedEvent(category)) {
+      ORVANTA_LOG(debug,
+                  "flushMessagesWithCompletion: Dropping event with category {} as it is blacklisted for backend {}",
+                  category, name());
+      continue;
+    }
+    EventRecord::Overlay overlay = events.overlayFor(i);
+    overlay.userInfo = userInfo;
+    outgoing.push_back({&record, overlay});
+  }
+  return outgoing;
+}
+
+PostMessage HTTPSPostBackend::buildMessage(std::span<const OutgoingEvent> events) const {
+  const double postTime = timevalToSeconds(platform().clock().timeOfDay());
+  return createMessageForPostAndLogging(postTime, _clientIdentity.choose(identity().isInternal, identity().udid),
+                                        events, showsMessages());
+}
+
+// People see what was sent where they have agreed to it, or where the environment is theirs and they have asked for it.
+bool HTTPSPostBackend::showsMessages() const {
+  if (_clientIdentity.dnuType() == ClientIdentity::kConsentRespected && _dnuEnabled) return true;
+  if (!_forceEventLogging) return false;
+  const EnvironmentType environment = currentEnvironmentType(platform());
+  return environment == EnvironmentType::development || environment == EnvironmentType::internal;
+}
+
+bool HTTPSPostBackend::hasBatched() const {
+  const std::lock_guard lock(mutex());
+  return _batchedEvents.exists();
+}
+
+std::size_t HTTPSPostBackend::batchedBytes() const {
+  const std::lock_guard lock(mutex());
+  return _batchedEvents.footprint();
+}
+
+void HTTPSPostBackend::setCorrelatedSessionID(std::optional<std::string> combined) {
+  setCombinedSessionIDString(combined);
+  const std::lock_guard lock(mutex());
+  _batchedEvents.relabel(combined);
+}
+
+}  // namespace orvanta

@@ -1,0 +1,53 @@
+// HTTPSPostBackend: what a post carries besides its message.
+
+#include <fmt/format.h>
+
+#include "backends/https/HTTPSPostBackend.h"
+#include "config/ClientTypes.h"
+#include "interface/OrvantaConstants.h"
+
+namespace orvanta {
+
+std::optional<std::string> userInfoText(const SharedDictionary& userInfo, std::string_view key) {
+  const platform::Value* value = userInfo ? userInfo->find(key) : nullptr;
+  if (value == nullptr || (value->string() == nullptr && !value->isNumber())) return std::nullopt;
+  return value->description();
+}
+
+void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t flag, std::optional<EventMap> eventMap,
+                                       PostCompletion completion) {
+  const bool realtime = flag == 1 || flag == 3;
+  std::optional<std::string> url = realtime ? _realtimePostURL : postURL();
+  if (!url) {
+    if (completion) completion(makeOrvantaError("postURL is nil", -1));
+    return;
+  }
+  if (!_postQueue) _postQueue = std::make_shared<PostQueue>(platform(), weak_from_this(), name());
+  _postQueue->post({std::move(*url), postHeaders(eventMap), std::move(json), std::move(completion)});
+}
+
+std::vector<platform::HttpHeader> HTTPSPostBackend::postHeaders(const std::optional<EventMap>& eventMap) const {
+  const BackendIdentity& facts = identity();
+  std::vector<platform::HttpHeader> headers;
+  headers.reserve(12);
+  if (auto client = userInfoText(userInfoDict(), kOrvantaUserInfoClientName)) {
+    headers.push_back({"X-ORV-Client-Name", std::move(*client)});
+  }
+  if (auto service = userInfoText(userInfoDict(), kOrvantaUserInfoServiceName)) {
+    headers.push_back({"X-ORV-Service-Name", std::move(*service)});
+  }
+  if (facts.isInternal) headers.push_back({"X-ORV-Internal-Build", "1"});
+  headers.push_back(
+      {"User-Agent", fmt::format("Orvanta/{} ({}; {})", selfVersion().text(), facts.hardwareType.value_or("(null)"),
+                                 facts.productVersion.value_or("(null)"))});
+  headers.push_back({"X-ORV-Client-Version", std::to_string(facts.clientVersion)});
+  headers.push_back({"X-ORV-Sender", std::string(senderCodeForClientType(facts.compType))});
+  if (eventMap) {
+    headers.push_back({"X-ORV-Event-Map", fmt::format("{} {}", eventMap->method, eventMap->respCode)});
+  }
+  headers.push_back({"Accept", "application/json"});
+  headers.push_back({"Content-Type", "application/json"});
+  return headers;
+}
+
+}  // namespace orvanta

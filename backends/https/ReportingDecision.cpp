@@ -1,0 +1,199 @@
+#include "backends/https/ReportingDecision.h"
+
+#include <algorithm>
+#include <cmath>
+
+#include "backends/https/ClientIdentity.h"
+#include "backends/https/ClientSection.h"
+#include "backends/https/StringMatching.h"
+
+namespace orvanta {
+namespace {
+
+using platform::Dictionary;
+using platform::Value;
+
+bool isForClient(const Dictionary& section, const ReportingFacts& facts) {
+  return matchClientNameAndServiceID(section, facts.clientName, facts.serviceName);
+}
+
+// Decides by the first section for the client whether events are batched, against what the session asked for.
+void takeExpedite(ReportingDecision& decision, const platform::Array& sections, const ReportingFacts& facts) {
+  for (const Value& element : sections) {
+    const Dictionary* section = element.dictionary();
+    if (section == nullptr || !isForClient(*section, facts)) continue;
+    if (const auto expedite = realUnder(*section, "expedite")) decision.settings.batchEvents = *expedite == 0;
+    return;
+  }
+}
+
+void takeCounters(ReportingDecision& decision, const Dictionary* section) {
+  ReportingSettings::Counters counters;
+  if (section != nullptr) {
+    counters.eventThreshold = intUnder(*section, "event_threshold").value_or(0);
+    counters.extrasOnInternal = intUnder(*section, "extras_on_internal").value_or(0);
+  }
+  decision.settings.counters = counters;
+}
+
+void reportWithoutUserInfo(ReportingDecision& decision, const platform::Array& sections, const ReportingFacts& facts) {
+  const Dictionary* source = nullptr;
+  for (const Value& element : sections) {
+    const Dictionary* section = element.dictionary();
+    if (section == nullptr) continue;
+    decision.settings.linkSections.push_back(section);
+    if (facts.postURLFixed || textUnder(*section, "post_url") == nullptr) continue;
+    source = section;
+    break;
+  }
+  takeCounters(decision, source);
+  decision.state = kBackendEnabled;
+  decision.reason.test = ReportingTest::userInfoNotRequired;
+}
+
+// The first section for the client that is enabled for this version; null, with the reason, when there is none.
+const Dictionary* chooseSection(ReportingReason& reason, const platform::Array& sections, const ReportingFacts& facts) {
+  reason.test = ReportingTest::noSectionMatches;
+  for (std::size_t i = 0; i < sections.size(); ++i) {
+    const Dictionary* section = sections[i].dictionary();
+    if (section == nullptr || !isForClient(*section, facts)) continue;
+    if (isFrameworkEnabledForClient(*section, facts.ownVersion)) {
+      reason.section = i;
+      reason.subject.reset();
+      return section;
+    }
+    if (reason.section) continue;
+    reason.test = ReportingTest::versionTooLow;
+    reason.section = i;
+    reason.subject = section->find("enabledSince")->description();
+  }
+  return nullptr;
+}
+
+// A list test that refuses says so with the text and the list that it looked at.
+bool refuseByList(ReportingReason& reason, ReportingTest test, const Dictionary& section, std::string_view key,
+                  const std::optional<std::string>& text) {
+  reason.test = test;
+  reason.subject = text;
+  if (const Value* list = section.find(key)) reason.list = list->description();
+  return false;
+}
+
+// Consent, country, device and filters. False, with the reason, when one of them refuses.
+bool passesTests(ReportingDecision& decision, const Dictionary& section, const ReportingFacts& facts) {
+  ReportingReason& reason = decision.reason;
+  // Consent is overridden by a number alone: a value that makes no sense overrides nothing.
+  const Value* override = section.find("override_dnu");
+  if (override != nullptr && override->isNumber()) reason.overrideDNU = *intUnder(section, "override_dnu");
+  // Compared unrounded: 1.5 is not the 1 that overrides.
+  if (reason.overrideDNU == 1 && realUnder(section, "override_dnu") == 1.0) {
+    decision.settings.dnuType =
+        facts.consent ? ClientIdentity::kConsentOverriddenGiven : ClientIdentity::kConsentOverriddenNotGiven;
+  } else {
+    decision.settings.dnuType = ClientIdentity::kConsentRespected;
+    reason.test = ReportingTest::consentMissing;
+    if (!facts.consent) return false;
+  }
+  // An unknown country passes any list that has an entry; without one nobody reports.
+  if (!matchStringWithList(textsUnder(section, "locale_whitelist"), facts.countryCode, false)) {
+    return refuseByList(reason, ReportingTest::countryNotListed, section, "locale_whitelist", facts.countryCode);
+  }
+  if (!matchStringWithList(textsUnder(section, "device_whitelist"), facts.productFamily, true)) {
+    return refuseByList(reason, ReportingTest::familyNotListed, section, "device_whitelist", facts.productFamily);
+  }
+  if (matchStringWithList(textsUnder(section, "device_blacklist"), facts.productModel, false)) {
+    return refuseByList(reason, ReportingTest::modelBlacklisted, section, "device_blacklist", facts.productModel);
+  }
+  const Value* filters = section.find("filters");
+  reason.test = ReportingTest::filtersMissing;
+  if (filters == nullptr) return false;
+  // An empty list keeps the filters of an earlier evaluation.
+  if (!filters->array()->empty()) {
+    decision.settings.filters = std::move(*EventFilters::createFiltersFromArray(*filters->array()));
+  }
+  return true;
+}
+
+void takeSampling(ReportingDecision& decision, const Dictionary& section, const ReportingFacts& facts) {
+  auto& sampling = decision.settings.sampling.emplace();
+  sampling.threshold = realUnder(section, "sampling_threshold");
+  const Value* byCountry = section.find("per_country_sampling_thresholds");
+  if (byCountry == nullptr || !facts.countryCode) return;
+  for (const Value& element : *byCountry->array()) {
+    const TextList countries = textsUnder(*element.dictionary(), "country");
+    if (std::find(countries.begin(), countries.end(), *facts.countryCode) == countries.end()) continue;
+    const auto threshold = realUnder(*element.dictionary(), "threshold");
+    sampling.changedByCountry =
+        ReportingSettings::CountryThreshold{*facts.countryCode, sampling.threshold.value_or(0), threshold.value_or(0)};
+    sampling.threshold = threshold;
+    return;
+  }
+}
+
+void decideBySampling(ReportingDecision& decision, const Dictionary& section, double factor) {
+  ReportingReason& reason = decision.reason;
+  const auto conclude = [&](BackendState state, ReportingTest test) {
+    decision.state = state;
+    reason.test = test;
+  };
+  reason.samplingFactor = factor;
+  reason.threshold = decision.settings.sampling->threshold;
+  if (!reason.threshold || std::isnan(*reason.threshold)) {
+    return conclude(kBackendDisabled, ReportingTest::noSamplingThreshold);
+  }
+  if (factor <= *reason.threshold) return conclude(kBackendEnabled, ReportingTest::sampledIn);
+  reason.overrideSampling = realUnder(section, "override_sampling");
+  decision.settings.overrideSampling.emplace().value = reason.overrideSampling;
+  if (!reason.overrideSampling || factor <= *reason.overrideSampling) {
+    return conclude(kBackendSampledOut, ReportingTest::held);
+  }
+  conclude(kBackendDisabled, ReportingTest::sampledOut);
+}
+
+std::optional<ReportingSettings::EventList> eventList(const Dictionary& section, std::string_view key) {
+  const Value* list = section.find(key);
+  if (list == nullptr) return std::nullopt;
+  ReportingSettings::EventList taken;
+  taken.source = list;
+  for (const Value& element : *list->array()) {
+    taken.categories.push_back(static_cast<std::int32_t>(element.integerValue()));
+  }
+  return taken;
+}
+
+}  // namespace
+
+ReportingDecision evaluate(const Dictionary& profile, const ReportingFacts& facts) {
+  ReportingDecision decision;
+  const platform::Array* sections = clientSections(profile);
+  if (sections == nullptr) return decision;
+  takeExpedite(decision, *sections, facts);
+  if (!facts.requireUserInfo) {
+    reportWithoutUserInfo(decision, *sections, facts);
+    return decision;
+  }
+  if (!facts.hasUserInfo) {
+    decision.state = kBackendWaiting;
+    decision.reason.test = ReportingTest::waitingForUserInfo;
+    return decision;
+  }
+  const Dictionary* section = chooseSection(decision.reason, *sections, facts);
+  if (section == nullptr) return decision;
+  if (auto malformed = findMalformedKey(*section)) {
+    decision.reason.test = ReportingTest::malformedSection;
+    decision.reason.subject = std::move(malformed->key);
+    decision.reason.list = std::move(malformed->problem);
+    return decision;
+  }
+  if (!passesTests(decision, *section, facts)) return decision;
+  takeSampling(decision, *section, facts);
+  decideBySampling(decision, *section, facts.samplingFactor);
+  takeCounters(decision, section);
+  decision.settings.customClientID = section->contains("custom_clientId");
+  decision.settings.linkSections.push_back(section);
+  decision.settings.eventWhitelist = eventList(*section, "event_whitelist");
+  decision.settings.eventBlacklist = eventList(*section, "event_blacklist");
+  return decision;
+}
+
+}  // namespace orvanta

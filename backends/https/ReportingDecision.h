@@ -1,0 +1,75 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "backends/OrvantaBackend.h"
+#include "backends/https/EventFilters.h"
+#include "backends/https/ReportingReason.h"
+
+namespace orvanta {
+
+// What an evaluation looks at besides the storebag.
+struct ReportingFacts {
+  std::optional<std::string> clientName;
+  std::optional<std::string> serviceName;
+  bool requireUserInfo = false;
+  bool hasUserInfo = false;
+  OrvantaBackend::SelfVersion ownVersion;
+  bool consent = false;  // the user's, to diagnostics submission
+  std::optional<std::string> countryCode;
+  std::string productFamily;
+  std::optional<std::string> productModel;
+  double samplingFactor = 0;
+  bool postURLFixed = false;  // by a user default, so that no section supplies it
+};
+
+// What an evaluation wants taken, in the order in which it is to be taken. What is none stays as it was. Pointers lead
+// into the profile.
+struct ReportingSettings {
+  struct CountryThreshold {
+    std::string countryCode;
+    double from = 0;  // 0 when there was none, as is `to`
+    double to = 0;
+  };
+  struct Sampling {
+    std::optional<double> threshold;
+    std::optional<CountryThreshold> changedByCountry;
+  };
+  struct OverrideSampling {
+    std::optional<double> value;
+  };
+  struct Counters {
+    std::int32_t eventThreshold = 0;
+    std::int32_t extrasOnInternal = 0;
+  };
+  struct EventList {
+    std::vector<std::int32_t> categories;
+    const platform::Value* source = nullptr;
+  };
+
+  std::optional<bool> batchEvents;
+  std::optional<std::int32_t> dnuType;
+  std::optional<EventFilters> filters;
+  std::optional<Sampling> sampling;
+  std::optional<OverrideSampling> overrideSampling;
+  std::optional<Counters> counters;
+  bool customClientID = false;
+  std::vector<const platform::Dictionary*> linkSections;  // each supplies URLs, the later over the earlier
+  std::optional<EventList> eventWhitelist;
+  std::optional<EventList> eventBlacklist;
+};
+
+struct ReportingDecision {
+  std::int32_t state = kBackendDisabled;
+  ReportingReason reason;
+  ReportingSettings settings;
+};
+
+// Whether and how a backend with this profile reports. Pure: no clock, no logs, no I/O. Elements of "clients" that are
+// no dictionaries are passed over; a chosen section whose restrictions make no sense reports nothing.
+ReportingDecision evaluate(const platform::Dictionary& profile, const ReportingFacts& facts);
+
+}  // namespace orvanta

@@ -1,0 +1,77 @@
+#include "backends/https/SessionFields.h"
+
+#include "backends/https/EventField.h"
+#include "config/ClientTypes.h"
+#include "config/Conversions.h"
+
+namespace orvanta {
+namespace {
+
+// These client types are told apart by the number that the client gave its session.
+bool reportsNumericSessionID(std::int32_t clientType, bool isInternal) {
+  return clientType == 7 || (isInternal && (clientType == 11 || clientType == 13));
+}
+
+platform::Value valueOrNull(const std::optional<std::string>& text) {
+  return text ? platform::Value(*text) : platform::Value();
+}
+
+}  // namespace
+
+std::shared_ptr<const SessionFields> SessionFields::of(const OrvantaBackend& backend, bool internalBuild) {
+  const BackendIdentity& identity = backend.identity();
+  auto fields = std::make_shared<SessionFields>();
+  fields->startTimeStamp = backend.startTimeStamp();
+  fields->startTS = roundDownToMinute(static_cast<std::int32_t>(fields->startTimeStamp));
+  fields->sender = senderCodeForClientType(identity.compType);
+  fields->clientVersion = identity.clientVersion;
+  fields->productFamily = backend.productFamily();
+  fields->productModel = identity.hardwareType;
+  fields->osVersion = identity.productVersion;
+  fields->build = identity.buildVersion;
+  fields->internal = internalBuild ? 3 : 2;
+  fields->reportVers = backend.selfVersion().text();
+  if (reportsNumericSessionID(identity.compType, identity.isInternal)) fields->numericSessionID = identity.sessionID;
+
+  FieldWriter writer(fields->json, FieldWriter::Form::compact);
+  for (std::size_t i = 0; i <= static_cast<std::size_t>(ReservedKey::reportVers); ++i) {
+    const auto key = static_cast<ReservedKey>(i);
+    const platform::Value value = fields->value(key);
+    if (value.isNull()) continue;
+    fields->present |= setOf(key);
+    writer.value(nameOf(key), value);
+  }
+  fields->json.erase(0, 1);  // the brace
+  return fields;
+}
+
+platform::Value SessionFields::value(ReservedKey key) const {
+  switch (key) {
+    case ReservedKey::startTS:
+      return startTS;
+    case ReservedKey::sender:
+      return sender;
+    case ReservedKey::clientVersion:
+      return static_cast<int>(clientVersion);
+    case ReservedKey::productFamily:
+      return productFamily;
+    case ReservedKey::productModel:
+      return valueOrNull(productModel);
+    case ReservedKey::osVersion:
+      return valueOrNull(osVersion);
+    case ReservedKey::build:
+      return valueOrNull(build);
+    case ReservedKey::internal:
+      return internal;
+    case ReservedKey::reportVers:
+      return reportVers;
+    default:
+      return nullptr;
+  }
+}
+
+double SessionFields::clientTS(platform::TimeValue eventTime) const {
+  return sanitizeDouble(static_cast<double>(startTS) + (timevalToSeconds(eventTime) - startTimeStamp));
+}
+
+}  // namespace orvanta

@@ -1,0 +1,141 @@
+#include "backends/upload/UploadBackend.h"
+
+#include <utility>
+
+#include "backends/upload/UploadBudget.h"
+#include "backends/upload/UploadURL.h"
+#include "config/Compression.h"
+#include "interface/OrvantaLogging.h"
+#include "platform/core/Utf8.h"
+
+namespace orvanta {
+
+namespace {
+
+// Files of /proc and /sys do not tell their size. One is taken up to this.
+constexpr std::uint64_t kUnsizedBytes = 1U << 20U;
+
+// What is read at most. One byte beyond the bound tells a whole file from the start of one.
+std::uint64_t bytesToRead(std::uint64_t size) {
+  return size > 0 ? size : kUnsizedBytes + 1;
+}
+
+std::optional<std::string> textAt(const SharedDictionary& dictionary, std::string_view key) {
+  const platform::Value* value = dictionary ? dictionary->find(key) : nullptr;
+  const std::string* text = value == nullptr ? nullptr : value->string();
+  return text == nullptr ? std::nullopt : std::optional(*text);
+}
+
+// The file's content, compressed; none when there is nothing to send, with the reason in the log.
+std::optional<std::string> compressedContent(const platform::ExtensionHandle& handle, std::uint64_t size) {
+  const platform::BlockingScope blocking;  // a slow file system, and seconds of compression
+  const std::optional<std::string> content = handle.read(static_cast<std::size_t>(bytesToRead(size)));
+  if (!content || content->empty()) {
+    ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): Input file is empty");
+    return std::nullopt;
+  }
+  if (size == 0 && content->size() > kUnsizedBytes) {
+    ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): The file does not tell its size and has more than {} bytes.",
+                kUnsizedBytes);
+    return std::nullopt;
+  }
+  return gzipDeflate(*content);
+}
+
+}  // namespace
+
+std::shared_ptr<UploadBackend> UploadBackend::create(Platform& platform, std::string name, SharedDictionary profile,
+                                                     std::string productFamily) {
+  std::optional<std::string> url = textAt(profile, "post_url");
+  if (!url) {
+    ORVANTA_LOG(error, "UploadBackend(initWithName): can't resolve upload post URL.");
+    return nullptr;
+  }
+  auto backend =
+      std::make_shared<UploadBackend>(Made{}, platform, std::move(name), std::move(profile), std::move(productFamily));
+  backend->setUploadURL(std::move(url));
+  return backend;
+}
+
+UploadBackend::UploadBackend(Made, Platform& platform, std::string name, SharedDictionary profile,
+                             std::string productFamily)
+    : OrvantaBackend(platform, std::move(name), std::move(profile), std::move(productFamily)) {
+  setDisplayURL(textAt(this->profile(), "display_url"));
+}
+
+std::optional<std::string> UploadBackend::uploadURL() const {
+  const std::lock_guard lock(mutex());
+  return _uploadURL;
+}
+
+void UploadBackend::setUploadURL(std::optional<std::string> url) {
+  const std::lock_guard lock(mutex());
+  _uploadURL.swap(url);
+}
+
+bool UploadBackend::uploadFileAtPath(const UploadFile& file) {
+  ORVANTA_LOG(debug, "UploadBackend(uploadFileAtPath): Uploading file {}", file.path);
+  const std::optional<std::string> url = uploadURL();
+  if (!url) return false;
+
+  const auto handle = platform::ExtensionHandle::consume(file.extensionToken, file.descriptor);
+  const std::optional<std::uint64_t> size = handle.regularFileSize();
+  if (!size) {
+    ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): Only upload a regular file.");
+    return false;
+  }
+  if (*size > UploadBudget::kMaximumFileBytes) {
+    ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): The file has {} bytes, more than the limit of {}.", *size,
+                UploadBudget::kMaximumFileBytes);
+    return false;
+  }
+
+  std::unique_ptr<UploadBudget::Share> share;
+  {
+    const platform::BlockingScope waitingForOthers;
+    share = UploadBudget::Share::take(UploadBudget::of(platform()), UploadBudget::kCopies * bytesToRead(*size));
+  }
+  if (!share) {
+    ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): The daemon is ending.");
+    return false;
+  }
+  std::optional<std::string> body = compressedContent(handle, *size);
+  if (!body) return false;
+  share->shrinkTo(body->size());
+
+  std::optional<platform::HttpRequest> request = makeRequest(*url, file, std::move(*body));
+  if (!request) return false;
+  // One request at a time, for which the caller waits; the memory it takes is in the budget.
+  const auto lane = platform().http().makeLane(platform::HttpClient::LaneKind::unrefused);
+  handleAnswer(*url, file, platform().http().perform(lane, std::move(*request)));
+  return true;
+}
+
+std::optional<platform::HttpRequest> UploadBackend::makeRequest(const std::string& uploadURL, const UploadFile& file,
+                                                                std::string body) const {
+  platform::HttpRequest request;
+  request.method = "POST";
+  request.url = fileUploadURL(uploadURL, identity().udid, identity().sessionID, file.path);
+  if (!isValidURL(request.url)) {
+    ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): Unable to create URL request");
+    return std::nullopt;
+  }
+  request.headers = {{"Content-Type", "application/octet-stream"}, {"Content-Encoding", "gzip"}};
+  request.body = std::move(body);
+  return request;
+}
+
+void UploadBackend::handleAnswer(const std::string& uploadURL, const UploadFile& file,
+                                 const platform::HttpResult& result) {
+  if (!result.response) {
+    ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): post {}", result.error);
+    return;
+  }
+  const std::string& body = result.response->body;
+  const bool isText = platform::isValidUtf8(body);
+  ORVANTA_LOG(debug, "UploadBackend(uploadFileAtPath): sending to |{}|, Json output: {}", uploadURL,
+              isText ? std::string_view(body) : "(null)");
+  if (isText && body.find("success") != std::string::npos && file.removeFile) file.removeFile();
+}
+
+}  // namespace orvanta
