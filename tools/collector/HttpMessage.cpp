@@ -214,4 +214,11 @@ std::optional<std::int64_t> parseHttpDate(const std::string& text) {
   return ::timegm(&parts);
 }
 
+const std::string* findHeader(const HeaderFields& headers, std::string_view name) {
+  for (const auto& [key, value] : headers) {
+    if (key.size() == name.size() && ::strncasecmp(key.data(), name.data(), key.size()) == 0) return &value;
+  }
+  return nullptr;
+}
+
 }  // namespace orvanta::collector

@@ -5,13 +5,19 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
+#include <vector>
 
 #include "platform/core/Result.h"
-#include "tools/collector/ReceivedRecords.h"
 
 namespace orvanta::collector {
 
 // Reading HTTP/1 messages as bytes, with the header fields in their order. No I/O.
+
+using HeaderFields = std::vector<std::pair<std::string, std::string>>;
+
+// The first field of that name, in any case; null when there is none.
+const std::string* findHeader(const HeaderFields& headers, std::string_view name);
 
 struct RequestHead {
   std::string method;

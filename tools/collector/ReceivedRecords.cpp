@@ -1,11 +1,8 @@
 #include "tools/collector/ReceivedRecords.h"
 
-#include <strings.h>
-
 #include <algorithm>
 #include <array>
-
-#include "tools/collector/HttpMessage.h"
+#include <utility>
 
 namespace orvanta::collector {
 
@@ -28,13 +25,6 @@ std::optional<RequestKind> requestKindFromText(std::string_view text) {
       std::find_if(kKindTexts.begin(), kKindTexts.end(), [&](const auto& entry) { return entry.second == text; });
   if (row == kKindTexts.end()) return std::nullopt;
   return row->first;
-}
-
-const std::string* findHeader(const HeaderFields& headers, std::string_view name) {
-  for (const auto& [key, value] : headers) {
-    if (key.size() == name.size() && ::strncasecmp(key.data(), name.data(), key.size()) == 0) return &value;
-  }
-  return nullptr;
 }
 
 std::optional<std::string> ReceivedRequest::parameter(std::string_view name) const {

@@ -5,10 +5,10 @@
 #include <optional>
 #include <string>
 #include <string_view>
-#include <utility>
 #include <vector>
 
 #include "platform/core/Value.h"
+#include "tools/collector/HttpMessage.h"
 
 namespace orvanta::collector {
 
@@ -16,11 +16,6 @@ namespace orvanta::collector {
 enum class RequestKind { storebag, events, logData, upload, other };
 std::string_view requestKindText(RequestKind kind);
 std::optional<RequestKind> requestKindFromText(std::string_view text);
-
-using HeaderFields = std::vector<std::pair<std::string, std::string>>;
-
-// The first field of that name, in any case; null when there is none.
-const std::string* findHeader(const HeaderFields& headers, std::string_view name);
 
 // One HTTP request as it stood on the wire, and how it was answered.
 struct ReceivedRequest {
