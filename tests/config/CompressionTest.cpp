@@ -7,7 +7,7 @@
 
 #include "tests/support/LogCapture.h"
 #include "tests/support/Threads.h"
-#include "tools/collector/BodyDecoder.h"
+#include "tools/collector/wire/BodyDecoder.h"
 
 namespace orvanta {
 namespace {

@@ -13,7 +13,7 @@
 #include "platform/codec/Json.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tools/collector/Collector.h"
-#include "tools/collector/Transport.h"
+#include "tools/collector/wire/Transport.h"
 
 namespace orvanta::collector {
 

@@ -1,4 +1,4 @@
-#include "tools/collector/DashboardServer.h"
+#include "tools/collector/servers/DashboardServer.h"
 
 #include <gmock/gmock.h>
 

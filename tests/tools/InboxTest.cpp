@@ -1,4 +1,4 @@
-#include "tools/collector/Inbox.h"
+#include "tools/collector/store/Inbox.h"
 
 #include <gmock/gmock.h>
 

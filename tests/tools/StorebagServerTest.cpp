@@ -1,4 +1,4 @@
-#include "tools/collector/StorebagServer.h"
+#include "tools/collector/servers/StorebagServer.h"
 
 #include <gmock/gmock.h>
 

@@ -5,11 +5,11 @@
 #include <filesystem>
 #include <utility>
 
-#include "tools/collector/ApiServer.h"
-#include "tools/collector/BackendConnections.h"
-#include "tools/collector/DashboardServer.h"
-#include "tools/collector/Relay.h"
-#include "tools/collector/TlsServer.h"
+#include "tools/collector/api/ApiServer.h"
+#include "tools/collector/servers/BackendConnections.h"
+#include "tools/collector/servers/DashboardServer.h"
+#include "tools/collector/servers/Relay.h"
+#include "tools/collector/wire/TlsServer.h"
 
 namespace orvanta::collector {
 

@@ -8,10 +8,10 @@
 
 #include "platform/core/Result.h"
 #include "platform/core/Value.h"
-#include "tools/collector/AcknowledgementSettings.h"
-#include "tools/collector/Behaviours.h"
 #include "tools/collector/CollectorOptions.h"
-#include "tools/collector/ReceivedRecords.h"
+#include "tools/collector/servers/AcknowledgementSettings.h"
+#include "tools/collector/servers/Behaviours.h"
+#include "tools/collector/store/ReceivedRecords.h"
 
 namespace orvanta::collector {
 

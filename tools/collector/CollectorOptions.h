@@ -5,9 +5,9 @@
 #include <functional>
 #include <string>
 
-#include "tools/collector/Certificates.h"
-#include "tools/collector/Inbox.h"
-#include "tools/collector/StorebagServer.h"
+#include "tools/collector/servers/StorebagServer.h"
+#include "tools/collector/store/Inbox.h"
+#include "tools/collector/wire/Certificates.h"
 
 namespace orvanta::collector {
 

@@ -1,7 +1,7 @@
 #include "tests/backends/https/HTTPSFixture.h"
 
 #include "platform/codec/Json.h"
-#include "tools/collector/BodyDecoder.h"
+#include "tools/collector/wire/BodyDecoder.h"
 
 namespace orvanta::test {
 

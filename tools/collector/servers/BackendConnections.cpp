@@ -1,0 +1,79 @@
+#include "tools/collector/servers/BackendConnections.h"
+
+#include <charconv>
+#include <utility>
+
+#include "tools/collector/wire/MessageReader.h"
+
+namespace orvanta::collector {
+
+using platform::Failure;
+using platform::Result;
+
+namespace {
+
+constexpr std::size_t kKeptIdle = 4;
+constexpr std::size_t kMaximumAnswerBytes = 1U << 30U;
+
+}  // namespace
+
+std::unique_ptr<Transport> BackendConnections::take() {
+  std::unique_lock lock(_mutex);
+  _condition.wait(lock, [&] { return _inUse < kMaximum; });
+  ++_inUse;
+  while (!_idle.empty()) {
+    auto connection = std::move(_idle.back());
+    _idle.pop_back();
+    // The library closes connections that were idle for long; that shows as something to read.
+    if (!connection->readable()) return connection;
+  }
+  lock.unlock();
+  return Transport::connectLoopback(_port);
+}
+
+void BackendConnections::giveBack(std::unique_ptr<Transport> connection) {
+  const std::lock_guard lock(_mutex);
+  --_inUse;
+  if (connection && _idle.size() < kKeptIdle) _idle.push_back(std::move(connection));
+  _condition.notify_one();
+}
+
+void BackendConnections::closeIdle() {
+  const std::lock_guard lock(_mutex);
+  _idle.clear();
+}
+
+Result<BackendAnswer> BackendConnections::exchangeOn(Transport& connection, const std::string& head,
+                                                     bool answerHasBody) {
+  if (!connection.write(head)) return Failure{"the HTTP library does not take the request"};
+  MessageReader reader(connection);
+  auto answerHead = reader.readHead();
+  if (!answerHead) return Failure{answerHead.error()};
+  if (!answerHead.value()) return Failure{"the HTTP library closed the connection"};
+  auto parsed = parseResponseHead(*answerHead.value());
+  if (!parsed) return Failure{parsed.error()};
+  BackendAnswer answer{std::move(parsed.value()), {}};
+  const std::string* length = findHeader(answer.head.headers, "Content-Length");
+  std::size_t size = 0;
+  if (length != nullptr) std::from_chars(length->data(), length->data() + length->size(), size);
+  if (!answerHasBody || size == 0) return answer;
+  if (size > kMaximumAnswerBytes) return Failure{"the HTTP library's answer is too long"};
+  auto body = reader.readBody(size);
+  if (!body) return Failure{body.error()};
+  answer.body = std::move(body.value());
+  return answer;
+}
+
+Result<BackendAnswer> BackendConnections::exchange(const std::string& head, bool answerHasBody) {
+  Result<BackendAnswer> answer = Failure{"the HTTP library cannot be reached"};
+  // A kept connection may be closed just now, so a second one is tried; handlers may run twice without harm.
+  for (int attempt = 0; attempt < 2 && !answer; ++attempt) {
+    auto connection = take();
+    if (connection) answer = exchangeOn(*connection, head, answerHasBody);
+    if (!answer) connection.reset();
+    giveBack(std::move(connection));
+  }
+  return answer;
+}
+
+}  // namespace orvanta::collector

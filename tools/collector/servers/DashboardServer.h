@@ -1,0 +1,74 @@
+#pragma once
+
+#include <netinet/in.h>
+
+#include <chrono>
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <random>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/core/Result.h"
+#include "platform/core/UniqueFd.h"
+#include "tools/collector/servers/AcknowledgementSettings.h"
+#include "tools/collector/store/Inbox.h"
+
+namespace orvanta::collector {
+
+// Receives dashboard datagrams on one UDP port, keeps them in the inbox and acknowledges those that ask for it, on a
+// thread of its own. stop() and the settings may be called on any other thread.
+class DashboardServer {
+ public:
+  // Port 0 takes any free one. The inbox outlives the server.
+  static platform::Result<std::unique_ptr<DashboardServer>> start(const std::string& address, std::uint16_t port,
+                                                                  Inbox& inbox);
+  ~DashboardServer();
+  DashboardServer(const DashboardServer&) = delete;
+  DashboardServer& operator=(const DashboardServer&) = delete;
+
+  std::uint16_t port() const { return _port; }
+  void setSettings(const AcknowledgementSettings& settings);
+  AcknowledgementSettings settings() const;
+  void stop();
+
+ private:
+  using Clock = std::chrono::steady_clock;
+  struct Acknowledgement {
+    sockaddr_in to{};
+    std::string bytes;
+    bool foreign = false;
+  };
+  struct Planned {
+    std::vector<Acknowledgement> all;
+    std::int64_t rightOnes = 0;
+  };
+  DashboardServer(platform::UniqueFd socket, std::uint16_t port, platform::UniqueFd foreignSocket,
+                  platform::UniqueFd wakeUp, Inbox& inbox);
+  void run();
+  void receiveAll();
+  void take(std::string_view bytes, const sockaddr_in& from);
+  Planned planAcknowledgements(const ReceivedDatagram& datagram, const sockaddr_in& from,
+                               const AcknowledgementSettings& settings);
+  void sendDue();
+
+  // Constant after construction.
+  const platform::UniqueFd _socket;
+  const std::uint16_t _port;
+  const platform::UniqueFd _foreignSocket;
+  const platform::UniqueFd _wakeUp;
+  Inbox& _inbox;
+
+  // The thread's own.
+  std::multimap<Clock::time_point, Acknowledgement> _delayed;
+  std::minstd_rand _dice{1};  // the same losses in every run
+
+  mutable std::mutex _mutex;
+  AcknowledgementSettings _settings;  // guarded by _mutex
+  std::thread _thread;
+};
+
+}  // namespace orvanta::collector

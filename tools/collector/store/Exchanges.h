@@ -1,0 +1,39 @@
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <mutex>
+
+#include "tools/collector/store/ReceivedRecords.h"
+
+namespace orvanta::collector {
+
+// The requests that the relay has read and the HTTP library is answering. The library is handed the head alone, with
+// the number of the exchange; its handlers find the whole request here, its body as it was on the wire. Thread-safe.
+class Exchanges {
+ public:
+  // The header that carries the number from the relay to the handlers.
+  static constexpr const char* kHeader = "X-Collector-Exchange";
+
+  void begin(std::shared_ptr<const ReceivedRequest> request) {
+    const std::lock_guard lock(_mutex);
+    _open[request->exchange] = std::move(request);
+  }
+  void end(std::int64_t exchange) {
+    const std::lock_guard lock(_mutex);
+    _open.erase(exchange);
+  }
+  // Null when there is no such exchange.
+  std::shared_ptr<const ReceivedRequest> find(std::int64_t exchange) const {
+    const std::lock_guard lock(_mutex);
+    const auto found = _open.find(exchange);
+    return found != _open.end() ? found->second : nullptr;
+  }
+
+ private:
+  mutable std::mutex _mutex;
+  std::map<std::int64_t, std::shared_ptr<const ReceivedRequest>> _open;  // guarded by _mutex
+};
+
+}  // namespace orvanta::collector

@@ -1,0 +1,86 @@
+#pragma once
+
+#include <chrono>
+#include <condition_variable>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/core/Result.h"
+#include "tools/collector/store/Database.h"
+#include "tools/collector/store/ReceivedRecords.h"
+
+namespace orvanta::collector {
+
+// Beyond either, the oldest requests (with their events) go; datagrams by number alone.
+struct InboxLimits {
+  std::size_t maximumRequests = 200'000;
+  std::size_t maximumBytes = 1U << 30U;  // of bodies
+  std::size_t maximumDatagrams = 1'000'000;
+};
+
+// Which records a reader wants; everything by default.
+struct InboxQuery {
+  std::int64_t since = 0;  // only records with a greater id
+  std::size_t limit = 1'000'000;
+  std::optional<std::string> path;  // requests and events
+  std::optional<RequestKind> kind;  // requests
+};
+
+struct InboxCounts {
+  std::size_t requests = 0;
+  std::size_t events = 0;
+  std::size_t datagrams = 0;
+};
+
+// Everything that the collector has received, kept in a SQLite file, in the order in which it was complete.
+// Thread-safe.
+class Inbox {
+ public:
+  static platform::Result<std::unique_ptr<Inbox>> open(const std::string& databaseFile, const InboxLimits& limits);
+
+  // Stores the request, and for a post of events each event that its body holds. Sets the id.
+  void add(ReceivedRequest& request);
+  void add(ReceivedDatagram& datagram);
+  void clear();
+  // The number for the next exchange; they go on across restarts.
+  std::int64_t nextExchange();
+
+  std::vector<ReceivedRequest> requests(const InboxQuery& query = {}) const;
+  std::optional<ReceivedRequest> request(std::int64_t id) const;
+  std::optional<ReceivedRequest> requestOfExchange(std::int64_t exchange) const;
+  std::vector<ReceivedEvent> events(const InboxQuery& query = {}) const;
+  std::vector<ReceivedDatagram> datagrams(const InboxQuery& query = {}) const;
+  InboxCounts counts() const;
+
+  // Waits until the predicate holds, asking again after each change; false when the time is over first. The predicate
+  // is called without the lock held, so it may ask the inbox.
+  bool waitUntil(const std::function<bool()>& predicate, std::chrono::milliseconds limit) const;
+  bool waitForCounts(const InboxCounts& least, std::chrono::milliseconds limit) const;
+
+ private:
+  explicit Inbox(std::unique_ptr<Database> database, const InboxLimits& limits);
+  void addEvents(const ReceivedRequest& request);
+  void prune();
+  void changed();
+  std::vector<ReceivedRequest> readRequests(Statement& statement) const;
+
+  const InboxLimits _limits;
+  mutable std::mutex _mutex;
+  mutable std::condition_variable _condition;
+  // Guarded by _mutex.
+  const std::unique_ptr<Database> _database;
+  Statement _insertRequest;
+  Statement _insertEvent;
+  Statement _insertDatagram;
+  InboxCounts _counts;
+  std::size_t _bytes = 0;
+  std::int64_t _lastExchange = 0;
+  std::uint64_t _version = 0;  // counts changes
+};
+
+}  // namespace orvanta::collector

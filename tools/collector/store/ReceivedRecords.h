@@ -1,0 +1,79 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/core/Value.h"
+#include "tools/collector/wire/HttpMessage.h"
+
+namespace orvanta::collector {
+
+// What a request was for, by its method and path.
+enum class RequestKind { storebag, events, logData, upload, other };
+std::string_view requestKindText(RequestKind kind);
+std::optional<RequestKind> requestKindFromText(std::string_view text);
+
+// One HTTP request as it stood on the wire, and how it was answered.
+struct ReceivedRequest {
+  std::int64_t id = 0;        // in the order of storing; 0 until stored
+  std::int64_t exchange = 0;  // in the order of arrival
+  double time = 0;            // seconds since 1970, when the request was complete
+  std::string client;         // address:port
+  bool secure = false;
+  RequestKind kind = RequestKind::other;
+  std::string method;
+  std::string target;  // path and query as sent
+  std::string path;    // percent-decoded, without the query
+  HeaderFields headers;
+  std::string rawBody;
+  std::string body;  // decompressed; the same as rawBody where nothing was compressed
+  // Of a post of events: the body as JSON, or why it is none. Not stored.
+  std::shared_ptr<const platform::Value> json;
+  std::string damage;
+  std::string note;  // what was wrong with the body, or what was done to the answer; mostly empty
+  int status = 0;    // of the answer; 0 when none was given
+
+  const std::string* header(std::string_view name) const { return findHeader(headers, name); }
+  // The value of a query parameter, percent-decoded.
+  std::optional<std::string> parameter(std::string_view name) const;
+};
+
+// One event of a post.
+struct ReceivedEvent {
+  std::int64_t id = 0;
+  std::int64_t request = 0;   // ReceivedRequest::id
+  std::int64_t position = 0;  // within the post
+  std::string path;           // of the post
+  bool secure = false;
+  int status = 0;              // of the post's answer
+  platform::Dictionary event;  // as posted
+};
+
+// One dashboard datagram.
+struct ReceivedDatagram {
+  std::int64_t id = 0;
+  double time = 0;
+  std::string client;
+  std::string bytes;
+  bool wellFormed = false;  // the fields below are set only then
+  std::uint8_t versionMajor = 0;
+  std::uint8_t clientType = 0;
+  std::uint32_t timeSeconds = 0;
+  std::uint16_t milliseconds = 0;
+  std::uint32_t sessionID = 0;
+  std::uint16_t clientVersion = 0;
+  std::uint16_t method = 0;
+  std::uint16_t respCode = 0;
+  std::string deviceID;
+  std::uint16_t eventNumber = 0;
+  bool reliable = false;
+  bool explicitServer = false;
+  std::string text;
+  std::int64_t acknowledgements = 0;  // sent for it, copies included and forged ones not
+};
+
+}  // namespace orvanta::collector

@@ -1,0 +1,108 @@
+#include "tools/collector/wire/MessageReader.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+#include <array>
+#include <utility>
+
+#include "tools/collector/wire/HttpMessage.h"
+
+namespace orvanta::collector {
+
+using platform::Failure;
+using platform::Result;
+
+namespace {
+
+constexpr std::string_view kHeadEnd = "\r\n\r\n";
+constexpr std::size_t kMaximumLineBytes = 1024;
+
+}  // namespace
+
+bool MessageReader::fill() {
+  std::array<char, 16384> piece{};
+  const std::size_t count = _stream.read(piece.data(), piece.size());
+  _buffer.append(piece.data(), count);
+  return count > 0;
+}
+
+Result<std::optional<std::string>> MessageReader::readHead() {
+  std::size_t searched = 0;
+  while (true) {
+    const auto end = _buffer.find(kHeadEnd, searched - std::min(searched, kHeadEnd.size()));
+    if (end != std::string::npos) {
+      std::optional<std::string> head(_buffer.substr(0, end + kHeadEnd.size()));
+      _buffer.erase(0, head->size());
+      return head;
+    }
+    searched = _buffer.size();
+    if (searched > kMaximumHeadBytes) return Failure{"the head is too long"};
+    if (!fill()) {
+      if (_buffer.empty()) return std::optional<std::string>();
+      return Failure{"the stream ended inside a head"};
+    }
+  }
+}
+
+Result<std::string> MessageReader::readBody(std::size_t length) {
+  std::string body = _buffer.substr(0, length);
+  _buffer.erase(0, body.size());
+  while (body.size() < length) {
+    if (!fill()) return Failure{fmt::format("the stream ended after {} of {} bytes of body", body.size(), length)};
+    const std::size_t count = std::min(length - body.size(), _buffer.size());
+    body.append(_buffer, 0, count);
+    _buffer.erase(0, count);
+  }
+  return body;
+}
+
+void MessageReader::discard(std::size_t maximumBytes) {
+  std::size_t total = 0;
+  do {
+    total += _buffer.size();
+    _buffer.clear();
+  } while (total <= maximumBytes && fill());
+}
+
+Result<std::string> MessageReader::readLine() {
+  while (true) {
+    const auto end = _buffer.find("\r\n");
+    if (end != std::string::npos) {
+      std::string line = _buffer.substr(0, end);
+      _buffer.erase(0, end + 2);
+      return line;
+    }
+    if (_buffer.size() > kMaximumLineBytes) return Failure{"a chunk's size line is too long"};
+    if (!fill()) return Failure{"the stream ended inside a chunked body"};
+  }
+}
+
+Result<std::string> MessageReader::readChunkedBody(std::size_t maximumBytes) {
+  std::string body;
+  while (true) {
+    auto line = readLine();
+    if (!line) return line;
+    const auto size = parseChunkSize(line.value());
+    if (!size) return Failure{"no chunk size: " + line.value()};
+    if (*size == 0) break;
+    if (*size > maximumBytes || body.size() + *size > maximumBytes) return Failure{"the chunked body is too long"};
+    auto piece = readBody(*size);
+    if (!piece) return piece;
+    body += *piece;
+    auto end = readLine();
+    if (!end) return end;
+    if (!end->empty()) return Failure{"a chunk does not end where it says"};
+  }
+  // Trailers are read and dropped.
+  std::size_t trailerBytes = 0;
+  while (true) {
+    auto line = readLine();
+    if (!line) return line;
+    if (line->empty()) return body;
+    trailerBytes += line->size();
+    if (trailerBytes > kMaximumHeadBytes) return Failure{"the trailers are too long"};
+  }
+}
+
+}  // namespace orvanta::collector

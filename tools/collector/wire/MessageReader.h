@@ -1,0 +1,37 @@
+#pragma once
+
+#include <cstddef>
+#include <optional>
+#include <string>
+
+#include "platform/core/Result.h"
+#include "tools/collector/wire/Transport.h"
+
+namespace orvanta::collector {
+
+// Takes HTTP/1 messages off a stream: heads, bodies of a known length, chunked bodies. Belongs to the thread of the
+// stream. Nothing is allocated for bytes that have not come.
+class MessageReader {
+ public:
+  explicit MessageReader(Transport& stream) : _stream(stream) {}
+
+  static constexpr std::size_t kMaximumHeadBytes = 64U << 10U;
+
+  // The next head with its empty line; none when the stream ended before one began, a failure when it ended inside or
+  // the head is too long.
+  platform::Result<std::optional<std::string>> readHead();
+  platform::Result<std::string> readBody(std::size_t length);
+  platform::Result<std::string> readChunkedBody(std::size_t maximumBytes);
+  // Reads and drops what still comes, up to a limit.
+  void discard(std::size_t maximumBytes);
+
+ private:
+  // False when nothing more came.
+  bool fill();
+  platform::Result<std::string> readLine();
+
+  Transport& _stream;
+  std::string _buffer;  // read and not yet taken
+};
+
+}  // namespace orvanta::collector
