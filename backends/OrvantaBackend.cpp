@@ -101,7 +101,7 @@ OrvantaBackend::SelfVersion OrvantaBackend::SelfVersion::parse(std::string_view 
   std::array<std::uint8_t, 3> parts{};
   for (std::uint8_t& part : parts) {
     const std::size_t dot = text.find('.');
-    part = static_cast<std::uint8_t>(platform::Value(text.substr(0, dot)).integerValue());
+    part = static_cast<std::uint8_t>(Value(text.substr(0, dot)).integerValue());
     if (dot == std::string_view::npos) break;
     text.remove_prefix(dot + 1);
   }

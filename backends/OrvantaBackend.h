@@ -13,14 +13,11 @@
 #include "config/DeviceInfo.h"
 #include "config/Platform.h"
 #include "interface/OrvantaError.h"
+#include "interface/Values.h"
 #include "platform/core/Clock.h"
 #include "platform/core/UniqueFunction.h"
-#include "platform/core/Value.h"
 
 namespace orvanta {
-
-using platform::SharedArray;
-using platform::SharedDictionary;
 
 // Whether and how a backend reports.
 enum BackendState : std::int32_t {

@@ -14,7 +14,7 @@ std::optional<std::string> VoltmarkBackend::sendMessage(const SharedDictionary& 
                                                         std::uint16_t respCode, std::uint16_t eventID,
                                                         std::int32_t /*flag*/) {
   if (method == 0 || !payload || payload->empty()) return std::nullopt;
-  platform::Dictionary record = *payload;
+  Dictionary record = *payload;
   record.set("method", static_cast<unsigned>(method));
   record.set("respCode", static_cast<unsigned>(respCode));
   record.set("event", static_cast<unsigned>(eventID));

@@ -7,7 +7,7 @@
 
 namespace orvanta::bench {
 
-BenchDaemon::BenchDaemon(platform::Dictionary section, bool consent, bool sandbox) {
+BenchDaemon::BenchDaemon(Dictionary section, bool consent, bool sandbox) {
   test::DaemonProcess::Options options;
   options.sandbox = sandbox;
   if (!section.empty()) {
@@ -30,9 +30,7 @@ BenchDaemon::BenchDaemon(platform::Dictionary section, bool consent, bool sandbo
   }
 }
 
-platform::Dictionary batchingSection(const PostSink& sink) {
-  using platform::Array;
-  using platform::Dictionary;
+Dictionary batchingSection(const PostSink& sink) {
   return {{"http_post", Dictionary{{"clients", Array{Dictionary{{"post_url", sink.url()},
                                                                 {"locale_whitelist", Array{"DE"}},
                                                                 {"filters", Array{}},

@@ -3,7 +3,7 @@
 #include <memory>
 
 #include "bench/RawPeers.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tools/collector/Collector.h"
@@ -15,7 +15,7 @@ namespace orvanta::bench {
 class BenchDaemon {
  public:
   // Without a section there is no collector, and no session has a backend. `consent`: to diagnostics, by the user.
-  explicit BenchDaemon(platform::Dictionary section = {}, bool consent = true, bool sandbox = true);
+  explicit BenchDaemon(Dictionary section = {}, bool consent = true, bool sandbox = true);
   test::DaemonProcess& process() const { return *_process; }
 
  private:
@@ -25,6 +25,6 @@ class BenchDaemon {
 };
 
 // A section by which sessions post to `sink` whatever the user's consent, fifty events at a time where they ask for it.
-platform::Dictionary batchingSection(const PostSink& sink);
+Dictionary batchingSection(const PostSink& sink);
 
 }  // namespace orvanta::bench

@@ -15,8 +15,6 @@
 
 namespace orvanta::bench {
 
-using platform::Dictionary;
-
 namespace {
 constexpr std::uint32_t kMessageID = 0x10000;
 }
@@ -93,7 +91,7 @@ std::vector<double> CallDriver::roundTrips(const std::vector<std::uint8_t>& requ
   return times;
 }
 
-std::vector<std::uint8_t> encodeCall(const char* method, const platform::Array& params) {
+std::vector<std::uint8_t> encodeCall(const char* method, const Array& params) {
   std::vector<std::uint8_t> message;
   platform::appendRequestHeader(message, kMessageID, method, params.size());
   platform::MessagePackWriter out(message);

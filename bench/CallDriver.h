@@ -4,8 +4,8 @@
 #include <string>
 #include <vector>
 
+#include "interface/Values.h"
 #include "platform/core/UniqueFd.h"
-#include "platform/core/Value.h"
 
 namespace orvanta::bench {
 
@@ -38,7 +38,7 @@ class CallDriver {
 };
 
 // A whole request frame. The id takes five bytes, so that answers to a given call always have the same size.
-std::vector<std::uint8_t> encodeCall(const char* method, const platform::Array& params);
+std::vector<std::uint8_t> encodeCall(const char* method, const Array& params);
 // The size of a response with one nil: array, type, five bytes of id, nil, array of one, nil.
 inline constexpr std::size_t kNilAnswer = 10;
 // `count` calls that hand in an event each, no two alike.
@@ -46,7 +46,7 @@ std::vector<std::uint8_t> encodeEvents(std::uint32_t count);
 // `count` times the same call.
 std::vector<std::uint8_t> repeated(const std::vector<std::uint8_t>& call, std::uint64_t count);
 // An event of the kind that clients send: a payload of 15 keys, as varied as those of a player's session.
-platform::Dictionary samplePayload(std::uint32_t number);
+Dictionary samplePayload(std::uint32_t number);
 // A call that sends one.
 std::vector<std::uint8_t> sampleCall();
 

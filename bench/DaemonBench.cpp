@@ -14,9 +14,6 @@ namespace orvanta::bench {
 
 namespace {
 
-using platform::Array;
-using platform::Dictionary;
-
 constexpr std::uint64_t kWindow = 64;
 
 constexpr std::uint64_t kChunk = 320;

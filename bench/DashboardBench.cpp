@@ -28,8 +28,6 @@
 namespace orvanta::bench {
 
 namespace {
-
-using platform::Dictionary;
 using platform::UniqueFd;
 
 constexpr double kSeconds = 1.0;

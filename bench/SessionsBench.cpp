@@ -23,8 +23,6 @@ namespace {
 
 constexpr std::uint64_t kWindow = 64;
 
-using platform::Dictionary;
-
 // Confines every thread of the process, and with them those that they will start, to its first `cores` processors.
 void confine(pid_t pid, unsigned cores) {
   cpu_set_t allowed, set;

@@ -29,9 +29,6 @@ namespace orvanta::bench {
 
 namespace {
 
-using platform::Dictionary;
-using platform::SharedDictionary;
-
 constexpr double kSeconds = 1.0;
 constexpr std::size_t kBatch = 50;
 

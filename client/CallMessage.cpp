@@ -11,11 +11,7 @@
 #include "platform/ipc/FrameDecoder.h"
 
 namespace orvanta {
-
-using platform::Array;
-using platform::Dictionary;
 using platform::MessagePackWriter;
-using platform::Value;
 
 namespace {
 

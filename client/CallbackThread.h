@@ -5,7 +5,7 @@
 
 #include "client/CallResult.h"
 
-namespace platform {
+namespace orvanta::platform {
 class WorkPool;
 }
 

@@ -13,4 +13,4 @@
 #include "interface/ClientSessionInterface.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaError.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"

@@ -7,9 +7,6 @@
 
 namespace orvanta {
 
-using platform::Dictionary;
-using platform::SharedDictionary;
-
 SharedDictionary SessionInfo::dictionary() const {
   Dictionary record;
   record.set(kOrvantaSessionInfoSessionID, sessionID);

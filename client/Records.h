@@ -4,7 +4,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 
 namespace orvanta {
 
@@ -25,27 +25,27 @@ struct SessionInfo {
   bool batchEvent = false;
   std::optional<HierarchyToken> hierarchyToken = std::nullopt;
 
-  platform::SharedDictionary dictionary() const;
+  SharedDictionary dictionary() const;
 };
 
 struct UserInfo {
   std::optional<std::string> clientName = std::nullopt;
   std::optional<std::string> serviceName = std::nullopt;
-  platform::Dictionary others = {};  // merged into the events; the two names above win over equal keys
+  Dictionary others = {};  // merged into the events; the two names above win over equal keys
 
-  platform::SharedDictionary dictionary() const;
+  SharedDictionary dictionary() const;
 };
 
 struct MessageParameters {
   std::uint16_t category = 0;
   std::uint16_t type = 0;
-  std::optional<platform::Dictionary> payload = std::nullopt;
+  std::optional<Dictionary> payload = std::nullopt;
   // Shorthand for the two bits that flags have; joined with `flag`.
   bool realtime = false;  // goes out at once, by way of the realtime URL
   bool promote = false;   // makes a session that holds its events back report from now on
   std::uint32_t flag = 0;
 
-  platform::SharedDictionary dictionary() const;
+  SharedDictionary dictionary() const;
 };
 
 inline constexpr std::uint32_t kMessageFlagRealtime = 1;

@@ -5,6 +5,7 @@
 
 #include "config/UserDefaultKeys.h"
 #include "interface/OrvantaLogging.h"
+#include "interface/Values.h"
 #include "platform/host/Digest.h"
 
 namespace orvanta {
@@ -46,8 +47,7 @@ std::string getPersistentIdentifierForCustomClientIDSuffix(Platform& platform, c
                                                            const std::optional<std::string>& second) {
   std::string key(kIdentifierPrefix);
   key.append(":").append(first.value_or("")).append(":").append(second.value_or(""));
-  platform::Value value =
-      platform.defaults().valueOrStore(key, [] { return platform::Value(platform::uuidText(platform::randomUuid())); });
+  Value value = platform.defaults().valueOrStore(key, [] { return Value(platform::uuidText(platform::randomUuid())); });
   std::string identifier = value.string() != nullptr ? std::move(*value.string()) : value.description();
   ORVANTA_LOG(info, "getPersistentIdentifierForCustomClientIDSuffix: The value for {}: {}", key, identifier);
   return identifier;

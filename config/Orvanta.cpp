@@ -36,7 +36,7 @@ std::string readVersion(const std::string& frameworkDirectory) {
     ORVANTA_LOG(warning, "bundleVersion: {}; version {} is used", bundle.error(), kVersionWithoutBundle);
     return kVersionWithoutBundle;
   }
-  const platform::Dictionary* content = bundle->dictionary();
+  const Dictionary* content = bundle->dictionary();
   if (content == nullptr) {
     ORVANTA_LOG(warning, "bundleVersion: {} is no dictionary; version {} is used", path, kVersionWithoutBundle);
     return kVersionWithoutBundle;
@@ -45,7 +45,7 @@ std::string readVersion(const std::string& frameworkDirectory) {
   if (const std::string unknown = platform::describeUnknownKeys(*content, kKeys); !unknown.empty()) {
     ORVANTA_LOG(warning, "bundleVersion: {} in {}", unknown, path);
   }
-  const platform::Value* version = content->find("version");
+  const Value* version = content->find("version");
   if (version == nullptr) return kVersionWithoutBundle;
   if (const std::string* text = version->string()) return *text;
   if (version->isNumber()) return version->description();
@@ -54,12 +54,12 @@ std::string readVersion(const std::string& frameworkDirectory) {
 }
 
 // The key file's bytes, or what keeps them from being read.
-platform::Result<std::vector<std::uint8_t>> readKeyFile(const std::string& path) {
+Result<std::vector<std::uint8_t>> readKeyFile(const std::string& path) {
   const platform::UniqueFd file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
-  if (!file) return platform::Failure{"cannot open " + path + ": " + std::generic_category().message(errno)};
+  if (!file) return Failure{"cannot open " + path + ": " + std::generic_category().message(errno)};
   std::vector<std::uint8_t> bytes(kLargestKeyFile);
   const ssize_t count = ::read(file.get(), bytes.data(), bytes.size());
-  if (count < 0) return platform::Failure{"cannot read " + path + ": " + std::generic_category().message(errno)};
+  if (count < 0) return Failure{"cannot read " + path + ": " + std::generic_category().message(errno)};
   bytes.resize(static_cast<std::size_t>(count));
   return bytes;
 }
@@ -81,21 +81,20 @@ std::shared_ptr<const platform::RsaPublicKey> Orvanta::publicKey() {
   return nullptr;
 }
 
-platform::Result<std::shared_ptr<const platform::RsaPublicKey>> Orvanta::readPublicKey() {
+Result<std::shared_ptr<const platform::RsaPublicKey>> Orvanta::readPublicKey() {
   const std::lock_guard lock(_mutex);
   if (_key) return _key;
   const std::string path = _platform.files().frameworkDirectory + "/publicKey.der";
   const auto bytes = readKeyFile(path);
-  if (!bytes) return platform::Failure{bytes.error()};
+  if (!bytes) return Failure{bytes.error()};
   _key = platform::RsaPublicKey::fromDer(*bytes);
-  if (!_key) return platform::Failure{path + " holds no RSA public key"};
+  if (!_key) return Failure{path + " holds no RSA public key"};
   return _key;
 }
 
 std::string Orvanta::getPersistentIdentifierForDNU(bool respectConsent) {
-  platform::Value value =
-      _platform.defaults().valueOrStore(respectConsent ? kRespectConsentKey : kOverrideConsentKey,
-                                        [] { return platform::Value(platform::uuidText(platform::randomUuid())); });
+  Value value = _platform.defaults().valueOrStore(respectConsent ? kRespectConsentKey : kOverrideConsentKey,
+                                                  [] { return Value(platform::uuidText(platform::randomUuid())); });
   return value.string() != nullptr ? std::move(*value.string()) : value.description();
 }
 

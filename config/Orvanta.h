@@ -4,7 +4,7 @@
 #include <string>
 
 #include "config/Platform.h"
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 #include "platform/host/Digest.h"
 
 namespace orvanta {
@@ -22,7 +22,7 @@ class Orvanta {
   // The resource publicKey.der; null when it is missing or no RSA key.
   std::shared_ptr<const platform::RsaPublicKey> publicKey();
   // The same, with the reason.
-  platform::Result<std::shared_ptr<const platform::RsaPublicKey>> readPublicKey();
+  Result<std::shared_ptr<const platform::RsaPublicKey>> readPublicKey();
   // A random UUID's text kept in the user defaults: one for devices whose consent is respected, another for reports
   // that override it, so that the two can never be joined.
   std::string getPersistentIdentifierForDNU(bool respectConsent);

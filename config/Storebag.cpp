@@ -16,11 +16,7 @@
 #include "platform/codec/PropertyList.h"
 
 namespace orvanta {
-
-using platform::Dictionary;
 using platform::HttpResponse;
-using platform::SharedDictionary;
-using platform::Value;
 
 namespace {
 

@@ -8,6 +8,7 @@
 #include <string_view>
 
 #include "config/Platform.h"
+#include "interface/Values.h"
 #include "platform/host/Digest.h"
 
 namespace orvanta {
@@ -38,11 +39,11 @@ struct StorebagFetch {
 
 // One attempt to get the bag of that name: the inner bag, or null. Blocks for the network, at most 15 seconds. Does not
 // write `version`.
-platform::SharedDictionary fetchStorebagWithName(Platform& platform, const std::string& name, StorebagFetch& fetch);
+SharedDictionary fetchStorebagWithName(Platform& platform, const std::string& name, StorebagFetch& fetch);
 
 // The section of the current environment from the bag of that client type: backend name to profile, or null. A client
 // type without a storebag is refused with a log line and no request.
-platform::SharedDictionary fetchStorebagForEnvironmentAndClientType(Platform& platform, std::int32_t clientType,
-                                                                    StorebagFetch& fetch);
+SharedDictionary fetchStorebagForEnvironmentAndClientType(Platform& platform, std::int32_t clientType,
+                                                          StorebagFetch& fetch);
 
 }  // namespace orvanta

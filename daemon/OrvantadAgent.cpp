@@ -135,7 +135,7 @@ std::size_t OrvantadAgent::sessionCount() const {
   return _sessionList.size();
 }
 
-platform::SharedDictionary OrvantadAgent::storebagForSession(OrvantadSession& session) {
+SharedDictionary OrvantadAgent::storebagForSession(OrvantadSession& session) {
   ORVANTA_LOG(debug, "storebagForSession: Retrieving storebag for session {} with client type {}", session.sessionID(),
               session.clientType());
   const std::lock_guard lock(_lock);

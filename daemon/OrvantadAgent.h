@@ -9,6 +9,7 @@
 #include "daemon/SessionCountStatus.h"
 #include "daemon/SessionRegistry.h"
 #include "daemon/StorebagCache.h"
+#include "interface/Values.h"
 #include "platform/listen/Entitlements.h"
 #include "platform/listen/Listener.h"
 #include "session/OrvantadSession.h"
@@ -49,7 +50,7 @@ class OrvantadAgent final : public OrvantadSessionDelegate {
   std::size_t sessionCount() const;
 
   AgentLock& lock() override { return _lock; }
-  platform::SharedDictionary storebagForSession(OrvantadSession& session) override;
+  SharedDictionary storebagForSession(OrvantadSession& session) override;
   std::optional<std::string> storebagVersionForSession(OrvantadSession& session) override;
   void updateCorrelatedSessions(const std::shared_ptr<OrvantadSession>& session) override;
   std::optional<std::string> parentSessionIDStringForSession(OrvantadSession& session) override;

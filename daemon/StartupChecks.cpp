@@ -16,7 +16,7 @@ void warnOfUnknownUserDefaults(Platform& platform) {
                                                kRealtimePostURLKey, kForceEventLoggingKey, kRespectConsentKey,
                                                kOverrideConsentKey};
   const std::string identifiers = std::string(kIdentifierPrefix) + ":";
-  platform::Dictionary settings;
+  Dictionary settings;
   for (auto& [key, value] : platform.defaults().all()) {
     if (key.rfind(identifiers, 0) != 0) settings.set(key, true);
   }

@@ -16,7 +16,7 @@ StorebagFreshness freshnessOf(const StorebagCacheEntry& entry, double now) {
   return age < StorebagCache::kSecondsBetweenFailedAttempts ? StorebagFreshness::waiting : StorebagFreshness::expired;
 }
 
-platform::SharedDictionary StorebagCache::storebag(std::int32_t clientType) {
+SharedDictionary StorebagCache::storebag(std::int32_t clientType) {
   const auto name = storebagNameForClientType(clientType);
   if (!name) {
     // No entry is made for it; the fetch refuses it with the line that says so.

@@ -7,8 +7,8 @@
 #include <string>
 
 #include "config/Storebag.h"
+#include "interface/Values.h"
 #include "platform/core/Clock.h"
-#include "platform/core/Value.h"
 
 namespace orvanta {
 
@@ -16,7 +16,7 @@ enum class StorebagFetchState { successful, failure };  // "Fetch Successful", "
 
 // What is known of one storebag. Made by the first attempt to fetch it and kept for the life of the process.
 struct StorebagCacheEntry {
-  platform::SharedDictionary storebagData;     // of the last fetch that brought one
+  SharedDictionary storebagData;               // of the last fetch that brought one
   std::optional<std::string> storebagVersion;  // together with storebagData
   double storebagFetchTime = 0;                // wall clock, of the last attempt
   StorebagFetchState storebagFetchState = StorebagFetchState::failure;
@@ -34,11 +34,11 @@ StorebagFreshness freshnessOf(const StorebagCacheEntry& entry, double now);
 // expiry.
 class StorebagCache {
  public:
-  using Fetch = std::function<platform::SharedDictionary(std::int32_t clientType, StorebagFetch& fetch)>;
+  using Fetch = std::function<SharedDictionary(std::int32_t clientType, StorebagFetch& fetch)>;
   StorebagCache(platform::Clock& clock, Fetch fetch) : _clock(clock), _fetch(std::move(fetch)) {}
 
   // Null when there is none, or the client type has no storebag.
-  platform::SharedDictionary storebag(std::int32_t clientType);
+  SharedDictionary storebag(std::int32_t clientType);
   // Never fetches.
   std::optional<std::string> version(std::int32_t clientType) const;
 

@@ -7,12 +7,9 @@
 
 #include "interface/OrvantaError.h"
 #include "interface/Reply.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 
 namespace orvanta {
-
-using platform::SharedArray;
-using platform::SharedDictionary;
 
 using BackendNames = std::optional<std::vector<std::string>>;
 using BackendNamesReply = Reply<BackendNames>;

@@ -2,7 +2,7 @@
 
 #include <cstdint>
 
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 
 namespace orvanta {
 
@@ -11,9 +11,8 @@ class ClientSessionReplyInterface {
  public:
   virtual ~ClientSessionReplyInterface() = default;
   // One aggregated event. All values empty or zero: aggregation for the session has ended.
-  virtual void sendMessageToClient(const platform::SharedDictionary& sessionInfo, double timestamp,
-                                   std::uint16_t category, std::uint16_t type,
-                                   const platform::SharedDictionary& payload) = 0;
+  virtual void sendMessageToClient(const SharedDictionary& sessionInfo, double timestamp, std::uint16_t category,
+                                   std::uint16_t type, const SharedDictionary& payload) = 0;
 };
 
 }  // namespace orvanta

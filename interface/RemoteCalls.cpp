@@ -8,13 +8,9 @@
 #include "platform/codec/MessagePack.h"
 
 namespace orvanta {
-
-using platform::Array;
-using platform::Dictionary;
 using platform::Frame;
 using platform::MessagePackWriter;
 using platform::Outbox;
-using platform::Value;
 
 namespace {
 

@@ -12,6 +12,7 @@
 #include "interface/AggregatedEvent.h"
 #include "interface/ClientSessionInterface.h"
 #include "interface/ClientSessionReplyInterface.h"
+#include "interface/Values.h"
 #include "platform/ipc/Connection.h"
 #include "platform/ipc/FrameDecoder.h"
 
@@ -52,7 +53,7 @@ std::span<const RemoteCall, 11> remoteCalls();
 // Null for an unknown operation.
 const RemoteCall* findRemoteCall(std::string_view method);
 // Null when the arguments fit the call; else what is wrong with which argument.
-std::optional<std::string> checkArguments(const RemoteCall& call, const platform::Array& params);
+std::optional<std::string> checkArguments(const RemoteCall& call, const Array& params);
 
 // Daemon's side. Carries out one frame on `target`: decodes and checks the arguments, makes the reply that answers
 // through `outbox` (held weakly), and calls the operation. What is refused is answered with the reason; a refused

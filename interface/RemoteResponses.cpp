@@ -5,10 +5,7 @@
 // The client's side of replies: from a response frame to the values that the caller waits for.
 
 namespace orvanta {
-
-using platform::Array;
 using platform::Frame;
-using platform::Value;
 
 namespace {
 

@@ -5,9 +5,9 @@
 
 namespace orvanta {
 
-void ClientReplyProxy::sendMessageToClient(const platform::SharedDictionary& sessionInfo, double timestamp,
+void ClientReplyProxy::sendMessageToClient(const SharedDictionary& sessionInfo, double timestamp,
                                            std::uint16_t category, std::uint16_t type,
-                                           const platform::SharedDictionary& payload) {
+                                           const SharedDictionary& payload) {
   const auto message = encodeSendMessageToClient(sessionInfo, timestamp, category, type, payload);
   const bool isEndNotice = !sessionInfo;
   const auto urgency = isEndNotice ? platform::Outbox::Urgency::reply : platform::Outbox::Urgency::droppable;

@@ -5,6 +5,7 @@
 #include <string_view>
 
 #include "interface/ClientSessionReplyInterface.h"
+#include "interface/Values.h"
 #include "platform/ipc/Connection.h"
 
 namespace orvanta {
@@ -16,8 +17,8 @@ class ClientReplyProxy final : public ClientSessionReplyInterface {
  public:
   explicit ClientReplyProxy(std::shared_ptr<platform::Outbox> outbox) : _outbox(std::move(outbox)) {}
 
-  void sendMessageToClient(const platform::SharedDictionary& sessionInfo, double timestamp, std::uint16_t category,
-                           std::uint16_t type, const platform::SharedDictionary& payload) override;
+  void sendMessageToClient(const SharedDictionary& sessionInfo, double timestamp, std::uint16_t category,
+                           std::uint16_t type, const SharedDictionary& payload) override;
   // Asks the client to delete the file that `token` stands for.
   void removeFile(std::string_view token);
 

@@ -44,7 +44,7 @@ void OrvantadSession::end() {
   if (_ended) return;
   ORVANTA_LOG(debug, "dealloc: OrvantadSession dealloc: {}", _sessionID);
 
-  auto payload = std::make_shared<platform::Dictionary>();
+  auto payload = std::make_shared<Dictionary>();
   if (_storebagVersion) payload->set("StorebagVersion", *_storebagVersion);
   internalSendMessage(std::move(payload), 0, 1);
   flushMessagesWithCompletion({});

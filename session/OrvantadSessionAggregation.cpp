@@ -6,8 +6,6 @@
 
 namespace orvanta {
 
-using platform::Dictionary;
-
 void OrvantadSession::aggregateMessage(double timestamp, const Message& message) {
   if (!_userInfo) {
     // Nobody needs the lock to learn that such a session has no ancestor; the line is due all the same.

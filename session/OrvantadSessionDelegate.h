@@ -4,7 +4,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 #include "session/AgentLock.h"
 
 namespace orvanta {
@@ -21,7 +21,7 @@ class OrvantadSessionDelegate {
   virtual AgentLock& lock() = 0;
 
   // The backends' profiles for the session's client type, or null. May block for a fetch, holding the lock.
-  virtual platform::SharedDictionary storebagForSession(OrvantadSession& session) = 0;
+  virtual SharedDictionary storebagForSession(OrvantadSession& session) = 0;
   // Of the cached storebag; never fetches.
   virtual std::optional<std::string> storebagVersionForSession(OrvantadSession& session) = 0;
 

@@ -9,9 +9,6 @@
 
 namespace orvanta {
 
-using platform::Dictionary;
-using platform::Value;
-
 namespace {
 
 constexpr const char* kNoBackends = "sendMessageWithDictionary: No backends available to send message";

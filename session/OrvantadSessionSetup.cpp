@@ -8,9 +8,6 @@
 
 namespace orvanta {
 
-using platform::Dictionary;
-using platform::Value;
-
 namespace {
 
 bool sameText(const SharedDictionary& a, const SharedDictionary& b, std::string_view key) {

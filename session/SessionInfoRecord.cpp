@@ -6,7 +6,7 @@
 
 namespace orvanta {
 
-std::optional<std::string> refusalOfHierarchy(const platform::Dictionary& sessionInfo) {
+std::optional<std::string> refusalOfHierarchy(const Dictionary& sessionInfo) {
   const auto position = HierarchyPosition::read(sessionInfo);
   constexpr auto kMaximum = static_cast<std::int64_t>(kMaximumHierarchyLevel);
   if (!position.token || (position.level >= 0 && position.level <= kMaximum)) return std::nullopt;

@@ -5,7 +5,7 @@
 #include <string>
 
 #include "interface/OrvantaConstants.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 
 namespace orvanta {
 
@@ -17,7 +17,7 @@ struct SessionInfoRecord {
   bool requireUserInfo = false;
   bool batchEvent = false;
 
-  static SessionInfoRecord read(const platform::Dictionary& record) {
+  static SessionInfoRecord read(const Dictionary& record) {
     const auto integer = [&record](std::string_view key) {
       const auto* value = record.find(key);
       return value == nullptr ? 0 : value->integerValue();
@@ -42,7 +42,7 @@ struct HierarchyPosition {
   std::int64_t level = 0;            // 0 is the root
 
   // Without a record, or when that value is no dictionary: standalone.
-  static HierarchyPosition read(const platform::Dictionary& sessionInfo) {
+  static HierarchyPosition read(const Dictionary& sessionInfo) {
     HierarchyPosition position;
     const auto* value = sessionInfo.find(kOrvantaSessionInfoHierarchyToken);
     const auto* record = value == nullptr ? nullptr : value->dictionary();
@@ -57,6 +57,6 @@ struct HierarchyPosition {
 };
 
 // None when the hierarchy level can be used; else what is wrong with it.
-std::optional<std::string> refusalOfHierarchy(const platform::Dictionary& sessionInfo);
+std::optional<std::string> refusalOfHierarchy(const Dictionary& sessionInfo);
 
 }  // namespace orvanta

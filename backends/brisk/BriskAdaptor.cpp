@@ -69,7 +69,7 @@ BriskAdaptor::~BriskAdaptor() {
   if (_briskAdaptorClass.destroy != nullptr) _briskAdaptorClass.destroy(_briskAdaptor);
 }
 
-void BriskAdaptor::sendMessage(std::uint16_t method, std::uint16_t respCode, const platform::Dictionary* payload) {
+void BriskAdaptor::sendMessage(std::uint16_t method, std::uint16_t respCode, const Dictionary* payload) {
   const platform::BlockingScope blocking;
   if (payload == nullptr) {
     _forward(_briskAdaptor, method, respCode, nullptr, 0);

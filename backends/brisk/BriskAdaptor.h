@@ -6,7 +6,7 @@
 
 #include "config/Platform.h"
 #include "interface/PluginBundle.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 
 namespace orvanta {
 
@@ -26,7 +26,7 @@ class BriskAdaptor {
 
   bool respondsToForwarding() const { return _forward != nullptr; }
   // Only when it responds. `payload` may be null.
-  void sendMessage(std::uint16_t method, std::uint16_t respCode, const platform::Dictionary* payload);
+  void sendMessage(std::uint16_t method, std::uint16_t respCode, const Dictionary* payload);
   // For log lines.
   static std::string description() { return std::string("<") + kClassName + ">"; }
 

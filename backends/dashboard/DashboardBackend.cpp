@@ -17,9 +17,6 @@
 namespace orvanta {
 
 namespace {
-
-using platform::Dictionary;
-using platform::Value;
 using std::chrono::milliseconds;
 using std::chrono::steady_clock;
 
@@ -46,8 +43,8 @@ std::uint16_t portOf(const Value& value) {
 }
 
 // The array in an archive of our own: the log-data server's contract, see docs/dashboard.md.
-platform::Result<std::vector<std::uint8_t>> archive(const SharedArray& logData) {
-  if (!logData) return platform::Failure{"there is no array"};
+Result<std::vector<std::uint8_t>> archive(const SharedArray& logData) {
+  if (!logData) return Failure{"there is no array"};
   Dictionary content{{"archiver", "OrvantaArchiver"}, {"version", 1}};
   content.set("root", *logData);
   return platform::writeBinaryPropertyList(std::move(content));

@@ -9,6 +9,7 @@
 
 #include "backends/OrvantaBackend.h"
 #include "backends/dashboard/ReliableDelivery.h"
+#include "interface/Values.h"
 #include "platform/host/UdpSocket.h"
 #include "platform/queue/WorkQueue.h"
 
@@ -67,7 +68,7 @@ class DashboardBackend final : public OrvantaBackend {
 
   bool setUp(const std::optional<std::string>& serverIP, std::uint16_t serverPort);
   void useReliableUDP();
-  void setPeriod(const platform::Value& reliable);
+  void setPeriod(const Value& reliable);
   std::shared_ptr<DashboardBackend> self();
 
   // On the network queue.

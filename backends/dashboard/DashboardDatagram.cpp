@@ -13,10 +13,6 @@ namespace orvanta {
 
 namespace {
 
-using platform::Dictionary;
-using platform::Failure;
-using platform::Result;
-
 // Shorter than any pair that can stand in a text, " =x", but for the one key that may be empty.
 constexpr std::size_t kMaximumPairs = kDashboardMaximumText / 3 + 1;
 

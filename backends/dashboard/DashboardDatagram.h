@@ -10,9 +10,8 @@
 #include <utility>
 #include <vector>
 
+#include "interface/Values.h"
 #include "platform/core/Clock.h"
-#include "platform/core/Result.h"
-#include "platform/core/Value.h"
 
 namespace orvanta {
 
@@ -64,7 +63,7 @@ struct DashboardSender {
 };
 
 struct DashboardEvent {
-  const platform::Dictionary* payload = nullptr;  // may be null
+  const Dictionary* payload = nullptr;  // may be null
   platform::TimeValue time;
   std::uint16_t method = 0;
   std::uint16_t respCode = 0;
@@ -77,7 +76,7 @@ struct DashboardEvent {
 std::vector<std::uint8_t> encodeDashboardDatagram(const DashboardSender& sender, const DashboardEvent& event);
 
 // A failure says what is wrong: shorter than a header, another marker, a length that is not the datagram's.
-platform::Result<tagReportingPacket> decodeDashboardDatagram(std::span<const std::uint8_t> datagram);
+Result<tagReportingPacket> decodeDashboardDatagram(std::span<const std::uint8_t> datagram);
 
 // The pairs of a datagram's text, unescaped, for keys without spaces and "=". What a cut left of a pair before its "="
 // cannot be told from the end of the value before it.

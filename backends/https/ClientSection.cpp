@@ -7,9 +7,6 @@
 namespace orvanta {
 namespace {
 
-using platform::Dictionary;
-using platform::Value;
-
 bool readsAsNumber(const Value& value) {
   return value.isNumber() || value.string() != nullptr;
 }
@@ -18,7 +15,7 @@ bool readsAsNumber(const Value& value) {
 using Check = const char* (*)(const Value&);
 
 const char* checkTextsOrNumbers(const Value& value) {
-  const platform::Array* list = value.array();
+  const Array* list = value.array();
   if (list == nullptr) return "is no list";
   return std::all_of(list->begin(), list->end(), readsAsNumber) ? nullptr
                                                                 : "holds something that is neither text nor number";
@@ -29,7 +26,7 @@ const char* checkNumber(const Value& value) {
 }
 
 const char* checkCountryThresholds(const Value& value) {
-  const platform::Array* list = value.array();
+  const Array* list = value.array();
   if (list == nullptr) return "is no list";
   for (const Value& element : *list) {
     const Dictionary* entry = element.dictionary();
@@ -71,7 +68,7 @@ bool readPieces(const Dictionary& section, std::string_view key, TextList& piece
 
 }  // namespace
 
-const platform::Array* clientSections(const Dictionary& profile) {
+const Array* clientSections(const Dictionary& profile) {
   const Value* clients = profile.find("clients");
   return clients == nullptr ? nullptr : clients->array();
 }

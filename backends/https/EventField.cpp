@@ -14,7 +14,7 @@ constexpr std::string_view kPrettyEnd = "\n    }";
 
 }  // namespace
 
-bool appendFieldValue(std::string& out, const platform::Value& value) {
+bool appendFieldValue(std::string& out, const Value& value) {
   const auto& storage = value.storage();
   if (const auto* text = std::get_if<std::string>(&storage)) {
     platform::appendJsonString(out, *text);
@@ -34,9 +34,9 @@ bool appendFieldValue(std::string& out, const platform::Value& value) {
   return true;
 }
 
-std::optional<std::string> textForDigest(const platform::Value& value) {
+std::optional<std::string> textForDigest(const Value& value) {
   if (const auto* text = value.string()) return *text;
-  if (const auto* date = value.date()) return platform::Value(sanitizeDouble(date->secondsSince1970)).description();
+  if (const auto* date = value.date()) return Value(sanitizeDouble(date->secondsSince1970)).description();
   if (!value.isNumber()) return std::nullopt;
   if (const auto* real = std::get_if<double>(&value.storage()); real != nullptr && !std::isfinite(*real)) {
     return std::nullopt;
@@ -57,7 +57,7 @@ void FieldWriter::key(ReservedKey key) {
   _out.append(_form == Form::pretty ? "\": " : "\":");
 }
 
-void FieldWriter::value(std::string_view key, const platform::Value& value) {
+void FieldWriter::value(std::string_view key, const Value& value) {
   const std::size_t before = _out.size();
   this->key(key);
   if (appendFieldValue(_out, value)) {
@@ -115,7 +115,7 @@ void FieldWriter::finish() {
   }
 }
 
-void logUnsendable(std::string_view key, const platform::Value& value) {
+void logUnsendable(std::string_view key, const Value& value) {
   ORVANTA_LOG(warning, "HTTPSPostBackend(createMessageForPostAndLogging): Tressel unable to handle key: {}, value: {}",
               key, value.description());
 }

@@ -7,7 +7,7 @@
 #include <string_view>
 
 #include "backends/https/ReservedKeys.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 
 namespace orvanta {
 
@@ -15,10 +15,10 @@ namespace orvanta {
 // sent as its seconds since 1970 (-1.0 when not finite). Everything else, NaN and infinities included, is never sent.
 
 // Appends the field's value as JSON. False, with nothing appended, for what is never sent.
-bool appendFieldValue(std::string& out, const platform::Value& value);
+bool appendFieldValue(std::string& out, const Value& value);
 // The text that a digest filter hashes: a text as it is, numbers and dates as the decimal text of what would be sent
 // (booleans as 1 and 0). None for what is never sent, which a digest must not make sendable.
-std::optional<std::string> textForDigest(const platform::Value& value);
+std::optional<std::string> textForDigest(const Value& value);
 
 // Writes the fields of one event's JSON object, compact or indented for people, in the order of the calls. Borrows the
 // text for its lifetime.
@@ -31,7 +31,7 @@ class FieldWriter {
   // Fields that were written before in the compact form, each with its comma behind it. Only in that form.
   void fragment(std::string_view fields) { _out.append(fields); }
   // In the compact form, a value that is never sent is logged; the pretty form repeats what the compact one has logged.
-  void value(std::string_view key, const platform::Value& value);
+  void value(std::string_view key, const Value& value);
   void text(std::string_view key, std::string_view text);
   void text(ReservedKey key, std::string_view text);
   void number(ReservedKey key, std::int64_t number);
@@ -48,6 +48,6 @@ class FieldWriter {
 };
 
 // The line for a value that is left out.
-void logUnsendable(std::string_view key, const platform::Value& value);
+void logUnsendable(std::string_view key, const Value& value);
 
 }  // namespace orvanta

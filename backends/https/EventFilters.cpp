@@ -18,36 +18,36 @@ bool isAscii(std::string_view text) {
 }
 
 // A number, or a text, which reads as its leading number. False for other types.
-bool readNumber(const platform::Dictionary& definition, std::string_view key, std::int32_t& number) {
-  const platform::Value* value = definition.find(key);
+bool readNumber(const Dictionary& definition, std::string_view key, std::int32_t& number) {
+  const Value* value = definition.find(key);
   if (value == nullptr) return true;
   if (!value->isNumber() && value->string() == nullptr) return false;
   number = static_cast<std::int32_t>(value->integerValue());
   return true;
 }
 
-std::int32_t numberIn(const platform::Dictionary& event, ReservedKey key) {
-  const platform::Value* value = event.find(nameOf(key));
+std::int32_t numberIn(const Dictionary& event, ReservedKey key) {
+  const Value* value = event.find(nameOf(key));
   return value == nullptr ? 0 : static_cast<std::int32_t>(value->integerValue());
 }
 
 }  // namespace
 
-platform::Result<EventFilters> EventFilters::createFiltersFromArray(const platform::Array& definitions) {
+Result<EventFilters> EventFilters::createFiltersFromArray(const Array& definitions) {
   EventFilters made;
   made._filters.reserve(definitions.size());
   for (std::size_t i = 0; i < definitions.size(); ++i) {
-    const auto refuse = [&](std::string_view why) { return platform::Failure{fmt::format("filter {} {}", i, why)}; };
-    const platform::Dictionary* definition = definitions[i].dictionary();
+    const auto refuse = [&](std::string_view why) { return Failure{fmt::format("filter {} {}", i, why)}; };
+    const Dictionary* definition = definitions[i].dictionary();
     if (definition == nullptr) return refuse("is no dictionary");
     filterTag tag;
     if (!readNumber(*definition, "method", tag.method)) return refuse("has a \"method\" that is no number");
     if (!readNumber(*definition, "status", tag.status)) return refuse("has a \"status\" that is no number");
-    if (const platform::Value* key = definition->find("key")) {
+    if (const Value* key = definition->find("key")) {
       if (key->string() == nullptr) return refuse("has a \"key\" that is no text");
       tag.key = *key->string();
     }
-    if (const platform::Value* action = definition->find("action"); action != nullptr && action->string() != nullptr) {
+    if (const Value* action = definition->find("action"); action != nullptr && action->string() != nullptr) {
       if (*action->string() == "remove") tag.action = filterTag::kRemove;
       if (*action->string() == "sha256") tag.action = filterTag::kSHA256;
     }
@@ -71,11 +71,11 @@ const filterTag* EventFilters::search(std::string_view key, std::int32_t method,
   return nullptr;
 }
 
-void EventFilters::filterEvent(platform::Dictionary& event) const {
+void EventFilters::filterEvent(Dictionary& event) const {
   if (empty()) return;
   const std::int32_t method = numberIn(event, ReservedKey::method);
   const std::int32_t status = numberIn(event, ReservedKey::status);
-  std::vector<platform::Dictionary::Entry> kept;
+  std::vector<Dictionary::Entry> kept;
   kept.reserve(event.size());
   for (auto& [key, value] : event) {
     const filterTag* tag = find(key, method, status);
@@ -86,10 +86,10 @@ void EventFilters::filterEvent(platform::Dictionary& event) const {
       kept.emplace_back(key, std::move(*digest));
     }
   }
-  event = std::move(*platform::Dictionary::fromUniqueEntries(std::move(kept)));
+  event = std::move(*Dictionary::fromUniqueEntries(std::move(kept)));
 }
 
-std::optional<std::string> digestOf(const platform::Value& value) {
+std::optional<std::string> digestOf(const Value& value) {
   const auto text = textForDigest(value);
   if (!text) return std::nullopt;
   return OrvantaBackend::convertIntoSHA256(*text);

@@ -6,8 +6,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/core/Result.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 
 namespace orvanta {
 
@@ -26,7 +25,7 @@ class EventFilters {
  public:
   EventFilters() = default;
   // Refused, with the reason, when an element makes no sense: a table that lost a rule would let a field through.
-  static platform::Result<EventFilters> createFiltersFromArray(const platform::Array& definitions);
+  static Result<EventFilters> createFiltersFromArray(const Array& definitions);
 
   bool empty() const { return _filters.empty(); }
   const std::vector<filterTag>& table() const { return _filters; }
@@ -40,7 +39,7 @@ class EventFilters {
 
   // Removes or hashes the matching fields of a flat dictionary in place; its "_method" and "_status" (0 when absent)
   // are the category and type.
-  void filterEvent(platform::Dictionary& event) const;
+  void filterEvent(Dictionary& event) const;
 
  private:
   // One bit by length and first letter, so that most names are passed over at once.
@@ -57,6 +56,6 @@ class EventFilters {
 
 // What a digest rule makes of a value: 64 hexadecimal digits over its text; none when the value can never be sent, so
 // that the field is to be removed.
-std::optional<std::string> digestOf(const platform::Value& value);
+std::optional<std::string> digestOf(const Value& value);
 
 }  // namespace orvanta

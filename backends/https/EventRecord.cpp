@@ -11,14 +11,14 @@ constexpr ReservedKey kOwnKeys[] = {ReservedKey::sessionID,     ReservedKey::eve
                                     ReservedKey::status,        ReservedKey::clientTS,    ReservedKey::eventTime,
                                     ReservedKey::timezoneOffset};
 
-const platform::Dictionary& orEmpty(const platform::SharedDictionary& dictionary) {
-  static const platform::Dictionary kEmpty;
+const Dictionary& orEmpty(const SharedDictionary& dictionary) {
+  static const Dictionary kEmpty;
   return dictionary ? *dictionary : kEmpty;
 }
 
-std::size_t footprintOf(const platform::Dictionary& dictionary);
+std::size_t footprintOf(const Dictionary& dictionary);
 
-std::size_t footprintOf(const platform::Value& value) {
+std::size_t footprintOf(const Value& value) {
   if (const auto* text = value.string()) return text->size();
   if (const auto* data = value.data()) return data->bytes.size();
   if (const auto* dictionary = value.dictionary()) return footprintOf(*dictionary);
@@ -29,7 +29,7 @@ std::size_t footprintOf(const platform::Value& value) {
   return total;
 }
 
-std::size_t footprintOf(const platform::Dictionary& dictionary) {
+std::size_t footprintOf(const Dictionary& dictionary) {
   std::size_t total = 0;
   for (const auto& entry : dictionary) total += sizeof(entry) + entry.first.size() + footprintOf(entry.second);
   return total;
@@ -37,7 +37,7 @@ std::size_t footprintOf(const platform::Dictionary& dictionary) {
 
 }  // namespace
 
-EventRecord::EventRecord(std::shared_ptr<const SessionFields> fields, platform::SharedDictionary payload,
+EventRecord::EventRecord(std::shared_ptr<const SessionFields> fields, SharedDictionary payload,
                          std::optional<std::string> combinedSessionID, Numbers numbers)
     : _fields(std::move(fields)),
       _payload(std::move(payload)),
@@ -56,7 +56,7 @@ void EventRecord::prepare(std::shared_ptr<const RecordLayer> userInfo, const Eve
   if (change == nullptr) {
     _category = visibleNumber(ReservedKey::method);
   } else {
-    _category = change->digest ? static_cast<std::int32_t>(platform::Value(*change->digest).integerValue()) : 0;
+    _category = change->digest ? static_cast<std::int32_t>(Value(*change->digest).integerValue()) : 0;
   }
 }
 
@@ -68,11 +68,11 @@ std::int32_t EventRecord::visibleNumber(ReservedKey key) const {
   return key == ReservedKey::method ? _numbers.method : _numbers.respCode;
 }
 
-platform::Value EventRecord::ownValue(ReservedKey key) const {
+Value EventRecord::ownValue(ReservedKey key) const {
   switch (key) {
     case ReservedKey::sessionID:
       if (_fields->numericSessionID) return *_fields->numericSessionID;
-      return _combinedSessionID ? platform::Value(*_combinedSessionID) : platform::Value();
+      return _combinedSessionID ? Value(*_combinedSessionID) : Value();
     case ReservedKey::eventNumber:
       return static_cast<int>(_numbers.eventID);
     case ReservedKey::method:
@@ -92,7 +92,7 @@ platform::Value EventRecord::ownValue(ReservedKey key) const {
 void EventRecord::applyFilters(const EventFilters& filters) {
   const std::int32_t method = visibleNumber(ReservedKey::method);
   const std::int32_t status = visibleNumber(ReservedKey::status);
-  const auto apply = [&](std::string_view key, const filterTag* tag, const platform::Value& value) {
+  const auto apply = [&](std::string_view key, const filterTag* tag, const Value& value) {
     if (tag->action == filterTag::kRemove) _changes.push_back({key, std::nullopt});
     if (tag->action == filterTag::kSHA256) _changes.push_back({key, digestOf(value)});
   };

@@ -12,6 +12,7 @@
 #include "backends/https/RecordLayer.h"
 #include "backends/https/ReservedKeys.h"
 #include "backends/https/SessionFields.h"
+#include "interface/Values.h"
 
 namespace orvanta {
 
@@ -33,7 +34,7 @@ class EventRecord {
     double clientTS = 0;              // seconds, finite
   };
   // `payload` may be null. `combinedSessionID` gives way to the session's number where the session reports that.
-  EventRecord(std::shared_ptr<const SessionFields> fields, platform::SharedDictionary payload,
+  EventRecord(std::shared_ptr<const SessionFields> fields, SharedDictionary payload,
               std::optional<std::string> combinedSessionID, Numbers numbers);
 
   // Merges the user info (null: none) and applies the filters. Once.
@@ -61,13 +62,13 @@ class EventRecord {
   };
 
   std::int32_t visibleNumber(ReservedKey key) const;
-  platform::Value ownValue(ReservedKey key) const;
+  Value ownValue(ReservedKey key) const;
   void applyFilters(const EventFilters& filters);
   const Change* changeOf(std::string_view key) const;
   void writeReserved(FieldWriter& writer, ReservedKeys hidden) const;
 
   std::shared_ptr<const SessionFields> _fields;
-  platform::SharedDictionary _payload;
+  SharedDictionary _payload;
   std::shared_ptr<const RecordLayer> _userInfo;
   std::optional<std::string> _combinedSessionID;
   std::vector<Change> _changes;  // sorted by key; nearly always empty

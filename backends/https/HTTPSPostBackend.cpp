@@ -35,7 +35,7 @@ void completeWithError(FlushCompletion& completion, const char* description) {
 
 bool forcesEventLogging(Platform& platform) {
   const auto text = userDefaultStringForKey(platform, kForceEventLoggingKey);
-  return text && platform::Value(*text).boolValue();
+  return text && Value(*text).boolValue();
 }
 
 }  // namespace
@@ -110,10 +110,8 @@ SharedDictionary HTTPSPostBackend::sessionEndPayload(const SharedDictionary& pay
     ORVANTA_LOG(error, "HTTPSPostBackend(sendMessage): SESSION_TYPE_STOP message dictionary is nil");
     return payload;
   }
-  const auto numberOrNone = [](std::optional<double> number) {
-    return number ? platform::Value(*number) : platform::Value(-1);
-  };
-  auto extended = std::make_shared<platform::Dictionary>(*payload);
+  const auto numberOrNone = [](std::optional<double> number) { return number ? Value(*number) : Value(-1); };
+  auto extended = std::make_shared<Dictionary>(*payload);
   extended->set("Opt", static_cast<int>(_clientIdentity.dnuType()));
   extended->set("SamplingThreshold", numberOrNone(samplingThreshold()));
   extended->set("OverrideSampling", numberOrNone(_overrideSampling));
@@ -226,7 +224,7 @@ std::optional<std::string> HTTPSPostBackend::flushEnabled(FlushCompletion comple
   ORVANTA_LOG(debug, "HTTPSPostBackend(flushMessagesWithCompletion): called");
   std::shared_ptr<const RecordLayer> userInfo = _userInfo;
   if (userInfo && !_filters.empty()) {
-    auto filtered = std::make_shared<platform::Dictionary>(userInfo->entries());
+    auto filtered = std::make_shared<Dictionary>(userInfo->entries());
     _filters.filterEvent(*filtered);
     userInfo = RecordLayer::of(std::move(filtered));
   }

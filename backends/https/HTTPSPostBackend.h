@@ -17,6 +17,7 @@
 #include "backends/https/RecordLayer.h"
 #include "backends/https/ReportingDecision.h"
 #include "backends/https/SessionFields.h"
+#include "interface/Values.h"
 
 namespace orvanta {
 
@@ -57,7 +58,7 @@ class HTTPSPostBackend final : public OrvantaBackend {
   std::int32_t updateBackendState();
   ReportingFacts gatherFacts() const;
   void apply(ReportingDecision&& decision, const ReportingFacts& facts);
-  bool updatePostLink(const platform::Dictionary& section);
+  bool updatePostLink(const Dictionary& section);
   void resetBackendStateWithClient(const ReportingSettings::Counters& counters);
 
   // HTTPSPostBackend.cpp

@@ -108,7 +108,7 @@ void HTTPSPostBackend::apply(ReportingDecision&& decision, const ReportingFacts&
   _reason = std::move(decision.reason);
 }
 
-bool HTTPSPostBackend::updatePostLink(const platform::Dictionary& section) {
+bool HTTPSPostBackend::updatePostLink(const Dictionary& section) {
   bool supplied = false;
   std::optional<std::string> postURL = this->postURL();
   if (!_useDefaultPostURL || !postURL) {

@@ -9,7 +9,7 @@
 namespace orvanta {
 
 std::optional<std::string> userInfoText(const SharedDictionary& userInfo, std::string_view key) {
-  const platform::Value* value = userInfo ? userInfo->find(key) : nullptr;
+  const Value* value = userInfo ? userInfo->find(key) : nullptr;
   if (value == nullptr || (value->string() == nullptr && !value->isNumber())) return std::nullopt;
   return value->description();
 }

@@ -5,12 +5,12 @@
 
 namespace orvanta {
 
-std::shared_ptr<const RecordLayer> RecordLayer::of(platform::SharedDictionary entries) {
+std::shared_ptr<const RecordLayer> RecordLayer::of(SharedDictionary entries) {
   if (!entries || entries->empty()) return nullptr;
   return std::shared_ptr<const RecordLayer>(new RecordLayer(std::move(entries)));
 }
 
-RecordLayer::RecordLayer(platform::SharedDictionary entries) : _entries(std::move(entries)) {
+RecordLayer::RecordLayer(SharedDictionary entries) : _entries(std::move(entries)) {
   for (const auto& entry : *_entries) {
     const auto& [key, value] = entry;
     _keyBits |= bitOf(key);

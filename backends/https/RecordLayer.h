@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "backends/https/ReservedKeys.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 
 namespace orvanta {
 
@@ -16,10 +16,10 @@ namespace orvanta {
 class RecordLayer {
  public:
   // Null for a null or empty dictionary.
-  static std::shared_ptr<const RecordLayer> of(platform::SharedDictionary entries);
+  static std::shared_ptr<const RecordLayer> of(SharedDictionary entries);
 
-  const platform::Dictionary& entries() const { return *_entries; }
-  const platform::SharedDictionary& shared() const { return _entries; }
+  const Dictionary& entries() const { return *_entries; }
+  const SharedDictionary& shared() const { return _entries; }
   bool holds(std::string_view key) const { return (_keyBits & bitOf(key)) != 0 && _entries->contains(key); }
   ReservedKeys reservedKeys() const { return _reservedKeys; }
   // Compact, a comma behind each field, without what can never be sent.
@@ -27,17 +27,17 @@ class RecordLayer {
   void logUnsendable() const;
 
  private:
-  explicit RecordLayer(platform::SharedDictionary entries);
+  explicit RecordLayer(SharedDictionary entries);
   static std::uint64_t bitOf(std::string_view key) {
     const auto last = key.empty() ? 0U : static_cast<unsigned char>(key.back());
     return std::uint64_t{1} << ((key.size() * 11U + last) % 64U);
   }
 
-  const platform::SharedDictionary _entries;
+  const SharedDictionary _entries;
   std::uint64_t _keyBits = 0;
   ReservedKeys _reservedKeys = 0;
   std::string _json;
-  std::vector<const platform::Dictionary::Entry*> _unsendable;
+  std::vector<const Dictionary::Entry*> _unsendable;
 };
 
 }  // namespace orvanta

@@ -10,15 +10,12 @@
 namespace orvanta {
 namespace {
 
-using platform::Dictionary;
-using platform::Value;
-
 bool isForClient(const Dictionary& section, const ReportingFacts& facts) {
   return matchClientNameAndServiceID(section, facts.clientName, facts.serviceName);
 }
 
 // Decides by the first section for the client whether events are batched, against what the session asked for.
-void takeExpedite(ReportingDecision& decision, const platform::Array& sections, const ReportingFacts& facts) {
+void takeExpedite(ReportingDecision& decision, const Array& sections, const ReportingFacts& facts) {
   for (const Value& element : sections) {
     const Dictionary* section = element.dictionary();
     if (section == nullptr || !isForClient(*section, facts)) continue;
@@ -36,7 +33,7 @@ void takeCounters(ReportingDecision& decision, const Dictionary* section) {
   decision.settings.counters = counters;
 }
 
-void reportWithoutUserInfo(ReportingDecision& decision, const platform::Array& sections, const ReportingFacts& facts) {
+void reportWithoutUserInfo(ReportingDecision& decision, const Array& sections, const ReportingFacts& facts) {
   const Dictionary* source = nullptr;
   for (const Value& element : sections) {
     const Dictionary* section = element.dictionary();
@@ -52,7 +49,7 @@ void reportWithoutUserInfo(ReportingDecision& decision, const platform::Array& s
 }
 
 // The first section for the client that is enabled for this version; null, with the reason, when there is none.
-const Dictionary* chooseSection(ReportingReason& reason, const platform::Array& sections, const ReportingFacts& facts) {
+const Dictionary* chooseSection(ReportingReason& reason, const Array& sections, const ReportingFacts& facts) {
   reason.test = ReportingTest::noSectionMatches;
   for (std::size_t i = 0; i < sections.size(); ++i) {
     const Dictionary* section = sections[i].dictionary();
@@ -165,7 +162,7 @@ std::optional<ReportingSettings::EventList> eventList(const Dictionary& section,
 
 ReportingDecision evaluate(const Dictionary& profile, const ReportingFacts& facts) {
   ReportingDecision decision;
-  const platform::Array* sections = clientSections(profile);
+  const Array* sections = clientSections(profile);
   if (sections == nullptr) return decision;
   takeExpedite(decision, *sections, facts);
   if (!facts.requireUserInfo) {

@@ -8,6 +8,7 @@
 #include "backends/OrvantaBackend.h"
 #include "backends/https/EventFilters.h"
 #include "backends/https/ReportingReason.h"
+#include "interface/Values.h"
 
 namespace orvanta {
 
@@ -47,7 +48,7 @@ struct ReportingSettings {
   };
   struct EventList {
     std::vector<std::int32_t> categories;
-    const platform::Value* source = nullptr;
+    const Value* source = nullptr;
   };
 
   std::optional<bool> batchEvents;
@@ -57,7 +58,7 @@ struct ReportingSettings {
   std::optional<OverrideSampling> overrideSampling;
   std::optional<Counters> counters;
   bool customClientID = false;
-  std::vector<const platform::Dictionary*> linkSections;  // each supplies URLs, the later over the earlier
+  std::vector<const Dictionary*> linkSections;  // each supplies URLs, the later over the earlier
   std::optional<EventList> eventWhitelist;
   std::optional<EventList> eventBlacklist;
 };
@@ -70,6 +71,6 @@ struct ReportingDecision {
 
 // Whether and how a backend with this profile reports. Pure: no clock, no logs, no I/O. Elements of "clients" that are
 // no dictionaries are passed over; a chosen section whose restrictions make no sense reports nothing.
-ReportingDecision evaluate(const platform::Dictionary& profile, const ReportingFacts& facts);
+ReportingDecision evaluate(const Dictionary& profile, const ReportingFacts& facts);
 
 }  // namespace orvanta

@@ -12,8 +12,8 @@ bool reportsNumericSessionID(std::int32_t clientType, bool isInternal) {
   return clientType == 7 || (isInternal && (clientType == 11 || clientType == 13));
 }
 
-platform::Value valueOrNull(const std::optional<std::string>& text) {
-  return text ? platform::Value(*text) : platform::Value();
+Value valueOrNull(const std::optional<std::string>& text) {
+  return text ? Value(*text) : Value();
 }
 
 }  // namespace
@@ -36,7 +36,7 @@ std::shared_ptr<const SessionFields> SessionFields::of(const OrvantaBackend& bac
   FieldWriter writer(fields->json, FieldWriter::Form::compact);
   for (std::size_t i = 0; i <= static_cast<std::size_t>(ReservedKey::reportVers); ++i) {
     const auto key = static_cast<ReservedKey>(i);
-    const platform::Value value = fields->value(key);
+    const Value value = fields->value(key);
     if (value.isNull()) continue;
     fields->present |= setOf(key);
     writer.value(nameOf(key), value);
@@ -45,7 +45,7 @@ std::shared_ptr<const SessionFields> SessionFields::of(const OrvantaBackend& bac
   return fields;
 }
 
-platform::Value SessionFields::value(ReservedKey key) const {
+Value SessionFields::value(ReservedKey key) const {
   switch (key) {
     case ReservedKey::startTS:
       return startTS;

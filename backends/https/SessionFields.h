@@ -7,6 +7,7 @@
 
 #include "backends/OrvantaBackend.h"
 #include "backends/https/ReservedKeys.h"
+#include "interface/Values.h"
 
 namespace orvanta {
 
@@ -34,7 +35,7 @@ struct SessionFields {
   std::string json;          // compact, a comma behind each field
 
   // The constant field's value; null when it is absent or not one of them.
-  platform::Value value(ReservedKey key) const;
+  Value value(ReservedKey key) const;
   // startTS + (event time - session start): all events of a session share one minute-aligned origin.
   double clientTS(platform::TimeValue eventTime) const;
 };

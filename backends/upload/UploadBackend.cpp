@@ -21,7 +21,7 @@ std::uint64_t bytesToRead(std::uint64_t size) {
 }
 
 std::optional<std::string> textAt(const SharedDictionary& dictionary, std::string_view key) {
-  const platform::Value* value = dictionary ? dictionary->find(key) : nullptr;
+  const Value* value = dictionary ? dictionary->find(key) : nullptr;
   const std::string* text = value == nullptr ? nullptr : value->string();
   return text == nullptr ? std::nullopt : std::optional(*text);
 }

@@ -11,7 +11,7 @@
 #include <sstream>
 #include <string>
 
-#include "interface/PluginBundle.h"
+#include <orvanta/interface/PluginBundle.h>
 
 namespace {
 

@@ -1,5 +1,5 @@
 // Reports one event and waits until it has been sent. Prints what the daemon answered.
-#include <client/OrvantaClient.h>
+#include <orvanta/client/OrvantaClient.h>
 
 #include <iostream>
 

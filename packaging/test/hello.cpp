@@ -1,5 +1,5 @@
 // Reports one event of the category that it is given, as a program would that is built against the installed library.
-#include <client/OrvantaClient.h>
+#include <orvanta/client/OrvantaClient.h>
 
 #include <cstdlib>
 #include <iostream>

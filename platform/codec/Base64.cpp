@@ -3,7 +3,7 @@
 
 #include "platform/codec/PropertyList.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -64,4 +64,4 @@ std::optional<std::vector<std::uint8_t>> decodeBase64(std::string_view text) {
   return bytes;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

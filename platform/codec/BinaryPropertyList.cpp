@@ -10,7 +10,7 @@
 #include "platform/codec/PropertyList.h"
 #include "platform/core/Utf8.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -316,4 +316,4 @@ Result<Value> parseBinaryPropertyList(std::span<const std::uint8_t> bytes, const
   }
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

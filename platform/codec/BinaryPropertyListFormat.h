@@ -5,7 +5,7 @@
 #include <cstdint>
 
 // The binary property list, "bplist00": the magic, the objects, a table of their offsets, a trailer of 32 bytes.
-namespace platform::binary_property_list {
+namespace orvanta::platform::binary_property_list {
 
 inline constexpr std::array<std::uint8_t, 8> kMagic{'b', 'p', 'l', 'i', 's', 't', '0', '0'};
 
@@ -39,4 +39,4 @@ inline constexpr std::uint8_t kCountFollows = 0xf;
 // Dates count from 2001-01-01T00:00:00Z.
 inline constexpr double kEpochOffset = 978307200;
 
-}  // namespace platform::binary_property_list
+}  // namespace orvanta::platform::binary_property_list

@@ -8,7 +8,7 @@
 #include "platform/codec/PropertyList.h"
 #include "platform/core/Utf8.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -192,4 +192,4 @@ Result<std::vector<std::uint8_t>> writeBinaryPropertyList(const Value& value) {
   return writer.write();
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -7,7 +7,7 @@
 
 #include "platform/codec/PropertyList.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -176,4 +176,4 @@ void appendJsonNumber(std::string& out, std::uint64_t v) {
   appendShortest(out, v);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

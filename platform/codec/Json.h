@@ -7,7 +7,7 @@
 #include "platform/core/Utf8.h"
 #include "platform/core/Value.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // Compact or indented JSON of a value. Data becomes base64 text, a date its seconds, NaN and infinities null.
 std::string writeJson(const Value& value, bool pretty = false);
@@ -22,4 +22,4 @@ bool appendJsonNumber(std::string& out, double v);
 void appendJsonNumber(std::string& out, std::int64_t v);
 void appendJsonNumber(std::string& out, std::uint64_t v);
 
-}  // namespace platform
+}  // namespace orvanta::platform

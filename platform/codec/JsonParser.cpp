@@ -13,7 +13,7 @@
 
 #include "platform/codec/Json.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -134,4 +134,4 @@ Result<Value> parseJson(std::string_view text) {
   return builder.takeResult();
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

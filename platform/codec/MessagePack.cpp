@@ -8,7 +8,7 @@
 
 #include "platform/codec/MessagePackReader.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -184,4 +184,4 @@ Result<Value> decodeMessagePack(std::span<const std::uint8_t> bytes, const Messa
   return value;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

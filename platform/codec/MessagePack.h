@@ -10,7 +10,7 @@
 #include "platform/core/Result.h"
 #include "platform/core/Value.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // What a decoder accepts. Depth counts the outermost array; `maximumCharge` bounds what the decoded values take in
 // memory, so that a small message cannot become a large one.
@@ -47,4 +47,4 @@ class MessagePackWriter {
 // extension types, map keys that are not text, duplicate keys, text that is not UTF-8, anything over the limits.
 Result<Value> decodeMessagePack(std::span<const std::uint8_t> bytes, const MessagePackLimits& limits = {});
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -2,7 +2,7 @@
 
 #include <array>
 
-namespace platform {
+namespace orvanta::platform {
 
 MessagePackHead readLongMessagePackHead(std::span<const std::uint8_t> bytes) {
   using Kind = MessagePackHead::Kind;
@@ -69,4 +69,4 @@ MessagePackHead readLongMessagePackHead(std::span<const std::uint8_t> bytes) {
   return head;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

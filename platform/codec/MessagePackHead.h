@@ -9,7 +9,7 @@
 
 #include "platform/core/Value.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // The first bytes of one MessagePack value: its type and, by type, the number itself, the length of what follows or the
 // count of elements.
@@ -93,4 +93,4 @@ inline MessagePackHead readMessagePackHead(std::span<const std::uint8_t> bytes) 
   return readLongMessagePackHead(bytes);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

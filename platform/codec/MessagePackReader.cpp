@@ -7,7 +7,7 @@
 
 #include "platform/core/Utf8.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -204,4 +204,4 @@ void MessagePackReader::refuseDuplicate(std::size_t offset, const std::vector<Di
   }
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

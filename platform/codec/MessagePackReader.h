@@ -11,7 +11,7 @@
 #include "platform/codec/MessagePackHead.h"
 #include "platform/core/Value.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // Reads MessagePack out of one byte range, value by value, within limits. Used on the stack of whoever has the bytes.
 //
@@ -73,4 +73,4 @@ class MessagePackReader {
   std::optional<std::string> _refusal;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

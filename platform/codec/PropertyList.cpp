@@ -11,7 +11,7 @@
 #include "platform/core/UniqueFd.h"
 #include "platform/core/WholeFile.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -47,4 +47,4 @@ Result<Value> readPropertyListFile(const std::string& path, const PropertyListLi
   return value;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

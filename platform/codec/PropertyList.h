@@ -11,7 +11,7 @@
 #include "platform/core/Result.h"
 #include "platform/core/Value.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 struct PropertyListLimits {
   std::size_t maximumDepth = 128;
@@ -37,4 +37,4 @@ std::string encodeBase64(std::span<const std::uint8_t> bytes);
 // (a lone trailing character, or text behind the padding).
 std::optional<std::vector<std::uint8_t>> decodeBase64(std::string_view text);
 
-}  // namespace platform
+}  // namespace orvanta::platform

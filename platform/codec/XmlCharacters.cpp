@@ -2,7 +2,7 @@
 
 #include "platform/core/Utf8.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 bool isXmlCharacter(char32_t codePoint) {
   if (codePoint < 0x20) return codePoint == '\t' || codePoint == '\n' || codePoint == '\r';
@@ -25,4 +25,4 @@ std::optional<std::size_t> findNonXmlCharacter(std::string_view text) {
   return std::nullopt;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -13,7 +13,7 @@
 #include "platform/core/PropertyListDate.h"
 #include "platform/core/Utf8.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -303,4 +303,4 @@ Result<Value> parseXmlPropertyList(std::span<const std::uint8_t> bytes, const Pr
   }
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -7,7 +7,7 @@
 #include "platform/codec/XmlCharacters.h"
 #include "platform/core/PropertyListDate.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -120,4 +120,4 @@ Result<std::string> writeXmlPropertyList(const Value& value) {
   return out;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -2,7 +2,7 @@
 
 #include <ctime>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 timespec now() {
@@ -22,4 +22,4 @@ double SystemClock::wallSeconds() const {
   return static_cast<double>(value.tv_sec) + static_cast<double>(value.tv_nsec) / 1e9;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -3,7 +3,7 @@
 #include <chrono>
 #include <cstdint>
 
-namespace platform {
+namespace orvanta::platform {
 
 // A time-of-day record: whole seconds since 1970-01-01 UTC and microseconds.
 struct TimeValue {
@@ -27,4 +27,4 @@ class SystemClock final : public Clock {
   double wallSeconds() const override;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

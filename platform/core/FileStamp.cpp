@@ -11,7 +11,7 @@
 #include "platform/core/UniqueFd.h"
 #include "platform/core/WholeFile.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -81,4 +81,4 @@ Result<StampedContent> readStamped(const std::string& path, std::size_t maximumB
   return content;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

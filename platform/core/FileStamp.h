@@ -8,7 +8,7 @@
 
 #include "platform/core/Result.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // Tells one state of a file from another without reading it. A plain value.
 struct FileStamp {
@@ -36,4 +36,4 @@ struct StampedContent {
 // Reads a whole regular file. A missing file is no failure: its stamp says so.
 Result<StampedContent> readStamped(const std::string& path, std::size_t maximumBytes);
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -7,13 +7,13 @@
 #include "platform/core/LogSink.h"
 
 // Logs one line. The arguments are neither evaluated nor formatted when the level is off.
-#define PLATFORM_LOG(LEVEL, ...)                                          \
-  do {                                                                    \
-    if (::platform::logEnabled(::platform::LogLevel::LEVEL))              \
-      ::platform::logFormatted(::platform::LogLevel::LEVEL, __VA_ARGS__); \
+#define PLATFORM_LOG(LEVEL, ...)                                                            \
+  do {                                                                                      \
+    if (::orvanta::platform::logEnabled(::orvanta::platform::LogLevel::LEVEL))              \
+      ::orvanta::platform::logFormatted(::orvanta::platform::LogLevel::LEVEL, __VA_ARGS__); \
   } while (false)
 
-namespace platform {
+namespace orvanta::platform {
 
 template <class... Args>
 void logFormatted(LogLevel level, fmt::format_string<Args...> format, Args&&... args) {
@@ -22,4 +22,4 @@ void logFormatted(LogLevel level, fmt::format_string<Args...> format, Args&&... 
   writeLogLine(level, std::string_view(buffer.data(), buffer.size()));
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -2,7 +2,7 @@
 
 #include <string>
 
-namespace platform {
+namespace orvanta::platform {
 
 std::atomic<int> gLogLevel{static_cast<int>(LogLevel::info)};
 
@@ -48,4 +48,4 @@ void writeLogLine(LogLevel level, std::string_view text) {
   sink->write(level, line);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

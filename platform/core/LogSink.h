@@ -3,7 +3,7 @@
 #include <atomic>
 #include <string_view>
 
-namespace platform {
+namespace orvanta::platform {
 
 // syslog's numbers.
 enum class LogLevel : int { error = 3, warning = 4, notice = 5, info = 6, debug = 7 };
@@ -28,4 +28,4 @@ inline bool logEnabled(LogLevel level) {
 // Writes one entry; line breaks inside `text` become the two characters "\n", other control characters "?".
 void writeLogLine(LogLevel level, std::string_view text);
 
-}  // namespace platform
+}  // namespace orvanta::platform

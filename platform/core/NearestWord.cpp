@@ -8,7 +8,7 @@
 #include <utility>
 #include <vector>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -47,4 +47,4 @@ std::string describeUnknownKeys(const Dictionary& dictionary, std::span<const st
   return text;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

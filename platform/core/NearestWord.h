@@ -6,7 +6,7 @@
 
 #include "platform/core/Value.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // The one of `known` (at least one) that takes the fewest changes to become `word`: what was probably meant.
 std::string_view nearestWord(std::string_view word, std::span<const std::string_view> known);
@@ -15,4 +15,4 @@ std::string_view nearestWord(std::string_view word, std::span<const std::string_
 // are known.
 std::string describeUnknownKeys(const Dictionary& dictionary, std::span<const std::string_view> known);
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -6,7 +6,7 @@
 
 #include <fmt/format.h>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -51,4 +51,4 @@ std::optional<std::string> formatPropertyListDate(double secondsSince1970) {
                      time.minutes().count(), time.seconds().count());
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -4,7 +4,7 @@
 #include <utility>
 #include <variant>
 
-namespace platform {
+namespace orvanta::platform {
 
 // Why something failed: one sentence that says what and where.
 struct Failure {
@@ -35,4 +35,4 @@ class Result {
   std::variant<T, Failure> _content;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

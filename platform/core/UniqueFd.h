@@ -4,7 +4,7 @@
 
 #include <utility>
 
-namespace platform {
+namespace orvanta::platform {
 
 // Owns one file descriptor and closes it. -1 is "none".
 class UniqueFd {
@@ -32,4 +32,4 @@ class UniqueFd {
   int _fd = -1;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -7,7 +7,7 @@
 #include <type_traits>
 #include <utility>
 
-namespace platform {
+namespace orvanta::platform {
 
 // A move-only callable: what std::move_only_function will be once every compiler we build with has it.
 // Callables of up to 64 bytes are kept inside the object, so that a reply or a posted job costs no allocation.
@@ -92,4 +92,4 @@ class UniqueFunction<R(Args...)> {
   const Operations* _operations = nullptr;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -3,7 +3,7 @@
 #include <cstdint>
 #include <cstring>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -117,4 +117,4 @@ void appendUtf8(std::string& out, char32_t codePoint) {
   }
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -4,7 +4,7 @@
 #include <string>
 #include <string_view>
 
-namespace platform {
+namespace orvanta::platform {
 
 // Whether `text` is UTF-8 throughout: no overlong forms, no surrogates, nothing above U+10FFFF.
 bool isValidUtf8(std::string_view text);
@@ -21,4 +21,4 @@ Utf8Character firstUtf8Character(std::string_view text);
 // `codePoint` is a Unicode scalar value.
 void appendUtf8(std::string& out, char32_t codePoint);
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -6,7 +6,7 @@
 #include <limits>
 #include <system_error>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -242,4 +242,4 @@ bool operator==(const Value& a, const Value& b) {
   return a._storage == b._storage;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -10,7 +10,7 @@
 #include <variant>
 #include <vector>
 
-namespace platform {
+namespace orvanta::platform {
 
 class Value;
 
@@ -145,4 +145,4 @@ using SharedArray = std::shared_ptr<const Array>;
 // "YYYY-MM-DD hh:mm:ss +0000" in UTC.
 std::string describeDate(double secondsSince1970);
 
-}  // namespace platform
+}  // namespace orvanta::platform

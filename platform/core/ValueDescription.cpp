@@ -7,7 +7,7 @@
 #include "platform/core/PropertyListDate.h"
 #include "platform/core/Value.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -100,4 +100,4 @@ std::string describeDate(double secondsSince1970) {
   return std::move(*text);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

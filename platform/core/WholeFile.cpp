@@ -11,7 +11,7 @@
 
 #include "platform/core/UniqueFd.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -51,4 +51,4 @@ Result<std::string> readWholeFile(const std::string& path, std::size_t maximumBy
   return content;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

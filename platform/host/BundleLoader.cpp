@@ -7,7 +7,7 @@
 
 #include "platform/core/Log.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 const void* LoadedBundle::symbol(const char* name) const {
   return ::dlsym(_library, name);
@@ -37,4 +37,4 @@ const LoadedBundle* BundleLoader::load(const std::string& bundleDirectory) {
   return slot.get();
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

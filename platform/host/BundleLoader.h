@@ -5,7 +5,7 @@
 #include <mutex>
 #include <string>
 
-namespace platform {
+namespace orvanta::platform {
 
 // The code of a plug-in bundle, loaded into the process for good: a plug-in may have threads and handlers of its own,
 // so that nothing ever unloads it. Immutable; any thread.
@@ -31,4 +31,4 @@ class BundleLoader {
   std::map<std::string, std::unique_ptr<LoadedBundle>> _loaded;  // by directory; guarded by _mutex
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

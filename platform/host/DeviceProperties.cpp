@@ -17,7 +17,7 @@
 #include "platform/core/NearestWord.h"
 #include "platform/host/SystemFacts.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -255,4 +255,4 @@ int LinuxDeviceProperties::timeZoneOffset(double wallSeconds) const {
   return *last.offset;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -6,7 +6,7 @@
 
 #include "platform/core/Value.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // What the device says of itself. Every query may be called from any thread; none means that the platform has no
 // answer.
@@ -58,4 +58,4 @@ class LinuxDeviceProperties final : public DeviceProperties {
   std::unique_ptr<State> _state;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -11,7 +11,7 @@
 
 #include "platform/core/Log.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -143,4 +143,4 @@ std::string uuidText(const std::array<std::uint8_t, 16>& uuid) {
   return text.data();
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

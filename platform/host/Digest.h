@@ -7,7 +7,7 @@
 #include <string>
 #include <string_view>
 
-namespace platform {
+namespace orvanta::platform {
 
 // Digests over OpenSSL, whose algorithm objects are fetched once per process. Thread-safe.
 std::array<std::uint8_t, 20> sha1(std::span<const std::uint8_t> bytes);
@@ -29,4 +29,4 @@ class RsaPublicKey {
 std::array<std::uint8_t, 16> randomUuid();
 std::string uuidText(const std::array<std::uint8_t, 16>& uuid);
 
-}  // namespace platform
+}  // namespace orvanta::platform

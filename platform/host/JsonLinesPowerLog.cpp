@@ -12,7 +12,7 @@
 #include "platform/codec/Json.h"
 #include "platform/core/Log.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -94,4 +94,4 @@ bool JsonLinesPowerLog::append(std::string_view line) {
   return false;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

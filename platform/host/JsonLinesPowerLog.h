@@ -11,7 +11,7 @@
 #include "platform/core/UniqueFd.h"
 #include "platform/host/PowerLog.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // The power log of a device that has none of its own: one JSON line per record in the file `path`,
 // {"event": number, "sender": text, "time": seconds since 1970, "record": {…}}.
@@ -44,4 +44,4 @@ class JsonLinesPowerLog final : public PowerLog {
   bool _failing = false;  // guarded by _mutex: the last record was lost
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -7,7 +7,7 @@
 #include <mutex>
 #include <string>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -66,4 +66,4 @@ void KeepAlive::stopping() {
   ::sd_notify(0, "STOPPING=1");
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -4,7 +4,7 @@
 #include <cstdint>
 #include <string_view>
 
-namespace platform {
+namespace orvanta::platform {
 
 // Tells the service manager whether the process is busy. begin() and end() come in pairs from any thread.
 // Without a service manager it only counts.
@@ -27,4 +27,4 @@ class KeepAlive {
   std::atomic<std::uint64_t> _ended{0};
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

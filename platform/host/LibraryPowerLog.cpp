@@ -9,7 +9,7 @@
 #include "platform/core/Log.h"
 #include "platform/queue/WorkQueue.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -45,4 +45,4 @@ void LibraryPowerLog::registeredEvent(std::int32_t event, std::string_view sende
   _logRegisteredEvent(event, std::string(sender).c_str(), &packed, nullptr);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

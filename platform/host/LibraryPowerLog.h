@@ -7,7 +7,7 @@
 #include "platform/host/PowerLog.h"
 #include "platform/host/PowerLogLibrary.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // The device's own power log: the platform library that PowerLogLibrary.h describes. The library stays loaded for as
 // long as the process lives. Thread-safe in so far as the library is.
@@ -27,4 +27,4 @@ class LibraryPowerLog final : public PowerLog {
   const Function _logRegisteredEvent;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -7,7 +7,7 @@
 
 #include <cstdint>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -42,4 +42,4 @@ void releaseUnusedMemory() {
   ::dl_iterate_phdr(dropReadOnlySegments, nullptr);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

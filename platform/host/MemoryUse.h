@@ -1,6 +1,6 @@
 #pragma once
 
-namespace platform {
+namespace orvanta::platform {
 
 // What the process keeps in memory, for a daemon that is idle most of its life.
 
@@ -12,4 +12,4 @@ void tuneAllocator();
 // earlier work touched; those that are needed again come from the page cache. Takes about a millisecond. Any thread.
 void releaseUnusedMemory();
 
-}  // namespace platform
+}  // namespace orvanta::platform

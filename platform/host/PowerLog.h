@@ -6,7 +6,7 @@
 
 #include "platform/core/Value.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // The device's power log. Callable from any thread; failures are not reported.
 class PowerLog {
@@ -15,4 +15,4 @@ class PowerLog {
   virtual void registeredEvent(std::int32_t event, std::string_view sender, const Dictionary& record) = 0;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

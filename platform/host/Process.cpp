@@ -10,7 +10,7 @@
 
 #include "platform/core/Log.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 sigset_t terminationSignals() {
@@ -50,4 +50,4 @@ int waitForTermination() {
   }
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

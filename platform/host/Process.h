@@ -1,6 +1,6 @@
 #pragma once
 
-namespace platform {
+namespace orvanta::platform {
 
 // The process's own set-up. All of it is for main's thread, before other threads exist.
 
@@ -14,4 +14,4 @@ void blockTerminationSignals();
 // Sleeps until SIGTERM or SIGINT; returns its number.
 int waitForTermination();
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -8,7 +8,7 @@
 
 #include "platform/host/Digest.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -116,4 +116,4 @@ std::optional<std::string> deriveDeviceIdentifier(std::string_view machineId, st
   return hexDigits(sha256(bytes)).substr(0, 40);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

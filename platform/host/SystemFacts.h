@@ -4,7 +4,7 @@
 #include <string>
 #include <string_view>
 
-namespace platform {
+namespace orvanta::platform {
 
 // What the system's own files say of the device: pure functions from a file's content to a fact, none when it says
 // nothing.
@@ -25,4 +25,4 @@ std::optional<std::string> firmwareText(std::string_view content);
 // 40 hexadecimal digits that tell devices apart and, without the machine's identifier, applications too.
 std::optional<std::string> deriveDeviceIdentifier(std::string_view machineId, std::string_view application);
 
-}  // namespace platform
+}  // namespace orvanta::platform

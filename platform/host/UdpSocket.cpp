@@ -4,7 +4,7 @@
 
 #include <cerrno>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -47,4 +47,4 @@ std::optional<std::size_t> UdpSocket::receive(std::span<std::uint8_t> buffer) {
   return static_cast<std::size_t>(received);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

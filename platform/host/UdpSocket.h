@@ -9,7 +9,7 @@
 
 #include "platform/core/UniqueFd.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // An IPv4 UDP socket that never blocks. Owned and used by one thread or queue at a time. What the system refuses comes
 // back as its error number; 0 is success.
@@ -33,4 +33,4 @@ class UdpSocket {
   UniqueFd _fd;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

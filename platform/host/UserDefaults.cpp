@@ -16,7 +16,7 @@
 #include "platform/core/UniqueFd.h"
 #include "platform/queue/WorkQueue.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -220,4 +220,4 @@ void UserDefaults::logOnce(const std::string& problem) {
   PLATFORM_LOG(error, "UserDefaults: {}", problem);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -10,7 +10,7 @@
 #include "platform/core/Result.h"
 #include "platform/core/Value.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // One domain of user defaults: an XML property list `directory`/`domain`.plist, shared with other processes.
 //
@@ -64,4 +64,4 @@ class UserDefaults {
   std::string _problem;  // guarded by _mutex: the last one logged, until the file reads well again
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -14,7 +14,7 @@
 #include "platform/http/HttpHeaderList.h"
 #include "platform/http/HttpRedirect.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -155,4 +155,4 @@ std::unique_ptr<HttpClient> makeCurlHttpClient(WorkPool& pool, HttpClientOptions
   return std::make_unique<CurlHttpClient>(pool, std::move(options));
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

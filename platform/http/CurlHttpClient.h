@@ -11,7 +11,7 @@
 #include "platform/http/HttpIntake.h"
 #include "platform/http/HttpTransferLoop.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // The HTTP client over libcurl: checks and hands in requests on the callers' threads, and runs a HttpTransferLoop on a
 // thread of its own. The thread starts with the first request, so that a process can enter its sandbox before.
@@ -45,4 +45,4 @@ class CurlHttpClient final : public HttpClient {
   std::atomic<HttpTransferLoop*> _running{nullptr};
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

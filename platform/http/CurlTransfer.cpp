@@ -4,7 +4,7 @@
 
 #include <utility>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -179,4 +179,4 @@ std::size_t CurlTransfer::receiveBody(std::string_view bytes) {
   return bytes.size();
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

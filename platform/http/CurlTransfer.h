@@ -11,7 +11,7 @@
 #include "platform/http/HttpClient.h"
 #include "platform/http/HttpHeaderList.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // One libcurl handle with what belongs to it: a request on its way out and the answer on its way in. Kept and used
 // again for later requests, which is three times cheaper than a new one. Owned by the HTTP thread and touched only
@@ -71,4 +71,4 @@ class CurlTransfer {
   std::array<char, CURL_ERROR_SIZE> _errorText{};
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

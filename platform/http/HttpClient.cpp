@@ -4,7 +4,7 @@
 
 #include <algorithm>
 
-namespace platform {
+namespace orvanta::platform {
 
 const std::string* HttpResponse::header(std::string_view name) const {
   const auto found = std::find_if(headers.begin(), headers.end(), [&](const HttpHeader& header) {
@@ -13,4 +13,4 @@ const std::string* HttpResponse::header(std::string_view name) const {
   return found == headers.end() ? nullptr : &found->value;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -12,7 +12,7 @@
 #include "platform/core/UniqueFunction.h"
 #include "platform/queue/WorkQueue.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 struct HttpHeader {
   std::string name;
@@ -105,4 +105,4 @@ struct HttpClientOptions {
 // The client over libcurl's multi interface. The pool outlives it.
 std::unique_ptr<HttpClient> makeCurlHttpClient(WorkPool& pool, HttpClientOptions options);
 
-}  // namespace platform
+}  // namespace orvanta::platform

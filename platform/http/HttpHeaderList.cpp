@@ -9,7 +9,7 @@
 
 #include "platform/core/Log.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -81,4 +81,4 @@ HttpHeaderList makeHeaderList(const HttpRequest& request, bool redirected) {
   return list;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -6,7 +6,7 @@
 
 #include "platform/http/HttpClient.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 struct HttpHeaderListDeleter {
   void operator()(curl_slist* list) const { curl_slist_free_all(list); }
@@ -22,4 +22,4 @@ using HttpHeaderList = std::unique_ptr<curl_slist, HttpHeaderListDeleter>;
 // Null when there is no memory.
 HttpHeaderList makeHeaderList(const HttpRequest& request, bool redirected);
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -6,7 +6,7 @@
 
 #include "platform/http/HttpLaneQueue.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -89,4 +89,4 @@ void HttpIntake::stop() {
   _stop = true;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

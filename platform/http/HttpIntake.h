@@ -12,7 +12,7 @@
 #include "platform/http/HttpClient.h"
 #include "platform/http/PendingHttpRequest.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // The door between callers and the HTTP thread: takes requests in their order, charges them against the limits, and
 // knows when all have ended. Owned by the client. Thread-safe.
@@ -63,4 +63,4 @@ class HttpIntake {
   bool _stop = false;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

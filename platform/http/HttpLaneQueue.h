@@ -8,7 +8,7 @@
 #include "platform/http/HttpClient.h"
 #include "platform/http/PendingHttpRequest.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // One lane: what waits in it, what is in flight, and the serial queue that its completions run on, so that they come in
 // the lane's order. Shared by whoever hands requests in and by the requests themselves.
@@ -44,4 +44,4 @@ class HttpLaneQueue final : public HttpLane {
   }
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -3,7 +3,7 @@
 #include <fmt/format.h>
 #include <strings.h>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -52,4 +52,4 @@ std::string describeRefusal(RedirectVerdict verdict, const HttpRedirect& redirec
   return {};
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

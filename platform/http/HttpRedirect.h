@@ -3,7 +3,7 @@
 #include <string>
 #include <string_view>
 
-namespace platform {
+namespace orvanta::platform {
 
 // An answer that may send a request elsewhere.
 struct HttpRedirect {
@@ -30,4 +30,4 @@ std::string describeRefusal(RedirectVerdict verdict, const HttpRedirect& redirec
 bool isHttpUrl(std::string_view url);
 bool isHttpsUrl(std::string_view url);
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -10,7 +10,7 @@
 #include "platform/core/Log.h"
 #include "platform/http/HttpRedirect.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -224,4 +224,4 @@ void HttpTransferLoop::deliver(std::unique_ptr<PendingHttpRequest> request, Http
   });
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

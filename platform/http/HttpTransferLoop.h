@@ -15,7 +15,7 @@
 #include "platform/http/HttpLaneQueue.h"
 #include "platform/http/PendingHttpRequest.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // What the HTTP thread does: takes requests from the intake, keeps one of each lane in flight, watches deadlines,
 // follows redirects and hands results over. Asleep, without any wake-up, while nothing is in flight. Owned by the
@@ -79,4 +79,4 @@ class HttpTransferLoop {
   bool _blockingAborted = false;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -10,7 +10,7 @@
 #include "platform/http/HttpClient.h"
 #include "platform/http/HttpHeaderList.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 class HttpLaneQueue;
 struct PendingHttpRequest;
@@ -34,4 +34,4 @@ struct PendingHttpRequest {
   HttpDeadlines::iterator deadlineEntry;   // valid while deadline is set
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -7,7 +7,7 @@
 
 #include "platform/ipc/UnixAddress.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 Failure failure(const std::string& path, int error, int* errorNumber) {
@@ -29,4 +29,4 @@ Result<UniqueFd> connectToService(const std::string& directory, const std::strin
   return socket;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -5,7 +5,7 @@
 #include "platform/core/Result.h"
 #include "platform/core/UniqueFd.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // Connects to the named service whose socket lies in `directory`: the client's counterpart of Listener. Does not block;
 // the socket is non-blocking and close-on-exec. Any thread.
@@ -15,4 +15,4 @@ namespace platform {
 // ENAMETOOLONG. It is 0 on success.
 Result<UniqueFd> connectToService(const std::string& directory, const std::string& service, int* errorNumber = nullptr);
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -14,7 +14,7 @@
 #include "platform/ipc/FrameDecoder.h"
 #include "platform/queue/WorkQueue.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 struct ConnectionLimits {
   FrameLimits frame;
@@ -95,4 +95,4 @@ void appendResponseHeader(std::vector<std::uint8_t>& out, std::uint32_t messageI
 // A whole response that carries the transport's own error text.
 void appendErrorResponse(std::vector<std::uint8_t>& out, std::uint32_t messageID, std::string_view text);
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -8,7 +8,7 @@
 
 #include "platform/codec/MessagePackReader.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -210,4 +210,4 @@ void FrameDecoder::consume(std::size_t bytes) {
   }
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -11,7 +11,7 @@
 #include "platform/codec/MessagePack.h"
 #include "platform/core/Value.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // One MessagePack-RPC message, taken apart.
 struct Frame {
@@ -88,4 +88,4 @@ class FrameDecoder {
   std::optional<std::string> _failed;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

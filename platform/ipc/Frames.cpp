@@ -1,7 +1,7 @@
 #include "platform/codec/MessagePack.h"
 #include "platform/ipc/Connection.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 void appendRequestHeader(std::vector<std::uint8_t>& out, std::uint32_t messageID, std::string_view method,
                          std::size_t paramCount) {
@@ -35,4 +35,4 @@ void appendErrorResponse(std::vector<std::uint8_t>& out, std::uint32_t messageID
   writer.nil();
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

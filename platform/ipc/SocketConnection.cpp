@@ -6,7 +6,7 @@
 
 #include "platform/ipc/SocketIo.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -261,4 +261,4 @@ void SocketConnection::end() {
   _socket.reset();
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

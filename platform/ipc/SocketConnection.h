@@ -11,7 +11,7 @@
 #include "platform/ipc/SocketOutbox.h"
 #include "platform/queue/WorkQueue.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // The Connection over a socket.
 //
@@ -85,4 +85,4 @@ class SocketConnection final : public Connection, public SocketOutbox::Observer 
   bool _waitsForReplies = false;  // reading has stopped until the peer takes some
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

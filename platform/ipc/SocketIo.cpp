@@ -7,7 +7,7 @@
 #include <cerrno>
 #include <cstring>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -85,4 +85,4 @@ bool hasHungUp(int socket) {
   return ::poll(&entry, 1, 0) == 1 && (entry.revents & (POLLHUP | POLLERR)) != 0;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -7,7 +7,7 @@
 
 #include "platform/core/UniqueFd.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // The system calls of a connected, non-blocking Unix stream socket, with what their results mean. None blocks or raises
 // SIGPIPE; all repeat themselves after EINTR.
@@ -43,4 +43,4 @@ Sent sendBytes(int socket, std::span<const std::uint8_t> bytes, int descriptor =
 // not.
 bool hasHungUp(int socket);
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -8,7 +8,7 @@
 #include <limits>
 #include <utility>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -253,4 +253,4 @@ void SocketOutbox::stopWaiting() {
   _writer.socket.reset();
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

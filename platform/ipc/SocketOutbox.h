@@ -15,7 +15,7 @@
 #include "platform/ipc/SocketIo.h"
 #include "platform/queue/WorkQueue.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // The outbox of a SocketConnection, which makes it, keeps the socket open until close(), and hears of its progress.
 //
@@ -118,4 +118,4 @@ class SocketOutbox final : public Outbox, public std::enable_shared_from_this<So
   Writer _writer;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

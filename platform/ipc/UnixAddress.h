@@ -6,7 +6,7 @@
 #include <optional>
 #include <string>
 
-namespace platform {
+namespace orvanta::platform {
 
 // The address of the socket file at `path`; none when the path is longer than such addresses can be.
 inline std::optional<sockaddr_un> unixAddress(const std::string& path) {
@@ -17,4 +17,4 @@ inline std::optional<sockaddr_un> unixAddress(const std::string& path) {
   return address;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -3,7 +3,7 @@
 #include <mutex>
 #include <unordered_map>
 
-namespace platform {
+namespace orvanta::platform {
 
 struct ConnectionQuota::Counts {
   std::mutex mutex;
@@ -29,4 +29,4 @@ std::shared_ptr<void> ConnectionQuota::take(uid_t user) {
   return {_counts.get(), [counts = _counts, user](void*) { counts->release(user); }};
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

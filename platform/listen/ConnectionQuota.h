@@ -5,7 +5,7 @@
 #include <cstddef>
 #include <memory>
 
-namespace platform {
+namespace orvanta::platform {
 
 // How many connections each user has. Thread-safe; places may outlive it.
 class ConnectionQuota {
@@ -20,4 +20,4 @@ class ConnectionQuota {
   const std::shared_ptr<Counts> _counts;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

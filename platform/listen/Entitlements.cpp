@@ -19,7 +19,7 @@
 #include "platform/core/NearestWord.h"
 #include "platform/queue/WorkQueue.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -169,4 +169,4 @@ void Entitlements::tell(const std::string& path, const std::string& problem) {
   if (!problem.empty()) PLATFORM_LOG(warning, "Entitlements: {}", problem);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -8,7 +8,7 @@
 #include "platform/core/Value.h"
 #include "platform/listen/PeerIdentity.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // Who may do what: property lists in a directory, each granting entitlement values to a "user", a "group" (name or
 // number) or a security "label". Read anew at each question, so that a grant needs no restart. Nothing is granted by
@@ -34,4 +34,4 @@ class Entitlements {
   std::map<std::string, std::string> _problems;  // guarded by _mutex: by file, what was logged last
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

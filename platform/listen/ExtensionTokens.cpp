@@ -7,7 +7,7 @@
 #include <new>
 #include <utility>
 
-namespace platform {
+namespace orvanta::platform {
 
 ExtensionHandle ExtensionHandle::consume(const std::optional<std::string>& token, int descriptor) {
   return ExtensionHandle(token ? descriptor : -1);
@@ -42,4 +42,4 @@ std::optional<std::string> ExtensionHandle::read(std::size_t size) const {
   return content;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

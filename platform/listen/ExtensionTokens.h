@@ -5,7 +5,7 @@
 #include <optional>
 #include <string>
 
-namespace platform {
+namespace orvanta::platform {
 
 // What a consumed extension token gives: reading one file that a client opened, and nothing else.
 //
@@ -36,4 +36,4 @@ class ExtensionHandle {
   int _descriptor = -1;  // borrowed
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

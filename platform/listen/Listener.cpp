@@ -5,7 +5,7 @@
 #include "platform/listen/ServiceListener.h"
 #include "platform/listen/ServiceSocket.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 Result<std::unique_ptr<Listener>> Listener::create(WorkPool& pool, const std::string& directory,
                                                    const std::string& service, Handler handler) {
@@ -18,4 +18,4 @@ std::unique_ptr<Listener> Listener::create(WorkPool& pool, ServiceSocket socket,
   return std::make_unique<ServiceListener>(pool, std::move(socket), std::move(handler), kMaximumConnectionsPerUser);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

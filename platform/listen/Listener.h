@@ -11,7 +11,7 @@
 #include "platform/listen/ServiceSocket.h"
 #include "platform/queue/WorkQueue.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // A peer that has connected, offered to the listener's delegate.
 struct OfferedConnection {
@@ -46,4 +46,4 @@ class Listener {
   static constexpr std::size_t kMaximumConnectionsPerUser = 4096;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

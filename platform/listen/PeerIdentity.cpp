@@ -5,7 +5,7 @@
 #include <cerrno>
 #include <cstring>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -47,4 +47,4 @@ Result<PeerIdentity> peerIdentityOf(int socket) {
   return peer;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -7,7 +7,7 @@
 
 #include "platform/core/Result.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // Who is at the other end of a Unix socket, as the kernel knew when it connected.
 struct PeerIdentity {
@@ -21,4 +21,4 @@ struct PeerIdentity {
 // From SO_PEERCRED, SO_PEERGROUPS and SO_PEERSEC. Fails only when the socket has no credentials.
 Result<PeerIdentity> peerIdentityOf(int socket);
 
-}  // namespace platform
+}  // namespace orvanta::platform

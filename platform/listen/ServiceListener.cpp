@@ -10,7 +10,7 @@
 #include "platform/core/Log.h"
 #include "platform/ipc/SocketConnection.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -147,4 +147,4 @@ void Acceptor::close() {
   _socket.socket.reset();
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

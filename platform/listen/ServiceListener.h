@@ -13,7 +13,7 @@
 #include "platform/listen/ServiceSocket.h"
 #include "platform/queue/WorkQueue.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // What a ServiceListener does, apart from it so that work under way can outlive it. Accepts on a queue of its own,
 // offers on whatever thread of the pool.
@@ -74,4 +74,4 @@ class ServiceListener final : public Listener {
   const std::shared_ptr<Acceptor> _acceptor;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -17,7 +17,7 @@
 #include "platform/ipc/UnixAddress.h"
 #include "platform/listen/PeerIdentity.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -139,4 +139,4 @@ void ServiceSocket::removeFile() {
   lock.reset();
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

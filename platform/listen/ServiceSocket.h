@@ -7,7 +7,7 @@
 #include "platform/core/Result.h"
 #include "platform/core/UniqueFd.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // A listening Unix stream socket, non-blocking, and what it left in the file system. Owned by the listener.
 struct ServiceSocket {
@@ -28,4 +28,4 @@ struct ServiceSocket {
 // file stays. A socket file that nobody listens behind is replaced.
 Result<ServiceSocket> openServiceSocket(const std::string& directory, const std::string& service);
 
-}  // namespace platform
+}  // namespace orvanta::platform

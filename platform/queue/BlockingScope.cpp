@@ -3,7 +3,7 @@
 #include "platform/queue/PoolThreads.h"
 #include "platform/queue/WorkQueue.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 thread_local BlockingScope::HookSetting tHook;
@@ -29,4 +29,4 @@ BlockingScope::HookSetting BlockingScope::setBeforeBlocking(HookSetting setting)
   return std::exchange(tHook, setting);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -3,7 +3,7 @@
 #include <utility>
 #include <vector>
 
-namespace platform {
+namespace orvanta::platform {
 
 void ComputeQueue::post(Job job) {
   _threads->post(*this, std::move(job));
@@ -90,4 +90,4 @@ void ComputeThreads::serveFirst(std::unique_lock<std::mutex>& lock) {
   if (queue->_inLine) _line.push_back(queue);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

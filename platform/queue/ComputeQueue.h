@@ -11,7 +11,7 @@
 #include "platform/queue/JobCount.h"
 #include "platform/queue/PoolThreads.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 using Job = UniqueFunction<void()>;
 
@@ -74,4 +74,4 @@ class ComputeThreads final : PoolThreads::Loop {
   PoolThreads _threads;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -6,7 +6,7 @@
 #include <cstddef>
 #include <mutex>
 
-namespace platform {
+namespace orvanta::platform {
 
 // Counts a pool's posted jobs until they have run, for WorkPool::drain(). Thread-safe.
 class JobCount {
@@ -33,4 +33,4 @@ class JobCount {
   std::condition_variable _none;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -9,7 +9,7 @@
 
 #include "platform/core/Log.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -146,4 +146,4 @@ void PoolThreads::blockingEnds() {
   --_blocked;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -7,7 +7,7 @@
 #include <mutex>
 #include <thread>
 
-namespace platform {
+namespace orvanta::platform {
 
 // The threads of a WorkPool: a fixed number, and extra ones that stand in for threads that block.
 //
@@ -75,4 +75,4 @@ class PoolThreads {
   bool _closed = false;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

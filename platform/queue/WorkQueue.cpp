@@ -16,7 +16,7 @@
 #include "platform/queue/JobCount.h"
 #include "platform/queue/PoolThreads.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 struct WorkPool::Implementation final : PoolThreads::Loop {
   Implementation(std::size_t threadCount, std::size_t extraThreads)
@@ -217,4 +217,4 @@ std::size_t WorkPool::threadCount() const {
   return _implementation->threads.count();
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

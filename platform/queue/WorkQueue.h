@@ -7,7 +7,7 @@
 #include "platform/core/UniqueFunction.h"
 #include "platform/queue/ComputeQueue.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 class WorkQueue;
 class Timer;
@@ -113,4 +113,4 @@ class BlockingScope {
   void* _pool = nullptr;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -9,7 +9,7 @@
 #include <string>
 #include <system_error>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -113,4 +113,4 @@ Result<bool> filterWatcherCalls() {
   return true;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -5,7 +5,7 @@
 #include "platform/core/Result.h"
 #include "platform/sandbox/SandboxCalls.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // The kernel's filters of system calls. Each holds for the calling thread and all that it starts later, cannot be taken
 // back, and needs no-new-privileges. What cannot be put in place says why.
@@ -22,4 +22,4 @@ Result<bool> refuseStartCalls(const SandboxCalls& calls);
 // ENOSYS.
 Result<bool> filterWatcherCalls();
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -13,7 +13,7 @@
 #include <system_error>
 #include <utility>
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -94,4 +94,4 @@ Result<bool> Landlock::restrictSelf() {
   return true;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -5,7 +5,7 @@
 #include "platform/core/Result.h"
 #include "platform/core/UniqueFd.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // The kernel's rights to files, by their bits in its interface. Named here because the installed kernel headers may be
 // older than the kernel.
@@ -59,4 +59,4 @@ class Landlock {
   UniqueFd _ruleset;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -23,7 +23,7 @@
 #include "platform/core/Log.h"
 #include "platform/sandbox/CallFilter.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 constexpr int kNamedCalls = 512;
@@ -143,4 +143,4 @@ RefusedCalls::~RefusedCalls() {
   _watcher.join();
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -9,7 +9,7 @@
 #include "platform/core/UniqueFd.h"
 #include "platform/sandbox/SandboxCalls.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // Answers the system calls that the sandbox does not allow, and logs each the first time. A thread of its own does so:
 // the kernel lets a refused call wait for it, whatever the calling thread holds or blocks, which no signal handler
@@ -32,4 +32,4 @@ class RefusedCalls {
   std::thread _watcher;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -17,7 +17,7 @@
 #include "platform/sandbox/Landlock.h"
 #include "platform/sandbox/SandboxProfile.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -135,4 +135,4 @@ Result<bool> Sandbox::started() {
   return refuseStartCalls(_calls);
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

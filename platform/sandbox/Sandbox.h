@@ -9,7 +9,7 @@
 #include "platform/sandbox/RefusedCalls.h"
 #include "platform/sandbox/SandboxCalls.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // The process's confinement by a named profile, the property list `directory`/`name`.plist whose format
 // docs/operation.md describes. Owned by main, on whose thread everything here is called. Its end takes nothing back.
@@ -37,4 +37,4 @@ class Sandbox {
   std::unique_ptr<RefusedCalls> _refused;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -20,7 +20,7 @@
 
 #include "platform/core/NearestWord.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -201,4 +201,4 @@ Result<SandboxCalls> SandboxCalls::fromPropertyList(const Value& section) {
   return calls;
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

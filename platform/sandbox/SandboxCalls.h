@@ -7,7 +7,7 @@
 #include "platform/core/Result.h"
 #include "platform/core/Value.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // What a sandbox profile says about system calls, by their numbers on this machine; calls that other machines have are
 // left out. Plain data, checked but not yet applied. The format is described in docs/operation.md.
@@ -29,4 +29,4 @@ struct SandboxCalls {
   static Result<SandboxCalls> fromPropertyList(const Value& section);
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -8,7 +8,7 @@
 #include "platform/core/NearestWord.h"
 #include "platform/sandbox/Landlock.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 namespace {
 
@@ -151,4 +151,4 @@ std::optional<std::string> fillPlaces(std::string_view path, const std::map<std:
   }
 }
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -12,7 +12,7 @@
 #include "platform/sandbox/Landlock.h"
 #include "platform/sandbox/SandboxCalls.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 // What a sandbox profile's property list says, checked but not yet applied to any file system. Its format is described
 // in docs/operation.md. Plain data.
@@ -34,4 +34,4 @@ struct SandboxProfile {
 // `path` with its ${NAME} places filled; none when a variable is absent or empty.
 std::optional<std::string> fillPlaces(std::string_view path, const std::map<std::string, std::string>& variables);
 
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -12,14 +12,11 @@
 #include <utility>
 
 #include "client/OrvantaClient.h"
+#include "interface/Values.h"
 #include "tests/support/ScriptedDaemon.h"
 
 namespace orvanta::test {
-
-using platform::Array;
-using platform::Dictionary;
 using platform::Frame;
-using platform::Value;
 
 constexpr std::chrono::seconds kPatience{30};
 
@@ -76,8 +73,8 @@ inline std::string textOf(const StringReply::Outcome& outcome) {
   return std::get<0>(*outcome.values).value_or("(null)");
 }
 
-inline SharedDictionary shared(platform::Dictionary dictionary) {
-  return std::make_shared<const platform::Dictionary>(std::move(dictionary));
+inline SharedDictionary shared(Dictionary dictionary) {
+  return std::make_shared<const Dictionary>(std::move(dictionary));
 }
 
 }  // namespace orvanta::test

@@ -13,7 +13,6 @@ namespace orvanta {
 namespace {
 
 using platform::UserDefaults;
-using platform::Value;
 
 constexpr const char* kUuidPattern = "[0-9A-F]{8}-[0-9A-F]{4}-4[0-9A-F]{3}-[89AB][0-9A-F]{3}-[0-9A-F]{12}";
 

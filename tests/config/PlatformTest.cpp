@@ -70,7 +70,7 @@ TEST(Platform, makesEachOnceValueOnceWhateverThreadAsks) {
 TEST(Process, nothingGetsTheNumberOfAClosedStandardDescriptor) {
   const auto numberAfterSecuring = [] {
     for (const int standard : {0, 1, 2}) ::close(standard);
-    secureStandardDescriptors();
+    platform::secureStandardDescriptors();
     char byte = 0;
     return ::read(0, &byte, 1) == 0 && ::write(1, "x", 1) == 1 ? ::open("/", O_RDONLY) : -1;
   };
@@ -81,7 +81,7 @@ using Ends = std::vector<std::string>;
 
 class TellingHttpClient final : public orvanta::test::ScriptedHttpClient {
  public:
-  TellingHttpClient(WorkPool& pool, Ends& ends) : _pool(pool), _ends(ends) {}
+  TellingHttpClient(platform::WorkPool& pool, Ends& ends) : _pool(pool), _ends(ends) {}
   ~TellingHttpClient() override { _ends.emplace_back("client destroyed"); }
   void shutdown(std::chrono::milliseconds) override {
     EXPECT_EQ(_pool.threadCount(), 1U) << "nobody would run the last completions";
@@ -89,7 +89,7 @@ class TellingHttpClient final : public orvanta::test::ScriptedHttpClient {
   }
 
  private:
-  WorkPool& _pool;
+  platform::WorkPool& _pool;
   Ends& _ends;
 };
 
@@ -98,7 +98,7 @@ TEST(Platform, endsItsPartsInOrder) {
   Ends ends;
   {
     Platform::Parts parts;
-    parts.pool = std::make_unique<WorkPool>(1);
+    parts.pool = std::make_unique<platform::WorkPool>(1);
     parts.pool->start();
     parts.http = std::make_unique<TellingHttpClient>(*parts.pool, ends);
     Platform platform(std::move(parts));

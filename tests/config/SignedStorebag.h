@@ -7,6 +7,7 @@
 #include <utility>
 #include <vector>
 
+#include "interface/Values.h"
 #include "platform/codec/PropertyList.h"
 #include "tests/support/TestPlatform.h"
 #include "tools/storebag/SigningKey.h"
@@ -21,14 +22,13 @@ using PlistForm = PropertyListForm;
 inline void installKey(TestPlatform& device, const Bytes& der) {
   device.directory.write("share/publicKey.der", {reinterpret_cast<const char*>(der.data()), der.size()});
 }
-inline Bytes plistBytes(const platform::Value& value, PlistForm form) {
+inline Bytes plistBytes(const Value& value, PlistForm form) {
   return writePropertyList(value, form).value();
 }
 // An outer document from decoded parts, which need not fit together.
 inline std::string outerDocument(std::span<const std::uint8_t> signature, std::span<const std::uint8_t> bag,
                                  PlistForm form = PlistForm::xml) {
-  const platform::Dictionary parts{{"signature", platform::encodeBase64(signature)},
-                                   {"bag", platform::encodeBase64(bag)}};
+  const Dictionary parts{{"signature", platform::encodeBase64(signature)}, {"bag", platform::encodeBase64(bag)}};
   const Bytes bytes = plistBytes(parts, form);
   return {bytes.begin(), bytes.end()};
 }
@@ -49,7 +49,7 @@ class StorebagSigner {
   std::string document(std::span<const std::uint8_t> bag, PlistForm form = PlistForm::xml) const {
     return outerDocument(sign(bag), bag, form);
   }
-  std::string document(const platform::Dictionary& bag) const { return document(plistBytes(bag, PlistForm::xml)); }
+  std::string document(const Dictionary& bag) const { return document(plistBytes(bag, PlistForm::xml)); }
 
  private:
   const std::shared_ptr<const SigningKey> _key;

@@ -10,10 +10,7 @@
 
 namespace orvanta::test {
 namespace {
-
-using platform::Dictionary;
 using platform::HttpHeader;
-using platform::Value;
 using testing::ElementsAre;
 
 // A device with the server's key installed, and a server that gives every request the same answer.
@@ -35,9 +32,7 @@ class StorebagFixture : public testing::Test {
 
 class StorebagFetchTest : public StorebagFixture {
  protected:
-  platform::SharedDictionary get(const std::string& name = "quillon") {
-    return fetchStorebagWithName(platform, name, fetch);
-  }
+  SharedDictionary get(const std::string& name = "quillon") { return fetchStorebagWithName(platform, name, fetch); }
   const Dictionary bag{{"version", "7.1"}, {"release", Dictionary{{"dashboard", Dictionary{{"port", 5000}}}}}};
 };
 
@@ -286,7 +281,7 @@ TEST_F(StorebagSelectionTest, refusesTypesWithoutAStorebagBeforeAnyRequest) {
 
 class StorebagVerificationTest : public StorebagFixture {
  protected:
-  platform::SharedDictionary open(std::string body) {
+  SharedDictionary open(std::string body) {
     serve(std::move(body));
     log.clear();
     return fetchStorebagWithName(platform, "quillon", fetch);
@@ -324,7 +319,7 @@ TEST_F(StorebagVerificationTest, refusesDocumentsWithoutWhatItNeeds) {
   const std::pair<Value, bool> rows[] = {
       // whether an error line says that the signature is missing
       {Dictionary{{"bag", bagText}}, true},
-      {platform::Array{Value(signatureText), Value(bagText)}, true},
+      {Array{Value(signatureText), Value(bagText)}, true},
       {"signature", true},
       {Dictionary{{"signature", signatureText}}, false},
       {Dictionary{{"signature", "A"}, {"bag", bagText}}, false},
@@ -333,7 +328,7 @@ TEST_F(StorebagVerificationTest, refusesDocumentsWithoutWhatItNeeds) {
       {Dictionary{{"signature", signatureText}, {"bag", 12}}, false},
       {signedBag({'n', 'o'}), false},
       {signedBag({}), false},
-      {signedBag(plistBytes(platform::Array{Value(1)}, PlistForm::xml)), false},
+      {signedBag(plistBytes(Array{Value(1)}, PlistForm::xml)), false},
   };
   for (const auto& [document, missing] : rows) {
     const Bytes body = plistBytes(document, PlistForm::xml);

@@ -18,9 +18,6 @@
 namespace orvanta::test {
 namespace {
 
-using platform::Array;
-using platform::Dictionary;
-
 // Formats every line, as a daemon at its most talkative does, and keeps what must never be said.
 struct Talkative final : platform::LogSink {
   Talkative() {
@@ -91,7 +88,7 @@ class WholeDaemon {
 
  private:
   // Other thresholds, and backends that a parent may lack.
-  static platform::SharedDictionary storebag(std::size_t variant) {
+  static SharedDictionary storebag(std::size_t variant) {
     const double thresholds[] = {1.0, 0.75, 0.5, 0.25};
     const Dictionary client{{"post_url", "http://127.0.0.1/post"},
                             {"realtime_post_url", "http://127.0.0.1/realtime"},
@@ -102,7 +99,7 @@ class WholeDaemon {
     return std::make_shared<const Dictionary>(std::move(section));
   }
 
-  std::array<platform::SharedDictionary, GroupOperations::kVariants> _storebags;
+  std::array<SharedDictionary, GroupOperations::kVariants> _storebags;
   std::atomic<std::uint32_t> _current{0};
   std::atomic<std::uint64_t> _fetches{0}, _posts{0};
   std::unique_ptr<platform::Listener> _listener;

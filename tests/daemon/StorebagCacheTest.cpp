@@ -8,8 +8,6 @@
 namespace orvanta::test {
 namespace {
 
-using platform::Dictionary;
-
 class StorebagCacheTest : public ::testing::Test {
  protected:
   std::string ask(std::int32_t clientType = 5) {
@@ -24,7 +22,7 @@ class StorebagCacheTest : public ::testing::Test {
   // What the server gives: a bag called "first", no news, or nothing.
   enum { good, notModified, failure } answer = good;
   int maxAge = 100;
-  StorebagCache cache{clock, [this](std::int32_t, StorebagFetch& fetch) -> platform::SharedDictionary {
+  StorebagCache cache{clock, [this](std::int32_t, StorebagFetch& fetch) -> SharedDictionary {
                         ++fetches;
                         sentStamp = fetch.lastModified;
                         fetch.maxAge = maxAge;

@@ -3,7 +3,7 @@
 
 // What can be read and written is the same when it is read and written again.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
-  using namespace platform;
+  using namespace orvanta::platform;
   const PropertyListLimits limits{64, 10'000, 1U << 20U};
   const Result<Value> parsed = parseBinaryPropertyList({bytes, size}, limits);
   if (!parsed) {

@@ -27,7 +27,7 @@ void takeApart(Bytes datagram) {
   REQUIRE(length <= 2 * packet->text.size());  // without a space before it a key is the end of a value, too
 
   // What was read, written again, is a datagram of the same meaning.
-  platform::Dictionary payload;
+  Dictionary payload;
   for (const auto& [key, value] : pairs) {
     if (platform::isValidUtf8(key) && platform::isValidUtf8(value)) payload.set(key, value);
   }

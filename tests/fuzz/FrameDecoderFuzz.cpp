@@ -7,7 +7,7 @@
 
 namespace {
 
-using namespace platform;
+using namespace orvanta::platform;
 
 constexpr FrameLimits kLimits{4096, 64U << 10U, 16};
 

@@ -3,7 +3,7 @@
 
 // What can be read is the same when it is written and read again, and takes no more bytes.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
-  using namespace platform;
+  using namespace orvanta::platform;
   const Result<Value> parsed = decodeMessagePack({bytes, size}, {64, 1U << 20U});
   if (!parsed) {
     REQUIRE(!parsed.error().empty());

@@ -32,10 +32,10 @@ struct World {
   std::string document;
 };
 
-void evaluate(Platform& platform, const platform::Value& profile) {
+void evaluate(Platform& platform, const Value& profile) {
   if (profile.dictionary() == nullptr) return;
-  const auto backend = HTTPSPostBackend::create(
-      platform, "http_post", std::make_shared<const platform::Dictionary>(*profile.dictionary()), "Parva");
+  const auto backend = HTTPSPostBackend::create(platform, "http_post",
+                                                std::make_shared<const Dictionary>(*profile.dictionary()), "Parva");
   if (!backend) return;
   BackendIdentity identity;
   identity.compType = 5;
@@ -44,8 +44,7 @@ void evaluate(Platform& platform, const platform::Value& profile) {
   backend->setIdentity(std::move(identity));
   backend->updateState();
   REQUIRE(backend->state() == kBackendWaiting);
-  backend->setUserInfoDict(
-      std::make_shared<const platform::Dictionary>(platform::Dictionary{{"clientName", "c"}, {"serviceName", "s"}}));
+  backend->setUserInfoDict(std::make_shared<const Dictionary>(Dictionary{{"clientName", "c"}, {"serviceName", "s"}}));
   backend->updateState();
   REQUIRE(backend->state() >= kBackendWaiting && backend->state() <= kBackendSampledOut);
   REQUIRE(backend->state() == kBackendWaiting || backend->reason());

@@ -3,7 +3,7 @@
 
 // What can be read is the same when it is written and read again.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
-  using namespace platform;
+  using namespace orvanta::platform;
   const Result<Value> parsed = parseXmlPropertyList({bytes, size}, {64, 10'000, 1U << 20U});
   if (!parsed) {
     REQUIRE(!parsed.error().empty());

@@ -20,9 +20,6 @@ namespace orvanta::test {
 
 using collector::Collector;
 using collector::RequestKind;
-using platform::Array;
-using platform::Dictionary;
-using platform::Value;
 
 // The real daemon, in its sandbox, and the collector as everything that it talks to. A test sets `options` and the
 // section, then calls startDaemon().

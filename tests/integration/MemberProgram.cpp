@@ -18,7 +18,7 @@ void say(const std::string& line) {
   std::fwrite(whole.data(), 1, whole.size(), stderr);
 }
 
-std::string entry(const platform::SharedDictionary& dictionary, std::string_view key) {
+std::string entry(const orvanta::SharedDictionary& dictionary, std::string_view key) {
   const auto* value = dictionary ? dictionary->find(key) : nullptr;
   return value == nullptr ? "none" : value->description();
 }
@@ -55,7 +55,7 @@ int main(int argumentCount, char** arguments) {
   say("joined");
   for (std::string number; std::getline(std::cin, number);) {
     MessageParameters event{.category = 20, .type = static_cast<std::uint16_t>(id)};
-    event.payload = platform::Dictionary{{"marker", std::atoi(number.c_str())}};
+    event.payload = Dictionary{{"marker", std::atoi(number.c_str())}};
     if (const auto sent = session.blocking().sendMessage(event); !sent) {
       say(sent.error().text);
       return 1;

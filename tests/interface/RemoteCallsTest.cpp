@@ -8,11 +8,7 @@
 
 namespace orvanta::test {
 namespace {
-
-using platform::Array;
-using platform::Dictionary;
 using platform::Frame;
-using platform::Value;
 
 class RemoteCallsTest : public ::testing::Test {
  protected:

@@ -14,7 +14,6 @@
 namespace orvanta::test {
 
 namespace fs = std::filesystem;
-using platform::Dictionary;
 
 DaemonProcess::DaemonProcess(Options options) : _wrapper(options.wrapper) {
   const auto plist = [this](const std::string& name, const Dictionary& content) {

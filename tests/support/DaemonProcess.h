@@ -8,7 +8,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 #include "tests/support/ChildProcess.h"
 #include "tests/support/TemporaryDirectory.h"
 
@@ -22,8 +22,8 @@ class DaemonProcess {
     std::string storebagURL;              // the user default; empty: none
     std::vector<std::uint8_t> publicKey;  // DER; empty: no key file
     std::string caFile;                   // ORVANTA_CA_FILE
-    platform::Dictionary device;          // device.plist
-    platform::Dictionary defaults;        // further user defaults
+    Dictionary device;                    // device.plist
+    Dictionary defaults;                  // further user defaults
     bool entitled = true;
     bool sandbox = true;
     std::string version = "8.0.0";

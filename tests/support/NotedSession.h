@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "interface/RemoteCalls.h"
+#include "interface/Values.h"
 
 namespace orvanta::test {
 
@@ -18,8 +19,8 @@ class NotedSession final : public ClientSessionInterface {
 
   void setSessionInfo(SharedDictionary info, SharedDictionary user, SharedArray frameworks, bool aggregates,
                       DoneReply done) override {
-    note("setSessionInfo " + platform::Value(*info).description() + (user ? " user" : "") +
-             (frameworks ? " frameworks" : "") + (aggregates ? " aggregates" : ""),
+    note("setSessionInfo " + Value(*info).description() + (user ? " user" : "") + (frameworks ? " frameworks" : "") +
+             (aggregates ? " aggregates" : ""),
          std::move(done));
   }
   void startConfigWithCompletionHandler(BackendNamesReply reply) override {
@@ -35,7 +36,7 @@ class NotedSession final : public ClientSessionInterface {
          std::move(reply), "text");
   }
   void sendMessageWithDictionary(SharedDictionary parameters, StringReply reply) override {
-    note("dictionary " + platform::Value(*parameters).description(), std::move(reply), "text");
+    note("dictionary " + Value(*parameters).description(), std::move(reply), "text");
   }
   void flushMessagesWithCompletion(FlushReply reply) override {
     note("flush", std::move(reply), "text", makeOrvantaError("went wrong", 503));
@@ -49,7 +50,7 @@ class NotedSession final : public ClientSessionInterface {
   }
   void sendMessageWithSessionInfo(SharedDictionary info, SharedDictionary user, std::uint16_t category, std::uint16_t,
                                   SharedDictionary, StringReply reply) override {
-    note("one-off " + platform::Value(*info).description() + " " + std::to_string(category) + (user ? " user" : ""),
+    note("one-off " + Value(*info).description() + " " + std::to_string(category) + (user ? " user" : ""),
          std::move(reply), "text");
   }
 

@@ -14,6 +14,7 @@
 #include <utility>
 #include <vector>
 
+#include "interface/Values.h"
 #include "platform/codec/MessagePack.h"
 #include "platform/core/UniqueFd.h"
 #include "platform/ipc/Connection.h"
@@ -29,23 +30,23 @@ inline void append(Bytes& bytes, const Bytes& more) {
 }
 
 // Whole messages.
-inline Bytes withValues(Bytes message, const platform::Array& values) {
+inline Bytes withValues(Bytes message, const Array& values) {
   platform::MessagePackWriter writer(message);
   for (const auto& value : values) writer.value(value);
   return message;
 }
-inline Bytes notification(std::string_view method, const platform::Array& params = {}) {
+inline Bytes notification(std::string_view method, const Array& params = {}) {
   Bytes header;
   platform::appendNotificationHeader(header, method, params.size());
   return withValues(std::move(header), params);
 }
-inline Bytes request(std::uint32_t id, std::string_view method, const platform::Array& params = {}) {
+inline Bytes request(std::uint32_t id, std::string_view method, const Array& params = {}) {
   Bytes header;
   platform::appendRequestHeader(header, id, method, params.size());
   return withValues(std::move(header), params);
 }
 // Error and result are these values, whatever sense they make.
-inline Bytes response(std::uint32_t id, const platform::Value& result, const platform::Value& error = nullptr) {
+inline Bytes response(std::uint32_t id, const Value& result, const Value& error = nullptr) {
   Bytes header;
   platform::appendResponseHeader(header, id);
   return withValues(std::move(header), {error, result});

@@ -20,6 +20,7 @@
 #include <vector>
 
 #include "client/OrvantaClient.h"
+#include "interface/Values.h"
 
 namespace orvanta::test {
 
@@ -238,7 +239,7 @@ class RandomGroups {
   void send(Member& member, const GroupOperation& operation) {
     for (std::uint32_t i = 0; i < operation.count; ++i) {
       MessageParameters event{.category = kCategory, .type = static_cast<std::uint16_t>(operation.group)};
-      event.payload = platform::Dictionary{{"number", _eventsSent++}, {"marker", "own"}};
+      event.payload = Dictionary{{"number", _eventsSent++}, {"marker", "own"}};
       event.flag = operation.flag;
       member.connection->session().sendMessageWithDictionary(event.dictionary(), owed<StringReply>(member));
     }

@@ -8,6 +8,7 @@
 #include <utility>
 
 #include "interface/OrvantaConstants.h"
+#include "interface/Values.h"
 #include "platform/ipc/UnixAddress.h"
 #include "tests/support/Peer.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -32,10 +33,10 @@ class ScriptedPeer : public Peer {
     if (frame.method == method) return frame;
     throw std::runtime_error("expected " + std::string(method) + ", the client called " + frame.method);
   }
-  void answer(const Frame& request, const platform::Array& results) { respond(request.messageID, nullptr, results); }
+  void answer(const Frame& request, const Array& results) { respond(request.messageID, nullptr, results); }
   void refuse(const Frame& request, std::string_view text) { respond(request.messageID, text, nullptr); }
-  void notify(std::string_view method, const platform::Array& params) { write(notification(method, params)); }
-  void respond(std::uint32_t messageID, const platform::Value& error, const platform::Value& result) {
+  void notify(std::string_view method, const Array& params) { write(notification(method, params)); }
+  void respond(std::uint32_t messageID, const Value& error, const Value& result) {
     write(response(messageID, result, error));
   }
 };

@@ -16,10 +16,6 @@
 
 namespace orvanta::test {
 
-using platform::Array;
-using platform::Dictionary;
-using platform::Value;
-
 inline SharedDictionary shared(Dictionary dictionary) {
   return std::make_shared<const Dictionary>(std::move(dictionary));
 }

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "config/Platform.h"
+#include "interface/Values.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/TestClock.h"
 
@@ -122,9 +123,9 @@ struct RecordedPowerLog final : platform::PowerLog {
   struct Record {
     std::int32_t event;
     std::string sender;
-    platform::Dictionary record;
+    Dictionary record;
   };
-  void registeredEvent(std::int32_t event, std::string_view sender, const platform::Dictionary& record) override {
+  void registeredEvent(std::int32_t event, std::string_view sender, const Dictionary& record) override {
     const std::lock_guard lock(mutex);
     records.push_back({event, std::string(sender), record});
   }

@@ -10,16 +10,13 @@
 #include <string>
 #include <utility>
 
+#include "interface/Values.h"
 #include "platform/codec/Json.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tools/collector/Collector.h"
 #include "tools/collector/wire/Transport.h"
 
 namespace orvanta::collector {
-
-using platform::Array;
-using platform::Dictionary;
-using platform::Value;
 
 // A collector in a directory of its own, and HTTP clients for it.
 class CollectorFixture : public testing::Test {
@@ -57,20 +54,20 @@ class CollectorFixture : public testing::Test {
     while (const std::size_t count = stream->read(piece.data(), piece.size())) answer.append(piece.data(), count);
     return errno == ECONNRESET ? answer + "[reset]" : answer;
   }
-  platform::Value list(const std::string& path) const {
+  Value list(const std::string& path) const {
     const auto answer = http().Get(path);
     EXPECT_TRUE(answer && answer->status == 200) << path << (answer ? ": " + answer->body : "");
     auto parsed = platform::parseJson(answer ? answer->body : "null");
     EXPECT_TRUE(parsed) << parsed.error();
-    return parsed ? std::move(parsed.value()) : platform::Value();
+    return parsed ? std::move(parsed.value()) : Value();
   }
   // The entry of a dictionary, which must be there.
-  static const platform::Value& at(const platform::Value& value, const std::string& key) {
-    const platform::Value* found = value.dictionary() != nullptr ? value.dictionary()->find(key) : nullptr;
+  static const Value& at(const Value& value, const std::string& key) {
+    const Value* found = value.dictionary() != nullptr ? value.dictionary()->find(key) : nullptr;
     if (found == nullptr) throw std::out_of_range("no \"" + key + "\" in " + value.description());
     return *found;
   }
-  static const platform::Value& at(const platform::Value& value, std::size_t index) { return value.array()->at(index); }
+  static const Value& at(const Value& value, std::size_t index) { return value.array()->at(index); }
 
   test::TemporaryDirectory directory;
   std::unique_ptr<Collector> collector;

@@ -8,10 +8,6 @@
 namespace orvanta::collector {
 namespace {
 
-using platform::Array;
-using platform::Dictionary;
-using platform::Value;
-
 class InboxTest : public testing::Test {
  protected:
   std::unique_ptr<Inbox> open(const InboxLimits& limits = {}) const {

@@ -24,12 +24,8 @@
 #include "tools/orvantactl/LineReader.h"
 
 namespace orvanta::ctl {
-
-using platform::Array;
 using platform::Data;
 using platform::Date;
-using platform::Dictionary;
-using platform::Value;
 
 namespace {
 

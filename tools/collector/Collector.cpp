@@ -13,11 +13,6 @@
 
 namespace orvanta::collector {
 
-using platform::Dictionary;
-using platform::Failure;
-using platform::Result;
-using platform::Value;
-
 namespace {
 
 // The parts in the order in which they need each other; destruction goes backwards.

@@ -6,8 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/core/Result.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 #include "tools/collector/CollectorOptions.h"
 #include "tools/collector/servers/AcknowledgementSettings.h"
 #include "tools/collector/servers/Behaviours.h"
@@ -21,7 +20,7 @@ namespace orvanta::collector {
 class Collector {
  public:
   // Listens when it returns. A failure says what could not be made or bound.
-  static platform::Result<std::unique_ptr<Collector>> start(CollectorOptions options);
+  static Result<std::unique_ptr<Collector>> start(CollectorOptions options);
   virtual ~Collector() = default;
   // Ends all connections and answers nothing any more; what was received can still be read.
   virtual void stop() = 0;
@@ -54,10 +53,10 @@ class Collector {
   virtual void setStorebagSettings(const StorebagSettings& settings) = 0;
   // Serves this inner bag from now on: for one storebag name, or for all without one of their own. Texts may hold the
   // placeholders "${http}", "${https}" and "${dashboard_port}".
-  virtual void setBag(const std::string& name, platform::Value inner) = 0;
-  void setBag(platform::Value inner) { setBag("", std::move(inner)); }
+  virtual void setBag(const std::string& name, Value inner) = 0;
+  void setBag(Value inner) { setBag("", std::move(inner)); }
   // A bag whose section of every environment is this one.
-  void setSection(platform::Dictionary section);
+  void setSection(Dictionary section);
   // The signed document as it would be served.
   virtual std::string storebagDocument(const std::string& name) = 0;
 

@@ -39,20 +39,20 @@ void printRequest(const collector::ReceivedRequest& request) {
 
 // Whether standard output took it.
 bool printReady(const collector::Collector& running) {
-  const platform::Dictionary ready{{"pid", static_cast<std::int64_t>(::getpid())},
-                                   {"directory", running.directory()},
-                                   {"http", running.httpURL()},
-                                   {"https", running.httpsURL()},
-                                   {"httpPort", int{running.httpPort()}},
-                                   {"httpsPort", int{running.httpsPort()}},
-                                   {"dashboardPort", int{running.dashboardPort()}},
-                                   {"storebagURL", running.storebagURL()},
-                                   {"eventsURL", running.eventsURL()},
-                                   {"uploadURL", running.httpsURL("/upload")},
-                                   {"logDataURL", running.httpsURL("/logdata")},
-                                   {"caFile", running.caFile()},
-                                   {"publicKeyFile", running.publicKeyFile()},
-                                   {"databaseFile", running.databaseFile()}};
+  const Dictionary ready{{"pid", static_cast<std::int64_t>(::getpid())},
+                         {"directory", running.directory()},
+                         {"http", running.httpURL()},
+                         {"https", running.httpsURL()},
+                         {"httpPort", int{running.httpPort()}},
+                         {"httpsPort", int{running.httpsPort()}},
+                         {"dashboardPort", int{running.dashboardPort()}},
+                         {"storebagURL", running.storebagURL()},
+                         {"eventsURL", running.eventsURL()},
+                         {"uploadURL", running.httpsURL("/upload")},
+                         {"logDataURL", running.httpsURL("/logdata")},
+                         {"caFile", running.caFile()},
+                         {"publicKeyFile", running.publicKeyFile()},
+                         {"databaseFile", running.databaseFile()}};
   return std::fputs((platform::writeJson(ready) + "\n").c_str(), stdout) >= 0 && std::fflush(stdout) == 0;
 }
 

@@ -67,17 +67,16 @@ SessionInfo ClientOptions::sessionInfo() const {
   return info;
 }
 
-platform::Result<std::optional<UserInfo>> ClientOptions::userInfo() const {
+Result<std::optional<UserInfo>> ClientOptions::userInfo() const {
   if (clientName.empty() && serviceName.empty() && userInfoJson.empty()) return std::optional<UserInfo>();
   UserInfo info;
   if (!clientName.empty()) info.clientName = clientName;
   if (!serviceName.empty()) info.serviceName = serviceName;
   if (!userInfoJson.empty()) {
     auto parsed = parseTaggedJson(userInfoJson);
-    if (!parsed) return platform::Failure{"--user-info is no JSON: " + parsed.error()};
+    if (!parsed) return Failure{"--user-info is no JSON: " + parsed.error()};
     auto* others = parsed->dictionary();
-    if (others == nullptr)
-      return platform::Failure{"--user-info must be a JSON object such as '{\"region\": \"north\"}'"};
+    if (others == nullptr) return Failure{"--user-info must be a JSON object such as '{\"region\": \"north\"}'"};
     info.others = std::move(*others);
   }
   return std::optional<UserInfo>(std::move(info));

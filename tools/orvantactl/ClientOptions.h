@@ -8,7 +8,7 @@
 
 #include "client/OrvantaConnection.h"
 #include "client/Records.h"
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 
 namespace orvanta::ctl {
 
@@ -33,7 +33,7 @@ struct ClientOptions {
 
   SessionInfo sessionInfo() const;
   // None when no option gives any. Fails when --user-info is no JSON object.
-  platform::Result<std::optional<UserInfo>> userInfo() const;
+  Result<std::optional<UserInfo>> userInfo() const;
 };
 
 // Connects, or says on standard error why not and sets `status`.

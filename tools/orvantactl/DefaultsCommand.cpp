@@ -87,7 +87,7 @@ int read(const DefaultsOptions& options) {
   return kAllTaken;
 }
 
-int store(const DefaultsOptions& options, platform::Value value) {
+int store(const DefaultsOptions& options, Value value) {
   auto defaults = options.open();
   const auto stored = defaults.set(options.key, std::move(value));
   if (stored) return kAllTaken;

@@ -11,10 +11,6 @@
 
 namespace orvanta::ctl {
 
-using platform::Failure;
-using platform::Result;
-using platform::Value;
-
 namespace {
 
 template <class Number>

@@ -7,10 +7,6 @@
 
 namespace orvanta::ctl {
 
-using platform::Dictionary;
-using platform::SharedDictionary;
-using platform::Value;
-
 std::string aggregatedEventLine(const AggregatedEvent& event) {
   const auto json = [](const SharedDictionary& dictionary) {
     return dictionary ? writeTaggedJson(Value(*dictionary)) : "null";

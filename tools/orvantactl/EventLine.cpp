@@ -14,11 +14,6 @@
 
 namespace orvanta::ctl {
 
-using platform::Dictionary;
-using platform::Failure;
-using platform::Result;
-using platform::Value;
-
 namespace {
 
 constexpr std::string_view kRealtime = "realtime";

@@ -3,7 +3,7 @@
 #include <string_view>
 
 #include "client/Records.h"
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 
 namespace orvanta::ctl {
 
@@ -15,6 +15,6 @@ struct EventDefaults {
 
 // One event from a line of JSON: {"category": 1, "type": 2, "payload": {…}, "flag": 1, "realtime": true, "promote":
 // true}, of which category and type must be there. A failure says what is wrong with which key; an unknown key is one.
-platform::Result<MessageParameters> parseEventLine(std::string_view line, const EventDefaults& defaults);
+Result<MessageParameters> parseEventLine(std::string_view line, const EventDefaults& defaults);
 
 }  // namespace orvanta::ctl

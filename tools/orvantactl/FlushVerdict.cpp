@@ -4,13 +4,10 @@
 
 #include <utility>
 
+#include "interface/Values.h"
 #include "platform/codec/Json.h"
-#include "platform/core/Value.h"
 
 namespace orvanta::ctl {
-
-using platform::Dictionary;
-using platform::Value;
 
 std::string flushLine(const FlushAnswer& answer) {
   Dictionary flush{{"result", answer.text ? Value(*answer.text) : Value()}, {"error", Value()}};

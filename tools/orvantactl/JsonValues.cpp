@@ -7,14 +7,8 @@
 #include "platform/codec/PropertyList.h"
 
 namespace orvanta::ctl {
-
-using platform::Array;
 using platform::Data;
 using platform::Date;
-using platform::Dictionary;
-using platform::Failure;
-using platform::Result;
-using platform::Value;
 
 namespace {
 

@@ -3,8 +3,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/core/Result.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 
 namespace orvanta::ctl {
 
@@ -12,8 +11,8 @@ namespace orvanta::ctl {
 // {"$data": "AAEC"} is data (base64); both stand alone in their object.
 
 // Parses one JSON document with those two forms.
-platform::Result<platform::Value> parseTaggedJson(std::string_view text);
+Result<Value> parseTaggedJson(std::string_view text);
 // One line of JSON with those two forms.
-std::string writeTaggedJson(const platform::Value& value, bool pretty = false);
+std::string writeTaggedJson(const Value& value, bool pretty = false);
 
 }  // namespace orvanta::ctl

@@ -25,7 +25,7 @@ int send(const SendOptions& options) {
     complain(userInfo.error());
     return kUsage;
   }
-  platform::SharedDictionary payload;
+  SharedDictionary payload;
   if (!options.payloadJson.empty()) {
     auto parsed = parseTaggedJson(options.payloadJson);
     auto* object = parsed ? parsed->dictionary() : nullptr;
@@ -34,7 +34,7 @@ int send(const SendOptions& options) {
                (parsed ? std::string() : ": " + parsed.error()));
       return kUsage;
     }
-    payload = std::make_shared<const platform::Dictionary>(std::move(*object));
+    payload = std::make_shared<const Dictionary>(std::move(*object));
   }
   int status = kAllTaken;
   const auto connection = connectOrComplain(options, status);
@@ -43,7 +43,7 @@ int send(const SendOptions& options) {
                                                                   *userInfo ? (*userInfo)->dictionary() : nullptr,
                                                                   options.category, options.type, payload);
   if (!reply) return complain(reply.error());
-  printLine(platform::writeJson(platform::Dictionary{{"reply", *reply ? platform::Value(**reply) : nullptr}}));
+  printLine(platform::writeJson(Dictionary{{"reply", *reply ? Value(**reply) : nullptr}}));
   if (*reply == "finished") return kAllTaken;
   complain(
       "the event was not taken; \"storebag not available\" means that the daemon has no storebag for client type " +

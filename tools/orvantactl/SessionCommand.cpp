@@ -103,9 +103,9 @@ class SessionRun {
       _status = kSomethingNotTaken;
     }
     if (_options.quiet) return true;
-    platform::Array names;
+    Array names;
     if (*backends) names.assign((*backends)->begin(), (*backends)->end());
-    printLine("{\"backends\":" + platform::writeJson(*backends ? platform::Value(std::move(names)) : nullptr) + "}");
+    printLine("{\"backends\":" + platform::writeJson(*backends ? Value(std::move(names)) : nullptr) + "}");
     return true;
   }
 

@@ -16,8 +16,8 @@ int showStates(const ClientOptions& options) {
   int status = kAllTaken;
   const auto session = configureOrComplain(options, status);
   if (!session.connection) return status;
-  platform::Array names(session.backends->begin(), session.backends->end());
-  printLine(platform::writeJson(platform::Dictionary{{"backends", std::move(names)}}));
+  Array names(session.backends->begin(), session.backends->end());
+  printLine(platform::writeJson(Dictionary{{"backends", std::move(names)}}));
   return kAllTaken;
 }
 

@@ -56,7 +56,7 @@ int upload(const UploadOptions& options) {
       if (!session.connection->isOpen()) break;
       continue;
     }
-    printLine(platform::writeJson(platform::Dictionary{{"file", file}, {"uploaded", *uploaded}}));
+    printLine(platform::writeJson(Dictionary{{"file", file}, {"uploaded", *uploaded}}));
     if (!*uploaded) {
       complain(fmt::format("{} was not taken: {}", file, reasonNotTaken(file)));
       status = kSomethingNotTaken;
@@ -86,9 +86,9 @@ int uploadLog(const UploadOptions& options) {
   const auto session = configureOrComplain(options, status);
   if (!session.connection) return status;
   const auto answer = session.connection->session().blocking().uploadLogData(
-      std::make_shared<const platform::Array>(std::move(*parsed->array())));
+      std::make_shared<const Array>(std::move(*parsed->array())));
   if (!answer) return complain(answer.error());
-  platform::Dictionary line{{"uploaded", answer->uploaded}};
+  Dictionary line{{"uploaded", answer->uploaded}};
   if (answer->error) line.set("error", answer->error->description);
   printLine(platform::writeJson(line));
   if (answer->uploaded) return kAllTaken;

@@ -24,7 +24,7 @@ constexpr const char* kFooter =
 }  // namespace
 
 int main(int argc, char** argv) {
-  platform::secureStandardDescriptors();
+  orvanta::platform::secureStandardDescriptors();
   CLI::App app(kDescription, "orvantactl");
   app.footer(kFooter);
   app.require_subcommand(1);

@@ -21,9 +21,6 @@
 
 namespace orvanta {
 
-using platform::Failure;
-using platform::Result;
-
 namespace {
 
 constexpr std::size_t kMaximumPemBytes = 1U << 20U;

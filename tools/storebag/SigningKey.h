@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 
 namespace orvanta {
 
@@ -17,18 +17,18 @@ enum class PublicKeyLayout { subjectPublicKeyInfo, pkcs1 };
 // The RSA private key that storebags are signed with. Immutable; sign() may be called from several threads.
 class SigningKey {
  public:
-  static platform::Result<std::shared_ptr<const SigningKey>> generate(unsigned bits = 2048);
+  static Result<std::shared_ptr<const SigningKey>> generate(unsigned bits = 2048);
   // A PEM file. The failure names the file.
-  static platform::Result<std::shared_ptr<const SigningKey>> read(const std::string& path);
+  static Result<std::shared_ptr<const SigningKey>> read(const std::string& path);
   // Reads the file, or makes a key and writes it there (mode 0600) when there is none.
-  static platform::Result<std::shared_ptr<const SigningKey>> readOrMake(const std::string& path);
+  static Result<std::shared_ptr<const SigningKey>> readOrMake(const std::string& path);
 
   virtual ~SigningKey() = default;
   // None, or why the file cannot be written.
-  virtual std::optional<platform::Failure> write(const std::string& path) const = 0;
+  virtual std::optional<Failure> write(const std::string& path) const = 0;
   virtual std::vector<std::uint8_t> publicKeyDer(PublicKeyLayout layout) const = 0;
   // RSASSA-PKCS1-v1_5 over the SHA-1 of the bytes. Works where the system's policy forbids SHA-1 signatures too.
-  virtual platform::Result<std::vector<std::uint8_t>> sign(std::span<const std::uint8_t> bytes) const = 0;
+  virtual Result<std::vector<std::uint8_t>> sign(std::span<const std::uint8_t> bytes) const = 0;
 };
 
 }  // namespace orvanta

@@ -13,15 +13,11 @@
 
 namespace orvanta {
 
-using platform::Failure;
-using platform::Result;
-using platform::Value;
-
 namespace {
 
 constexpr std::size_t kMaximumFileBytes = 64U << 20U;
 
-Result<std::vector<std::uint8_t>> decodedField(const platform::Dictionary& document, std::string_view key) {
+Result<std::vector<std::uint8_t>> decodedField(const Dictionary& document, std::string_view key) {
   const Value* field = document.find(key);
   if (field == nullptr) return Failure{fmt::format("the document has no \"{}\"", key)};
   if (field->string() == nullptr) return Failure{fmt::format("the document's \"{}\" is no text", key)};
@@ -56,15 +52,15 @@ Result<std::vector<std::uint8_t>> makeStorebag(const Value& inner, const Signing
   if (!bagBytes) return bagBytes;
   auto signature = key.sign(bagBytes.value());
   if (!signature) return signature;
-  return writePropertyList(platform::Dictionary{{"signature", platform::encodeBase64(signature.value())},
-                                                {"bag", platform::encodeBase64(bagBytes.value())}},
+  return writePropertyList(Dictionary{{"signature", platform::encodeBase64(signature.value())},
+                                      {"bag", platform::encodeBase64(bagBytes.value())}},
                            container);
 }
 
 Result<StorebagContent> openStorebag(std::span<const std::uint8_t> document) {
   const auto parsed = platform::parsePropertyList(document);
   if (!parsed) return Failure{"the document is no property list: " + parsed.error()};
-  const platform::Dictionary* fields = parsed.value().dictionary();
+  const Dictionary* fields = parsed.value().dictionary();
   if (fields == nullptr) return Failure{"the document is no dictionary"};
   auto signature = decodedField(*fields, "signature");
   if (!signature) return Failure{signature.error()};

@@ -58,11 +58,11 @@ int sign(const std::string& input, const std::string& keyPath, const std::string
   return printBytes(output, *document);
 }
 
-platform::Result<StorebagContent> openFile(const std::string& path) {
+Result<StorebagContent> openFile(const std::string& path) {
   const auto bytes = readFile(path);
-  if (!bytes) return platform::Failure{bytes.error()};
+  if (!bytes) return Failure{bytes.error()};
   auto content = openStorebag(*bytes);
-  if (!content) return platform::Failure{fmt::format("{}: {}", path, content.error())};
+  if (!content) return Failure{fmt::format("{}: {}", path, content.error())};
   return content;
 }
 
@@ -76,7 +76,7 @@ int verify(const std::string& path, const std::string& publicPath) {
   if (!key->verifySha1(platform::sha1(content->bag), content->signature)) {
     return fail(path + ": the signature is not that key's over this bag");
   }
-  const platform::Value* version = content->inner.dictionary() ? content->inner.dictionary()->find("version") : nullptr;
+  const Value* version = content->inner.dictionary() ? content->inner.dictionary()->find("version") : nullptr;
   return print(fmt::format("{}: good signature, version {}\n", path, version ? version->description() : "(none)"));
 }
 

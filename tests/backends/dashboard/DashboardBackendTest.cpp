@@ -29,9 +29,6 @@ extern "C" int epoll_ctl(int epoll, int operation, int fd, epoll_event* event) {
 
 namespace orvanta {
 namespace {
-
-using platform::Array;
-using platform::Dictionary;
 using test::eventually;
 
 class DashboardBackendTest : public ::testing::Test {
@@ -110,7 +107,7 @@ TEST_F(DashboardBackendTest, SetUpFailuresLeaveOneLineAndNoSocket) {
 
 TEST_F(DashboardBackendTest, SettingsFromTheProfile) {
   // The setting, the period in milliseconds, warnings.
-  const std::tuple<platform::Value, int, std::size_t> rows[] = {
+  const std::tuple<Value, int, std::size_t> rows[] = {
       {250, 250, 0}, {"20", 20, 0}, {-3, 500, 1}, {true, 500, 1}, {1e300, 86'400'000, 1}};
   for (const auto& [reliable, period, warnings] : rows) {
     log.clear();

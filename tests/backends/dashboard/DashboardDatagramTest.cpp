@@ -10,9 +10,6 @@
 namespace orvanta {
 namespace {
 
-using platform::Array;
-using platform::Dictionary;
-
 std::string textOf(const std::vector<std::uint8_t>& datagram) {
   return {datagram.begin() + kDashboardHeaderBytes, datagram.end()};
 }

@@ -10,10 +10,6 @@
 namespace orvanta {
 namespace {
 
-using platform::Array;
-using platform::Dictionary;
-using platform::Value;
-
 std::string sha(std::string_view text) {
   return OrvantaBackend::convertIntoSHA256(text);
 }

@@ -11,15 +11,11 @@
 #include <vector>
 
 #include "backends/https/HTTPSPostBackend.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
 
 namespace orvanta::test {
-
-using platform::Array;
-using platform::Dictionary;
-using platform::Value;
 
 inline SharedDictionary shared(Dictionary dictionary) {
   return std::make_shared<const Dictionary>(std::move(dictionary));

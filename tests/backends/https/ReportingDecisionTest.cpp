@@ -8,10 +8,6 @@
 
 namespace orvanta {
 namespace {
-
-using platform::Array;
-using platform::Dictionary;
-using platform::Value;
 using Change = std::function<void(ReportingFacts&)>;
 using enum ReportingTest;
 

@@ -18,8 +18,6 @@
 
 namespace orvanta {
 namespace {
-
-using platform::Dictionary;
 using platform::UniqueFd;
 
 TEST(UploadURL, EncodesWhatAQueryCannotHold) {

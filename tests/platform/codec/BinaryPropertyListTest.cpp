@@ -4,7 +4,7 @@
 #include "tests/platform/codec/CodecRows.h"
 #include "tests/support/Bytes.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using namespace orvanta::test;
@@ -149,4 +149,4 @@ TEST(BinaryPropertyList, RoundTrip) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -11,12 +11,12 @@
 
 #include "platform/core/Value.h"
 
-namespace platform {
+namespace orvanta::platform {
 // How test failures show values.
 inline void PrintTo(const Value& value, std::ostream* out) {
   *out << value.description();
 }
-}  // namespace platform
+}  // namespace orvanta::platform
 
 namespace orvanta::test {
 

@@ -5,7 +5,7 @@
 
 #include "tests/platform/codec/CodecRows.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using namespace orvanta::test;
@@ -80,4 +80,4 @@ TEST(Json, RefusesWithThePlace) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

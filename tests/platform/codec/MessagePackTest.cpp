@@ -6,7 +6,7 @@
 #include "tests/platform/codec/CodecRows.h"
 #include "tests/support/Bytes.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using namespace orvanta::test;
@@ -117,4 +117,4 @@ TEST(MessagePack, RoundTrip) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

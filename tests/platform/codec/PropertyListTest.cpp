@@ -6,7 +6,7 @@
 #include "tests/support/Bytes.h"
 #include "tests/support/TemporaryDirectory.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using namespace orvanta::test;
@@ -66,4 +66,4 @@ TEST(Base64, SkipsWhatIsOutsideTheAlphabet) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -5,7 +5,7 @@
 #include "tests/platform/codec/CodecRows.h"
 #include "tests/support/Bytes.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using namespace orvanta::test;
@@ -160,4 +160,4 @@ TEST(XmlPropertyList, RoundTrip) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -5,7 +5,7 @@
 
 #include "tests/support/TemporaryDirectory.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using orvanta::test::TemporaryDirectory;
@@ -56,4 +56,4 @@ TEST(FileStamp, ReadingRefusesWhatIsNoFileOrTooLarge) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

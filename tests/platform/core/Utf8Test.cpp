@@ -2,7 +2,7 @@
 
 #include <gtest/gtest.h>
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 TEST(Utf8, TellsValidFromMalformed) {
@@ -28,4 +28,4 @@ TEST(Utf8, TellsValidFromMalformed) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -6,7 +6,7 @@
 #include <limits>
 #include <optional>
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 constexpr std::int64_t kMaximum = std::numeric_limits<std::int64_t>::max();
@@ -77,4 +77,4 @@ TEST(Value, Descriptions) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -15,7 +15,7 @@
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/Threads.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using orvanta::test::LogCapture;
@@ -208,4 +208,4 @@ TEST_F(DevicePropertiesTest, SeveralThreadsAsk) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -11,7 +11,7 @@
 #include "tests/support/Bytes.h"
 #include "tests/support/Threads.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using orvanta::test::bytesOf;
@@ -179,4 +179,4 @@ TEST_F(RsaTest, RefusesWhatIsNoUsableKey) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

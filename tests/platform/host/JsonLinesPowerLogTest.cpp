@@ -16,7 +16,7 @@
 #include "tests/support/TestClock.h"
 #include "tests/support/Threads.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using testing::ElementsAre;
@@ -124,4 +124,4 @@ TEST(LibraryPowerLog, isNoneWhereTheLibraryIsMissingOrLacksTheFunction) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -15,7 +15,7 @@
 #include "tests/support/TemporaryDirectory.h"
 #include "tests/support/Threads.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using orvanta::test::LogCapture;
@@ -186,4 +186,4 @@ TEST_F(UserDefaultsTest, AKilledWriterLeavesAWholeFile) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

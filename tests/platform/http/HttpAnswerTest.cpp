@@ -1,6 +1,6 @@
 #include "tests/platform/http/HttpFixture.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 class HttpAnswerTest : public HttpFixture {
@@ -146,4 +146,4 @@ TEST_F(HttpAnswerTest, TimeoutsEndWhatTakesTooLong) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

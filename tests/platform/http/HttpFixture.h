@@ -14,7 +14,7 @@
 #include "tests/support/LogCapture.h"
 #include "tests/support/RawServer.h"
 
-namespace platform {
+namespace orvanta::platform {
 
 using orvanta::test::LogCapture;
 using orvanta::test::RawConnection;
@@ -83,4 +83,4 @@ class HttpFixture : public testing::Test {
   std::unique_ptr<HttpClient> _client;
 };
 
-}  // namespace platform
+}  // namespace orvanta::platform

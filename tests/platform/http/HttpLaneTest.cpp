@@ -8,7 +8,7 @@
 #include "tests/platform/Waiting.h"
 #include "tests/platform/http/HttpFixture.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using orvanta::test::Counter;
@@ -258,4 +258,4 @@ TEST_F(HttpLaneTest, CompletionsMayHandInTheNext) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

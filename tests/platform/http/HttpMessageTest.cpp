@@ -2,7 +2,7 @@
 
 #include "tests/platform/http/HttpFixture.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 class HttpMessageTest : public HttpFixture {
@@ -118,4 +118,4 @@ TEST_F(HttpMessageTest, RefusesWhatCannotBeSent) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

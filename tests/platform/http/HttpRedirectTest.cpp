@@ -2,7 +2,7 @@
 
 #include "tests/platform/http/HttpFixture.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 TEST(HttpRedirectVerdict, Table) {
@@ -91,4 +91,4 @@ TEST_F(HttpRedirectTest, FiveAreFollowedAndNoMoreAndNoOtherProtocol) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -27,7 +27,7 @@ extern "C" int getaddrinfo(const char* node, const char* service, const addrinfo
   return real(node, service, hints, result);
 }
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using std::chrono::milliseconds;
@@ -125,4 +125,4 @@ TEST_F(HttpShutdownTest, EveryRequestEndsExactlyOnce) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

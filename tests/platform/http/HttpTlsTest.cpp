@@ -3,7 +3,7 @@
 #include "tools/collector/Collector.h"
 #include "tools/collector/wire/Certificates.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using orvanta::collector::CertificateFlaw;
@@ -99,4 +99,4 @@ TEST_F(HttpTlsTest, RedirectsGoFromHttpToHttpsAndNeverBack) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

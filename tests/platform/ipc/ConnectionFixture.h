@@ -20,7 +20,7 @@
 
 namespace orvanta::test {
 
-using namespace platform;
+using namespace orvanta::platform;
 inline Bytes operator+(Bytes left, const Bytes& right) {
   append(left, right);
   return left;

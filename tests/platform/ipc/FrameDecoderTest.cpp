@@ -7,7 +7,7 @@
 #include "tests/platform/codec/CodecRows.h"
 #include "tests/support/Bytes.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using Bytes = std::vector<std::uint8_t>;
@@ -175,4 +175,4 @@ TEST(FrameDecoder, AllocatesNothingForMissingBytes) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

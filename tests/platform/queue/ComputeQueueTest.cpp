@@ -16,7 +16,7 @@
 #include "platform/queue/WorkQueue.h"
 #include "tests/platform/Waiting.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using orvanta::test::Counter;
@@ -150,4 +150,4 @@ TEST(BlockingScopeTest, AStandInStepsAsideAtOnceAndIsCalledBack) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

@@ -11,7 +11,7 @@
 #include "tests/platform/Waiting.h"
 #include "tests/support/Threads.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 using orvanta::test::Counter;
@@ -297,4 +297,4 @@ TEST_F(WatchTest, LeavesTheDescriptorOpenAndNeedsAnOpenOne) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

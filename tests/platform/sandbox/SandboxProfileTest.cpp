@@ -7,7 +7,7 @@
 #include "platform/codec/PropertyList.h"
 #include "platform/sandbox/Landlock.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 // The least that a profile may allow.
@@ -157,4 +157,4 @@ TEST(SandboxProfile, theShippedProfileIsWellFormed) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

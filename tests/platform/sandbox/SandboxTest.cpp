@@ -26,7 +26,7 @@
 #include "tests/support/LogCapture.h"
 #include "tests/support/TemporaryDirectory.h"
 
-namespace platform {
+namespace orvanta::platform {
 namespace {
 
 namespace fs = std::filesystem;
@@ -314,4 +314,4 @@ TEST_F(ShippedSandboxTest, whereSomebodyElseWatchesAlreadyCallsAreRefusedAllTheS
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace orvanta::platform

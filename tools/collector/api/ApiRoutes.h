@@ -5,7 +5,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 #include "tools/collector/api/ApiServer.h"
 
 namespace orvanta::collector {
@@ -18,7 +18,7 @@ void addReceivingRoutes(httplib::Server& server, const ApiContext& context);
 // The request as the relay read it; null (and an answer that says so) for one that did not come through the relay.
 std::shared_ptr<const ReceivedRequest> requestOf(const httplib::Request& request, httplib::Response& response,
                                                  const ApiContext& context);
-void answerJson(httplib::Response& response, const platform::Value& value, int status = 200);
+void answerJson(httplib::Response& response, const Value& value, int status = 200);
 void answerError(httplib::Response& response, int status, const std::string& reason);
 
 }  // namespace orvanta::collector

@@ -11,9 +11,6 @@
 
 namespace orvanta::collector {
 
-using platform::Failure;
-using platform::Result;
-
 namespace {
 
 class HttplibServer final : public ApiServer {
@@ -65,13 +62,13 @@ std::shared_ptr<const ReceivedRequest> requestOf(const httplib::Request& request
   return found;
 }
 
-void answerJson(httplib::Response& response, const platform::Value& value, int status) {
+void answerJson(httplib::Response& response, const Value& value, int status) {
   response.status = status;
   response.set_content(platform::writeJson(value) + "\n", "application/json");
 }
 
 void answerError(httplib::Response& response, int status, const std::string& reason) {
-  answerJson(response, platform::Dictionary{{"error", reason}}, status);
+  answerJson(response, Dictionary{{"error", reason}}, status);
 }
 
 }  // namespace orvanta::collector

@@ -5,7 +5,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 #include "tools/collector/servers/Behaviours.h"
 #include "tools/collector/servers/DashboardServer.h"
 #include "tools/collector/servers/StorebagServer.h"
@@ -29,7 +29,7 @@ struct ApiContext {
 // Listens on the loopback on a port that only the relay knows. Handlers run on a pool of threads of its own.
 class ApiServer {
  public:
-  static platform::Result<std::unique_ptr<ApiServer>> start(ApiContext context);
+  static Result<std::unique_ptr<ApiServer>> start(ApiContext context);
   virtual ~ApiServer() = default;
   virtual std::uint16_t port() const = 0;
 };

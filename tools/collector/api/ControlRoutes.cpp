@@ -11,10 +11,6 @@ namespace orvanta::collector {
 
 using httplib::Request;
 using httplib::Response;
-using platform::Dictionary;
-using platform::Failure;
-using platform::Result;
-using platform::Value;
 
 namespace {
 

@@ -14,8 +14,6 @@ namespace orvanta::collector {
 
 using httplib::Request;
 using httplib::Response;
-using platform::Array;
-using platform::Dictionary;
 
 namespace {
 

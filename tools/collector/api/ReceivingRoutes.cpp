@@ -27,7 +27,7 @@ void answerEvents(const Request& request, Response& response, const ApiContext& 
   if (!received) return;
   if (!received->damage.empty()) return answerError(response, 400, received->damage);
   const auto& events = *received->json->dictionary()->find("events")->array();
-  answerJson(response, platform::Dictionary{{"accepted", static_cast<std::int64_t>(events.size())}});
+  answerJson(response, Dictionary{{"accepted", static_cast<std::int64_t>(events.size())}});
 }
 
 void answerLogData(const Request& request, Response& response, const ApiContext& context) {

@@ -13,7 +13,7 @@ constexpr std::int64_t kLongestDelayMs = 600'000;
 
 }  // namespace
 
-platform::Result<AcknowledgementSettings> parseAcknowledgementSettings(const platform::Value& value) {
+Result<AcknowledgementSettings> parseAcknowledgementSettings(const Value& value) {
   SettingsReader reader(value);
   AcknowledgementSettings settings;
   settings.acknowledge = reader.boolean("acknowledge").value_or(true);
@@ -27,14 +27,14 @@ platform::Result<AcknowledgementSettings> parseAcknowledgementSettings(const pla
   return settings;
 }
 
-platform::Dictionary describe(const AcknowledgementSettings& settings) {
-  return platform::Dictionary{{"acknowledge", settings.acknowledge},
-                              {"lossPercent", settings.lossPercent},
-                              {"delayMs", static_cast<std::int64_t>(settings.delay.count())},
-                              {"duplicates", settings.duplicates},
-                              {"unknownNumbers", settings.unknownNumbers},
-                              {"tooShort", settings.tooShort},
-                              {"foreign", settings.foreign}};
+Dictionary describe(const AcknowledgementSettings& settings) {
+  return Dictionary{{"acknowledge", settings.acknowledge},
+                    {"lossPercent", settings.lossPercent},
+                    {"delayMs", static_cast<std::int64_t>(settings.delay.count())},
+                    {"duplicates", settings.duplicates},
+                    {"unknownNumbers", settings.unknownNumbers},
+                    {"tooShort", settings.tooShort},
+                    {"foreign", settings.foreign}};
 }
 
 }  // namespace orvanta::collector

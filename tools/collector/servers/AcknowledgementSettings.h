@@ -2,8 +2,7 @@
 
 #include <chrono>
 
-#include "platform/core/Result.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 
 namespace orvanta::collector {
 
@@ -21,7 +20,7 @@ struct AcknowledgementSettings {
 
 // {"acknowledge", "lossPercent", "delayMs", "duplicates", "unknownNumbers", "tooShort", "foreign"}; absent keys as
 // above. Unknown keys and wrong types are refused.
-platform::Result<AcknowledgementSettings> parseAcknowledgementSettings(const platform::Value& value);
-platform::Dictionary describe(const AcknowledgementSettings& settings);
+Result<AcknowledgementSettings> parseAcknowledgementSettings(const Value& value);
+Dictionary describe(const AcknowledgementSettings& settings);
 
 }  // namespace orvanta::collector

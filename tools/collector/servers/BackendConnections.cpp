@@ -7,9 +7,6 @@
 
 namespace orvanta::collector {
 
-using platform::Failure;
-using platform::Result;
-
 namespace {
 
 constexpr std::size_t kKeptIdle = 4;

@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 #include "tools/collector/wire/HttpMessage.h"
 #include "tools/collector/wire/Transport.h"
 
@@ -27,14 +27,14 @@ class BackendConnections {
 
   explicit BackendConnections(std::uint16_t port) : _port(port) {}
   // Sends a request without a body and waits for its answer.
-  platform::Result<BackendAnswer> exchange(const std::string& head, bool answerHasBody);
+  Result<BackendAnswer> exchange(const std::string& head, bool answerHasBody);
   // Closes those kept. Called when no exchange is under way.
   void closeIdle();
 
  private:
   std::unique_ptr<Transport> take();
   void giveBack(std::unique_ptr<Transport> connection);
-  static platform::Result<BackendAnswer> exchangeOn(Transport& connection, const std::string& head, bool answerHasBody);
+  static Result<BackendAnswer> exchangeOn(Transport& connection, const std::string& head, bool answerHasBody);
 
   const std::uint16_t _port;
   std::mutex _mutex;

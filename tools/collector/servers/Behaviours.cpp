@@ -9,11 +9,6 @@
 
 namespace orvanta::collector {
 
-using platform::Dictionary;
-using platform::Failure;
-using platform::Result;
-using platform::Value;
-
 namespace {
 
 constexpr std::array<std::pair<ConnectionFault, std::string_view>, 6> kFaultTexts{

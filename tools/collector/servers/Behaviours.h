@@ -8,8 +8,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/core/Result.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 #include "tools/collector/store/ReceivedRecords.h"
 
 namespace orvanta::collector {
@@ -47,7 +46,7 @@ class Behaviours {
   void clearAll();
   // The behaviour for one request to the path, which uses up one of its times.
   std::optional<PathBehaviour> take(std::string_view path);
-  platform::Value describe() const;
+  Value describe() const;
 
  private:
   mutable std::mutex _mutex;
@@ -59,6 +58,6 @@ struct PathSetting {
   std::string path;
   PathBehaviour behaviour;
 };
-platform::Result<PathSetting> parsePathSetting(const platform::Value& value);
+Result<PathSetting> parsePathSetting(const Value& value);
 
 }  // namespace orvanta::collector

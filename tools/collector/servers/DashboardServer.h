@@ -12,7 +12,7 @@
 #include <thread>
 #include <vector>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 #include "platform/core/UniqueFd.h"
 #include "tools/collector/servers/AcknowledgementSettings.h"
 #include "tools/collector/store/Inbox.h"
@@ -24,8 +24,7 @@ namespace orvanta::collector {
 class DashboardServer {
  public:
   // Port 0 takes any free one. The inbox outlives the server.
-  static platform::Result<std::unique_ptr<DashboardServer>> start(const std::string& address, std::uint16_t port,
-                                                                  Inbox& inbox);
+  static Result<std::unique_ptr<DashboardServer>> start(const std::string& address, std::uint16_t port, Inbox& inbox);
   ~DashboardServer();
   DashboardServer(const DashboardServer&) = delete;
   DashboardServer& operator=(const DashboardServer&) = delete;

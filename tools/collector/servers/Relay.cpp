@@ -15,9 +15,6 @@
 #include "tools/collector/wire/Sockets.h"
 
 namespace orvanta::collector {
-
-using platform::Failure;
-using platform::Result;
 using platform::UniqueFd;
 
 namespace {

@@ -8,7 +8,7 @@
 #include <string>
 #include <thread>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 #include "platform/core/UniqueFd.h"
 #include "tools/collector/servers/RelayConnection.h"
 #include "tools/collector/wire/TlsServer.h"
@@ -22,8 +22,8 @@ class Relay {
   static constexpr std::size_t kMaximumConnections = 512;
 
   // Port 0 takes any free one. `tls` null: plain.
-  static platform::Result<std::unique_ptr<Relay>> listen(const std::string& address, std::uint16_t port,
-                                                         std::shared_ptr<TlsServer> tls, RelayContext context);
+  static Result<std::unique_ptr<Relay>> listen(const std::string& address, std::uint16_t port,
+                                               std::shared_ptr<TlsServer> tls, RelayContext context);
   ~Relay();
   Relay(const Relay&) = delete;
   Relay& operator=(const Relay&) = delete;

@@ -75,13 +75,13 @@ void parseEvents(ReceivedRequest& request) {
     request.damage = "the body is no JSON: " + parsed.error();
     return;
   }
-  const platform::Dictionary* envelope = parsed->dictionary();
-  const platform::Value* events = envelope != nullptr ? envelope->find("events") : nullptr;
+  const Dictionary* envelope = parsed->dictionary();
+  const Value* events = envelope != nullptr ? envelope->find("events") : nullptr;
   if (events == nullptr || events->array() == nullptr) {
     request.damage = "the body has no \"events\"";
     return;
   }
-  request.json = std::make_shared<const platform::Value>(std::move(parsed.value()));
+  request.json = std::make_shared<const Value>(std::move(parsed.value()));
 }
 
 }  // namespace

@@ -6,9 +6,6 @@
 
 namespace orvanta::collector {
 
-using platform::Failure;
-using platform::Value;
-
 SettingsReader::SettingsReader(const Value& value) : _settings(value.dictionary()) {
   if (_settings == nullptr) complain("the settings must be a JSON object");
 }

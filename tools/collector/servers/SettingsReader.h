@@ -6,8 +6,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/core/Result.h"
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 
 namespace orvanta::collector {
 
@@ -15,21 +14,21 @@ namespace orvanta::collector {
 // or, at the end, a key that nobody asked for (mostly a misspelt one).
 class SettingsReader {
  public:
-  explicit SettingsReader(const platform::Value& value);
+  explicit SettingsReader(const Value& value);
 
-  const platform::Value* take(const char* key);
+  const Value* take(const char* key);
   std::optional<std::string> text(const char* key);
   std::optional<std::int64_t> integer(const char* key, std::int64_t least, std::int64_t most);
   std::optional<bool> boolean(const char* key);
   // The first thing that was wrong; none when all is well.
-  std::optional<platform::Failure> finish() const;
+  std::optional<Failure> finish() const;
 
  private:
   void complain(std::string text);
 
-  const platform::Dictionary* _settings;
+  const Dictionary* _settings;
   std::set<std::string, std::less<>> _taken;
-  std::optional<platform::Failure> _failure;
+  std::optional<Failure> _failure;
 };
 
 }  // namespace orvanta::collector

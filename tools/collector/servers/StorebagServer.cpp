@@ -13,12 +13,6 @@
 
 namespace orvanta::collector {
 
-using platform::Array;
-using platform::Dictionary;
-using platform::Failure;
-using platform::Result;
-using platform::Value;
-
 namespace {
 
 constexpr std::array<const char*, 2> kExtensions{".json", ".plist"};

@@ -7,7 +7,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 #include "tools/collector/store/ReceivedRecords.h"
 #include "tools/storebag/StorebagFile.h"
 
@@ -30,7 +30,7 @@ struct BagPlaceholders {
   std::string https;  // https://localhost:PORT
   std::uint16_t dashboardPort = 0;
 };
-platform::Value fillPlaceholders(const platform::Value& value, const BagPlaceholders& placeholders);
+Value fillPlaceholders(const Value& value, const BagPlaceholders& placeholders);
 
 struct HttpAnswer {
   int status = 200;
@@ -45,13 +45,13 @@ struct HttpAnswer {
 class StorebagServer {
  public:
   // Makes storebag.json when the directory has no bag, the signing key when there is none, and the public key files.
-  static platform::Result<std::unique_ptr<StorebagServer>> make(const std::string& directory);
+  static Result<std::unique_ptr<StorebagServer>> make(const std::string& directory);
 
   void setPlaceholders(BagPlaceholders placeholders);  // before the first answer
   void setSettings(const StorebagSettings& settings);
   StorebagSettings settings() const;
   // Serves this bag instead of files: for that name, or for all names without one of their own when it is empty.
-  void setBag(const std::string& name, platform::Value inner);
+  void setBag(const std::string& name, Value inner);
   void clearBags();
 
   HttpAnswer answer(const std::string& name, const std::string* ifModifiedSince);
@@ -63,7 +63,7 @@ class StorebagServer {
  private:
   struct Source;
   StorebagServer(std::string directory, std::shared_ptr<const SigningKey> key);
-  platform::Result<Source> sourceFor(const std::string& name) const;
+  Result<Source> sourceFor(const std::string& name) const;
   // A Last-Modified time that differs from that of every earlier content.
   std::int64_t stampFor(const std::string& identity, std::int64_t modifiedNanoseconds);
 
@@ -77,7 +77,7 @@ class StorebagServer {
     std::int64_t stamp = 0;
   };
   struct HeldBag {
-    platform::Value inner;
+    Value inner;
     std::int64_t modifiedNanoseconds = 0;
   };
   mutable std::mutex _mutex;

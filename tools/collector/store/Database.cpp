@@ -6,9 +6,6 @@
 
 namespace orvanta::collector {
 
-using platform::Failure;
-using platform::Result;
-
 Statement& Statement::bind(int index, std::int64_t value) {
   sqlite3_bind_int64(_statement.get(), index + 1, value);
   return *this;

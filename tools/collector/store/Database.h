@@ -7,7 +7,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 
 namespace orvanta::collector {
 
@@ -40,7 +40,7 @@ class Statement {
 class Database {
  public:
   // Opens or makes the file and runs the schema.
-  static platform::Result<std::unique_ptr<Database>> open(const std::string& path, const char* schema);
+  static Result<std::unique_ptr<Database>> open(const std::string& path, const char* schema);
 
   // The SQL is the program's own; one that does not compile gives a statement that never has a row.
   Statement prepare(std::string_view sql);

@@ -7,11 +7,6 @@
 
 namespace orvanta::collector {
 
-using platform::Array;
-using platform::Failure;
-using platform::Result;
-using platform::Value;
-
 namespace {
 
 constexpr const char* kSchema = R"(

@@ -10,7 +10,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 #include "tools/collector/store/Database.h"
 #include "tools/collector/store/ReceivedRecords.h"
 
@@ -41,7 +41,7 @@ struct InboxCounts {
 // Thread-safe.
 class Inbox {
  public:
-  static platform::Result<std::unique_ptr<Inbox>> open(const std::string& databaseFile, const InboxLimits& limits);
+  static Result<std::unique_ptr<Inbox>> open(const std::string& databaseFile, const InboxLimits& limits);
 
   // Stores the request, and for a post of events each event that its body holds. Sets the id.
   void add(ReceivedRequest& request);

@@ -11,9 +11,6 @@
 
 namespace orvanta::collector {
 
-using platform::Array;
-using platform::Dictionary;
-
 namespace {
 
 // Longer bodies are fetched one by one.

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 #include "tools/collector/store/ReceivedRecords.h"
 
 namespace orvanta::collector {
@@ -8,12 +8,12 @@ namespace orvanta::collector {
 // The records as the JSON that readers of the collector's URLs get. Headers are pairs, in the order in which they stood
 // on the wire. Bodies: as parsed JSON under "json", else as "text", else (no UTF-8) as "base64"; long ones only as
 // "bodyURL".
-platform::Dictionary listRequest(const ReceivedRequest& request);
-platform::Dictionary listEvent(const ReceivedEvent& event);
-platform::Dictionary listDatagram(const ReceivedDatagram& datagram);
+Dictionary listRequest(const ReceivedRequest& request);
+Dictionary listEvent(const ReceivedEvent& event);
+Dictionary listDatagram(const ReceivedDatagram& datagram);
 // A file upload: its name, description and numbers from the query, and where its bytes are.
-platform::Dictionary listUpload(const ReceivedRequest& request);
+Dictionary listUpload(const ReceivedRequest& request);
 // A log-data upload: the archive as JSON.
-platform::Dictionary listLogData(const ReceivedRequest& request);
+Dictionary listLogData(const ReceivedRequest& request);
 
 }  // namespace orvanta::collector

@@ -7,7 +7,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/core/Value.h"
+#include "interface/Values.h"
 #include "tools/collector/wire/HttpMessage.h"
 
 namespace orvanta::collector {
@@ -32,7 +32,7 @@ struct ReceivedRequest {
   std::string rawBody;
   std::string body;  // decompressed; the same as rawBody where nothing was compressed
   // Of a post of events: the body as JSON, or why it is none. Not stored.
-  std::shared_ptr<const platform::Value> json;
+  std::shared_ptr<const Value> json;
   std::string damage;
   std::string note;  // what was wrong with the body, or what was done to the answer; mostly empty
   int status = 0;    // of the answer; 0 when none was given
@@ -49,8 +49,8 @@ struct ReceivedEvent {
   std::int64_t position = 0;  // within the post
   std::string path;           // of the post
   bool secure = false;
-  int status = 0;              // of the post's answer
-  platform::Dictionary event;  // as posted
+  int status = 0;    // of the post's answer
+  Dictionary event;  // as posted
 };
 
 // One dashboard datagram.

@@ -8,9 +8,6 @@
 
 namespace orvanta::collector {
 
-using platform::Failure;
-using platform::Result;
-
 namespace {
 
 class InflateStream {

@@ -4,11 +4,11 @@
 #include <string>
 #include <string_view>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 
 namespace orvanta::collector {
 
 // Inflates a gzip or zlib body whole; a failure when it is damaged, has trailing bytes, or would pass `maximumBytes`.
-platform::Result<std::string> inflateBody(std::string_view compressed, std::size_t maximumBytes);
+Result<std::string> inflateBody(std::string_view compressed, std::size_t maximumBytes);
 
 }  // namespace orvanta::collector

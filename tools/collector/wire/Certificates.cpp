@@ -22,9 +22,6 @@
 
 namespace orvanta::collector {
 
-using platform::Failure;
-using platform::Result;
-
 namespace {
 
 using KeyPointer = std::unique_ptr<EVP_PKEY, decltype(&EVP_PKEY_free)>;

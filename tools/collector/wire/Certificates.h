@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 
 namespace orvanta::collector {
 
@@ -19,13 +19,13 @@ enum class CertificateFlaw { none, wrongHost, expired, selfSigned };
 // its owner's eyes only), made anew when it is about to expire.
 class CertificateAuthority {
  public:
-  static platform::Result<CertificateAuthority> readOrMake(const std::string& directory);
+  static Result<CertificateAuthority> readOrMake(const std::string& directory);
 
   // What clients have to trust.
   const std::string& certificateFile() const { return _certificateFile; }
   const std::string& certificatePem() const { return _identity.certificatePem; }
   // A fresh certificate for localhost, 127.0.0.1 and ::1.
-  platform::Result<ServerIdentity> issueServerIdentity(CertificateFlaw flaw) const;
+  Result<ServerIdentity> issueServerIdentity(CertificateFlaw flaw) const;
 
  private:
   CertificateAuthority(std::string certificateFile, ServerIdentity identity)

@@ -10,9 +10,6 @@
 
 namespace orvanta::collector {
 
-using platform::Failure;
-using platform::Result;
-
 namespace {
 
 bool equalsIgnoringCase(std::string_view a, std::string_view b) {

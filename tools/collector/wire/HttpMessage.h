@@ -8,7 +8,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 
 namespace orvanta::collector {
 
@@ -30,7 +30,7 @@ struct RequestHead {
   bool expectsContinue() const;
   bool keepsAlive() const;
   // None where there is no such header; a failure where it is no number or there are two that differ.
-  platform::Result<std::optional<std::size_t>> contentLength() const;
+  Result<std::optional<std::size_t>> contentLength() const;
 };
 
 struct ResponseHead {
@@ -39,8 +39,8 @@ struct ResponseHead {
 };
 
 // `head` ends with the empty line.
-platform::Result<RequestHead> parseRequestHead(std::string_view head);
-platform::Result<ResponseHead> parseResponseHead(std::string_view head);
+Result<RequestHead> parseRequestHead(std::string_view head);
+Result<ResponseHead> parseResponseHead(std::string_view head);
 
 // One step of the chunked form: the size line of the next chunk, without its line break.
 std::optional<std::size_t> parseChunkSize(std::string_view line);

@@ -10,9 +10,6 @@
 
 namespace orvanta::collector {
 
-using platform::Failure;
-using platform::Result;
-
 namespace {
 
 constexpr std::string_view kHeadEnd = "\r\n\r\n";

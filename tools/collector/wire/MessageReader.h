@@ -4,7 +4,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 #include "tools/collector/wire/Transport.h"
 
 namespace orvanta::collector {
@@ -19,16 +19,16 @@ class MessageReader {
 
   // The next head with its empty line; none when the stream ended before one began, a failure when it ended inside or
   // the head is too long.
-  platform::Result<std::optional<std::string>> readHead();
-  platform::Result<std::string> readBody(std::size_t length);
-  platform::Result<std::string> readChunkedBody(std::size_t maximumBytes);
+  Result<std::optional<std::string>> readHead();
+  Result<std::string> readBody(std::size_t length);
+  Result<std::string> readChunkedBody(std::size_t maximumBytes);
   // Reads and drops what still comes, up to a limit.
   void discard(std::size_t maximumBytes);
 
  private:
   // False when nothing more came.
   bool fill();
-  platform::Result<std::string> readLine();
+  Result<std::string> readLine();
 
   Transport& _stream;
   std::string _buffer;  // read and not yet taken

@@ -11,9 +11,7 @@
 
 namespace orvanta::collector {
 
-using platform::Failure;
-
-platform::Result<BoundSocket> bindSocket(int type, const std::string& address, std::uint16_t port) {
+Result<BoundSocket> bindSocket(int type, const std::string& address, std::uint16_t port) {
   sockaddr_in wanted{};
   wanted.sin_family = AF_INET;
   wanted.sin_port = htons(port);

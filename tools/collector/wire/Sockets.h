@@ -5,7 +5,7 @@
 #include <cstdint>
 #include <string>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 #include "platform/core/UniqueFd.h"
 
 namespace orvanta::collector {
@@ -16,7 +16,7 @@ struct BoundSocket {
 };
 
 // An IPv4 socket of that type (SOCK_STREAM or SOCK_DGRAM) bound to the address; port 0 takes any free one.
-platform::Result<BoundSocket> bindSocket(int type, const std::string& address, std::uint16_t port);
+Result<BoundSocket> bindSocket(int type, const std::string& address, std::uint16_t port);
 
 // "127.0.0.1:4711".
 std::string addressText(const sockaddr_in& address);

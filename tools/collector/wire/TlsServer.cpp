@@ -11,9 +11,6 @@
 
 namespace orvanta::collector {
 
-using platform::Failure;
-using platform::Result;
-
 namespace {
 
 using ContextPointer = std::unique_ptr<SSL_CTX, decltype(&SSL_CTX_free)>;

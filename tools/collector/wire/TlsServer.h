@@ -3,7 +3,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/core/Result.h"
+#include "interface/Values.h"
 #include "tools/collector/wire/Certificates.h"
 #include "tools/collector/wire/Transport.h"
 
@@ -12,7 +12,7 @@ namespace orvanta::collector {
 // The server side of TLS with one certificate. Immutable; accept() may be called from several threads.
 class TlsServer {
  public:
-  static platform::Result<std::shared_ptr<TlsServer>> make(const ServerIdentity& identity);
+  static Result<std::shared_ptr<TlsServer>> make(const ServerIdentity& identity);
   virtual ~TlsServer() = default;
   // Shakes hands. The stream is given back unusable (reads end at once) when the peer breaks off, so that the caller
   // can still interrupt it meanwhile.
