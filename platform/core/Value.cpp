@@ -136,6 +136,21 @@ Value* Dictionary::find(std::string_view key) {
   return const_cast<Value*>(std::as_const(*this).find(key));
 }
 
+const std::string* Dictionary::text(std::string_view key) const {
+  const Value* value = find(key);
+  return value == nullptr ? nullptr : value->string();
+}
+
+const Array* Dictionary::array(std::string_view key) const {
+  const Value* value = find(key);
+  return value == nullptr ? nullptr : value->array();
+}
+
+const Dictionary* Dictionary::dictionary(std::string_view key) const {
+  const Value* value = find(key);
+  return value == nullptr ? nullptr : value->dictionary();
+}
+
 void Dictionary::set(std::string_view key, Value value) {
   const auto place = std::lower_bound(_entries.begin(), _entries.end(), key, keyLess);
   if (place != _entries.end() && place->first == key) {

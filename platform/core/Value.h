@@ -49,6 +49,10 @@ class Dictionary {
   const Value* find(std::string_view key) const;  // null when absent
   Value* find(std::string_view key);
   bool contains(std::string_view key) const { return find(key) != nullptr; }
+  // The value when it is of that type; null when it is absent or of another.
+  const std::string* text(std::string_view key) const;
+  const Array* array(std::string_view key) const;
+  const Dictionary* dictionary(std::string_view key) const;
   void set(std::string_view key, Value value);  // replaces an earlier value
   bool erase(std::string_view key);             // whether the key was there
   void merge(const Dictionary& other);          // other's values win on equal keys

@@ -1,0 +1,78 @@
+#include "platform/core/Text.h"
+
+#include <algorithm>
+#include <system_error>
+
+namespace orvanta::platform {
+
+namespace {
+
+constexpr std::string_view kUpperDigits = "0123456789ABCDEF";
+constexpr std::string_view kLowerDigits = "0123456789abcdef";
+
+char lowered(char c) {
+  return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
+}
+
+// The value of a hexadecimal digit; -1 for another character.
+int digitValue(char c) {
+  const auto at = kLowerDigits.find(lowered(c));
+  return at == std::string_view::npos ? -1 : static_cast<int>(at);
+}
+
+}  // namespace
+
+bool equalsIgnoringCase(std::string_view a, std::string_view b) {
+  return std::equal(a.begin(), a.end(), b.begin(), b.end(), [](char x, char y) { return lowered(x) == lowered(y); });
+}
+
+std::string hexText(std::string_view bytes) {
+  std::string text;
+  text.reserve(bytes.size() * 2);
+  for (const char c : bytes) {
+    const auto byte = static_cast<unsigned char>(c);
+    text += kLowerDigits[byte >> 4U];
+    text += kLowerDigits[byte & 0xFU];
+  }
+  return text;
+}
+
+std::string errnoText(int error) {
+  return std::generic_category().message(error);
+}
+
+std::string percentEncode(std::string_view text, bool (*keeps)(char)) {
+  std::string encoded;
+  encoded.reserve(text.size());
+  for (const char c : text) {
+    if (keeps(c)) {
+      encoded += c;
+      continue;
+    }
+    const auto byte = static_cast<unsigned char>(c);
+    encoded += '%';
+    encoded += kUpperDigits[byte >> 4U];
+    encoded += kUpperDigits[byte & 0xFU];
+  }
+  return encoded;
+}
+
+std::string percentDecode(std::string_view text) {
+  std::string decoded;
+  decoded.reserve(text.size());
+  for (std::size_t i = 0; i < text.size(); ++i) {
+    if (text[i] == '%' && i + 2 < text.size()) {
+      const int high = digitValue(text[i + 1]);
+      const int low = digitValue(text[i + 2]);
+      if (high >= 0 && low >= 0) {
+        decoded += static_cast<char>(high * 16 + low);
+        i += 2;
+        continue;
+      }
+    }
+    decoded += text[i];
+  }
+  return decoded;
+}
+
+}  // namespace orvanta::platform
