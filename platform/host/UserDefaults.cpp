@@ -118,7 +118,7 @@ Value UserDefaults::storeIfAbsent(std::string_view key, Value fresh) {
 }
 
 const Dictionary& UserDefaults::current() {
-  if (!_loaded || !_stamp.stillHolds(FileStamp::of(_path))) load(nullptr);
+  if (!_loaded || !_stamp.stillHolds(FileStamp::of(_path))) static_cast<void>(load(nullptr));  // logs its failure
   return _cached;
 }
 
