@@ -42,7 +42,7 @@ class Listener {
   // alone. The destructor waits for it without limit.
   virtual bool stop() = 0;
   static constexpr std::chrono::seconds kPatience{2};
-  // The most connections of one uid at a time; see docs/operation.md.
+  // The most connections of one uid at a time; see docs/limits-and-log.md.
   static constexpr std::size_t kMaximumConnectionsPerUser = 4096;
 };
 

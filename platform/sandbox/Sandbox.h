@@ -12,7 +12,7 @@
 namespace orvanta::platform {
 
 // The process's confinement by a named profile, the property list `directory`/`name`.plist whose format
-// docs/operation.md describes. Owned by main, on whose thread everything here is called. Its end takes nothing back.
+// docs/sandbox.md describes. Owned by main, on whose thread everything here is called. Its end takes nothing back.
 class Sandbox {
  public:
   // Confines the process, which must have one thread: what is entered holds for that thread and all that it starts

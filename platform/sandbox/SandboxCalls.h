@@ -10,7 +10,7 @@
 namespace orvanta::platform {
 
 // What a sandbox profile says about system calls, by their numbers on this machine; calls that other machines have are
-// left out. Plain data, checked but not yet applied. The format is described in docs/operation.md.
+// left out. Plain data, checked but not yet applied. The format is described in docs/sandbox.md.
 struct SandboxCalls {
   // The call is allowed when one of its arguments, or some bits of it, has one of these values.
   struct Limit {

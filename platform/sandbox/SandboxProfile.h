@@ -15,7 +15,7 @@
 namespace orvanta::platform {
 
 // What a sandbox profile's property list says, checked but not yet applied to any file system. Its format is described
-// in docs/operation.md. Plain data.
+// in docs/sandbox.md. Plain data.
 struct SandboxProfile {
   struct FileRule {
     std::vector<std::string> paths;          // as written, with their ${NAME} places
