@@ -134,7 +134,7 @@ GroupCost costInGroupOf(std::size_t size) {
   cost.ask = measure(0.5, [&] {
                auto& session = *sessions[next];
                next = (next + 1) % size;
-               const std::lock_guard lock(agent.lock());
+               const AgentLock::Held lock(agent.lock());
                agent.parentSessionForChild(session);
                agent.getAncestorWithAggregatorForSession(session);
                agent.parentSessionIDStringForSession(session);

@@ -28,13 +28,13 @@ void finishDeliveries(Platform& platform) {
 }  // namespace
 
 bool endService(platform::Listener& listener, Platform& platform, OrvantadAgent& agent) {
-  const bool nobodyAtTheDoor = listener.stop();
-  if (!nobodyAtTheDoor) ORVANTA_LOG(error, "main: A connection is still being admitted and is left behind");
+  const bool admissionStopped = listener.stop();
+  if (!admissionStopped) ORVANTA_LOG(error, "main: A connection is still being admitted and is left behind");
   endWaiting(platform);
-  const bool sessionsEnded = agent.endAllSessions();
+  const bool sessionsEnded = agent.sessions().endAll();
   finishDeliveries(platform);
-  agent.waitForClients();
-  return nobodyAtTheDoor && sessionsEnded;
+  agent.sessions().waitForClients();
+  return admissionStopped && sessionsEnded;
 }
 
 }  // namespace orvanta

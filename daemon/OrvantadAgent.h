@@ -1,12 +1,11 @@
 #pragma once
 
-#include <condition_variable>
+#include <atomic>
+#include <cstddef>
 #include <memory>
-#include <mutex>
-#include <vector>
 
 #include "config/Platform.h"
-#include "daemon/SessionCountStatus.h"
+#include "daemon/SessionList.h"
 #include "daemon/SessionRegistry.h"
 #include "daemon/StorebagCache.h"
 #include "interface/Values.h"
@@ -17,70 +16,47 @@
 
 namespace orvanta {
 
-class SessionConnection;
-
 // The one agent of the process: admits clients, owns their sessions, and holds what sessions share, the storebag cache
 // and the registry of related sessions.
 //
 // Made by main and outlives every session. Admission and invalidation come from connection queues, several at once; the
 // delegate operations from any session's queue. The session list's lock and the agent's lock are never held together.
+// A peer that may not connect is refused with a log line.
 class OrvantadAgent final : public OrvantadSessionDelegate {
  public:
   explicit OrvantadAgent(Platform& platform);
   // `fetch` stands for the storebag server.
   OrvantadAgent(Platform& platform, StorebagCache::Fetch fetch);
 
-  // The listener's handler: whether the peer was admitted. Only peers that hold the entitlement are.
+  // The listener's handler: returns whether the peer was admitted. Only peers that hold the entitlement are.
   bool listenerShouldAcceptNewConnection(platform::OfferedConnection&& offered);
 
-  // A client has gone, or the process is about to: takes the session out of every list. On the session's queue; a
-  // second call does nothing.
+  // A client has gone, or the process is about to end: takes the session out of the list and its group. On the
+  // session's queue; a second call does nothing.
   void invalidated(const std::shared_ptr<OrvantadSession>& session);
-  // An admitted session's end() has run. On the session's queue.
-  void sessionEnded();
-  // An admitted connection has ended: its client has read everything, or had its time. On the connection's queue.
-  void connectionEnded();
-  // Ends every session while its connection is still open, and returns when all have ended, or after eight seconds:
-  // false, with a log line, when the call of one takes longer still. Sessions admitted meanwhile are refused. Not on a
-  // pool thread.
-  bool endAllSessions();
-  // Afterwards: waits until the clients have read what their sessions' ends told them, a second and a half at most.
-  void waitForClients();
 
-  std::size_t sessionCount() const;
+  SessionList& sessions() { return _sessionList; }
 
-  AgentLock& lock() override { return _lock; }
+  AgentLock& lock() override RETURN_CAPABILITY(_lock) { return _lock; }
   SharedDictionary storebagForSession(OrvantadSession& session) override;
   std::optional<std::string> storebagVersionForSession(OrvantadSession& session) override;
   void updateCorrelatedSessions(const std::shared_ptr<OrvantadSession>& session) override;
   std::optional<std::string> parentSessionIDStringForSession(OrvantadSession& session) override;
   void updateDownstreamSessions(OrvantadSession& session) override;
-  std::shared_ptr<OrvantadSession> parentSessionForChild(OrvantadSession& session) override;
-  std::shared_ptr<OrvantadSession> getAncestorWithAggregatorForSession(OrvantadSession& session) override;
+  std::shared_ptr<OrvantadSession> parentSessionForChild(OrvantadSession& session) override REQUIRES(_lock);
+  std::shared_ptr<OrvantadSession> getAncestorWithAggregatorForSession(OrvantadSession& session) override
+      REQUIRES(_lock);
 
  private:
-  struct Entry {
-    std::shared_ptr<OrvantadSession> session;
-    std::shared_ptr<SessionConnection> connection;
-  };
-
-  void releaseMemoryWhenIdle();  // with _sessionListLock held
-
   Platform& _platform;
   platform::Entitlements& _entitlements;
-  SessionCountStatus _status;
 
-  mutable std::mutex _sessionListLock;
-  std::vector<Entry> _sessionList;  // guarded by _sessionListLock; in order of admission
-  bool _ending = false;             // guarded by _sessionListLock
-  std::size_t _unended = 0;         // guarded by _sessionListLock: admitted, and end() has not run to its end
-  std::chrono::steady_clock::time_point _memoryReleased;  // guarded by _sessionListLock
-  std::size_t _connected = 0;  // guarded by _sessionListLock: admitted, and connectionEnded() not called
-  std::condition_variable _allEnded;
+  SessionList _sessionList;
+  std::atomic<std::size_t> _tokenCount{0};  // the registry's; admission reads it without the lock
 
   AgentLock _lock;
-  StorebagCache _storebags;   // guarded by _lock
-  SessionRegistry _registry;  // guarded by _lock, but for its count of tokens
+  StorebagCache _storebags GUARDED_BY(_lock);
+  SessionRegistry _registry GUARDED_BY(_lock);
 };
 
 }  // namespace orvanta

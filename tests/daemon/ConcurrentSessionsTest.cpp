@@ -27,11 +27,25 @@ struct Peer final : public RecordingConnection {
     frame.kind = platform::Frame::Kind::request;
     frame.method = method;
     frame.params = std::move(params);
-    delegate->received(std::move(frame));
+    onQueue([&] { delegate->received(std::move(frame)); });
   }
-  void leave() { std::exchange(delegate, nullptr)->invalidated(std::nullopt); }
+  void leave() {
+    onQueue([this] { std::exchange(delegate, nullptr)->invalidated(std::nullopt); });
+  }
   std::shared_ptr<platform::ConnectionDelegate> delegate;
   std::function<void()> whenDestroyed;
+
+ private:
+  // Returns when the step has run there, as a connection's calls do.
+  void onQueue(const std::function<void()>& step) const {
+    if (queue()->isCurrent()) return step();
+    Counter done;
+    queue()->post([&] {
+      step();
+      done.add();
+    });
+    ASSERT_TRUE(done.waitFor(1));
+  }
 };
 
 class ConcurrentSessionsTest : public SessionFixture {
@@ -115,7 +129,7 @@ TEST_F(SilentServerTest, OnlySessionsWithSomebodyAboveWaitForIt) {
     peer->call("sendMessageWithDictionary", {Dictionary{{"category", 1}, {"type", 2}}});
     peer->leave();
   }));
-  EXPECT_TRUE(passes([this] { EXPECT_EQ(agent.sessionCount(), 0U); }));
+  EXPECT_TRUE(passes([this] { EXPECT_EQ(agent.sessions().openCount(), 0U); }));
   release();
 }
 
@@ -137,6 +151,32 @@ TEST_F(SilentServerTest, SessionsThatWaitForTheAgentLeaveTheThreadsOfThePoolToOt
   }));
 }
 
+TEST_F(ConcurrentSessionsTest, TheProcessIsBusyFromTheFirstAdmissionToTheLastDeparture) {
+  const auto& mark = device.get().keepAlive();
+  auto& sessions = agent.sessions();
+  const auto expect = [&](std::size_t open, std::uint64_t begun, std::uint64_t ended) {
+    EXPECT_EQ(sessions.openCount(), open);
+    EXPECT_EQ(mark.begun(), begun);
+    EXPECT_EQ(mark.ended(), ended);
+  };
+  std::vector<std::shared_ptr<Peer>> peers;
+  for (int i = 0; i < 3; ++i) peers.push_back(std::make_shared<Peer>(device.get().pool()));
+  ASSERT_TRUE(admits(peers[0]));
+  ASSERT_TRUE(admits(peers[1]));
+  expect(2, 1, 0);
+  peers[0]->leave();
+  expect(1, 1, 0);
+  peers[1]->leave();
+  expect(0, 1, 1);
+  ASSERT_TRUE(admits(peers[2]));
+  expect(1, 2, 1);
+  peers[2]->leave();
+  expect(0, 2, 2);
+  // None is left that this could wait for.
+  EXPECT_TRUE(sessions.endAll());
+  sessions.waitForClients();
+}
+
 // Some clients leave while the daemon ends the sessions of all.
 TEST_F(ConcurrentSessionsTest, AllHaveEndedAndWhatGoesWithThemMayAskTheAgent) {
   platform::setLogLevel(platform::LogLevel::debug);
@@ -145,13 +185,13 @@ TEST_F(ConcurrentSessionsTest, AllHaveEndedAndWhatGoesWithThemMayAskTheAgent) {
   for (int i = 0; i < kSessions; ++i) {
     const auto peer = std::make_shared<Peer>(device.get().pool());
     peer->whenDestroyed = [&] {
-      agent.sessionCount();  // takes the session list's lock
+      agent.sessions().openCount();  // takes the session list's lock
       destroyed.add();
     };
     ASSERT_TRUE(admits(peer));
     if (i % 2 == 0) peer->queue()->post([peer] { peer->leave(); });
   }
-  agent.endAllSessions();
+  agent.sessions().endAll();
   EXPECT_EQ(log.count("<7>dealloc: OrvantadSession dealloc: "), std::size_t{kSessions});
   EXPECT_TRUE(destroyed.waitFor(kSessions));
   EXPECT_FALSE(admits(std::make_shared<Peer>(device.get().pool())));

@@ -57,7 +57,7 @@ class WholeDaemon {
   }
   ~WholeDaemon() {
     _listener->stop();
-    agent.endAllSessions();
+    agent.sessions().endAll();
     device.get().pool().drain(std::chrono::seconds(30));
   }
   std::string socketDirectory() { return device.get().files().runtimeDirectory; }
@@ -72,7 +72,7 @@ class WholeDaemon {
   // have gone.
   bool isIdle() {
     auto& platform = device.get();
-    return agent.sessionCount() == 0 && platform.keepAlive().begun() == platform.keepAlive().ended() &&
+    return agent.sessions().openCount() == 0 && platform.keepAlive().begun() == platform.keepAlive().ended() &&
            platform.pool().threadCount() <= kThreads;
   }
 

@@ -29,11 +29,11 @@ class HierarchyTest : public SessionFixture {
     return session;
   }
   Session parentOf(OrvantadSession& session) {
-    const std::lock_guard lock(agent.lock());
+    const AgentLock::Held lock(agent.lock());
     return agent.parentSessionForChild(session);
   }
   Session aggregatorOf(OrvantadSession& session) {
-    const std::lock_guard lock(agent.lock());
+    const AgentLock::Held lock(agent.lock());
     return agent.getAncestorWithAggregatorForSession(session);
   }
   OrvantaBackend& backend(OrvantadSession& session) { return *session.backends()->find("http_post"); }
