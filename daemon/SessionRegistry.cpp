@@ -8,7 +8,7 @@ namespace orvanta {
 
 namespace {
 
-// Of identifiers given from the parent upwards; none of none.
+// The identifiers of ancestors given from the parent upwards; nullopt without ancestors.
 std::optional<std::string> joinedRootFirst(const std::vector<std::shared_ptr<OrvantadSession>>& ancestors) {
   if (ancestors.empty()) return std::nullopt;
   std::string joined;
@@ -23,8 +23,7 @@ std::optional<std::string> joinedRootFirst(const std::vector<std::shared_ptr<Orv
 
 std::shared_ptr<OrvantadSession> SessionRegistry::getFirstSessionWithHierarchy(std::int64_t level, const Group& group) {
   const auto found = group.levels.find(level);
-  if (found == group.levels.end() || found->second.empty()) return nullptr;
-  return found->second.begin()->second;
+  return found == group.levels.end() ? nullptr : found->second.begin()->second;
 }
 
 const SessionRegistry::Group* SessionRegistry::groupOf(const OrvantadSession& session) const {
@@ -34,9 +33,7 @@ const SessionRegistry::Group* SessionRegistry::groupOf(const OrvantadSession& se
 
 bool SessionRegistry::holds(const Group& group, const OrvantadSession& session) const {
   const auto place = _places.find(&session);
-  if (place == _places.end()) return false;
-  const auto found = _correlatedSessions.find(place->second.token);
-  return found != _correlatedSessions.end() && &found->second == &group;
+  return place != _places.end() && place->second.group == &group;
 }
 
 void SessionRegistry::update(const std::shared_ptr<OrvantadSession>& session) {
@@ -44,26 +41,23 @@ void SessionRegistry::update(const std::shared_ptr<OrvantadSession>& session) {
   const auto& token = session->hierarchyToken();
   if (!token) return;
   Group& group = _correlatedSessions[*token];
-  _tokenCount.store(_correlatedSessions.size(), std::memory_order_relaxed);
   ORVANTA_LOG(debug, "updateCorrelatedSessions: Adding session {} to list for hierarchyToken {} with hierarchyLevel {}",
               session->sessionID(), *token, session->hierarchyLevel());
-  const Place place{*token, session->hierarchyLevel(), _nextOrder++};
+  const Place place{&group, session->hierarchyLevel(), _nextOrder++};
   group.levels[place.level].emplace(place.order, session);
   ++group.size;
   _places.emplace(session.get(), place);
 }
 
 void SessionRegistry::remove(const OrvantadSession& session) {
-  const auto place = _places.find(&session);
-  if (place == _places.end()) return;
-  Group& group = _correlatedSessions[place->second.token];
-  const auto level = group.levels.find(place->second.level);
-  if (level != group.levels.end()) {
-    level->second.erase(place->second.order);
-    if (level->second.empty()) group.levels.erase(level);
-  }
-  --group.size;
-  _places.erase(place);
+  const auto found = _places.find(&session);
+  if (found == _places.end()) return;
+  const Place& place = found->second;
+  const auto level = place.group->levels.find(place.level);
+  level->second.erase(place.order);
+  if (level->second.empty()) place.group->levels.erase(level);
+  --place.group->size;
+  _places.erase(found);
 }
 
 std::shared_ptr<OrvantadSession> SessionRegistry::parentSessionForChild(const OrvantadSession& child) const {
@@ -101,7 +95,7 @@ std::optional<std::string> SessionRegistry::parentSessionIDStringForSession(cons
                 session.sessionID(), token);
     return std::nullopt;
   }
-  // Joined at the end: a chain of a thousand levels would be copied a thousand times on the way.
+  // Joined at the end, lest a chain of a thousand levels be copied a thousand times.
   std::vector<std::shared_ptr<OrvantadSession>> ancestors;
   for (std::int64_t level = static_cast<std::int64_t>(session.hierarchyLevel()) - 1; level >= 0; --level) {
     auto ancestor = getFirstSessionWithHierarchy(level, *group);
@@ -126,7 +120,7 @@ std::shared_ptr<OrvantadSession> SessionRegistry::getAncestorWithAggregatorForSe
   if (!session.hierarchyToken() || session.hierarchyLevel() < 1) return nullptr;
   const Group* group = groupOf(session);
   if (group == nullptr) return nullptr;
-  // Levels in ascending order: root first. Levels that nobody holds cost nothing.
+  // Levels in ascending order: root first. Empty levels cost nothing.
   for (const auto& [level, sessions] : group->levels) {
     if (level >= static_cast<std::int64_t>(session.hierarchyLevel())) break;
     const auto& first = sessions.begin()->second;

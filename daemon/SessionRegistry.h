@@ -1,6 +1,5 @@
 #pragma once
 
-#include <atomic>
 #include <cstdint>
 #include <map>
 #include <memory>
@@ -13,13 +12,13 @@
 
 namespace orvanta {
 
-// Which sessions belong together: for each hierarchy token the sessions registered under it, in order of registration.
+// The groups of related sessions: for each hierarchy token the sessions registered under it, in order of registration.
 //
-// Owned by the agent; every operation but tokenCount() needs the agent's lock, since sessions of all connections come
-// here. A question without an answer yields none and a log line; nothing is created or repaired.
+// Owned by the agent and used under its lock, since sessions of all connections come here. A question without an answer
+// yields null or nullopt and a log line; nothing is created or repaired.
 class SessionRegistry {
  public:
-  // Puts the session at the end of its token's group, out of whatever group held it before.
+  // Moves the session to the end of its token's group, from the group that held it before; one without a token leaves.
   void update(const std::shared_ptr<OrvantadSession>& session);
   // Takes the session out of its group; the group stays, even when empty.
   void remove(const OrvantadSession& session);
@@ -30,31 +29,31 @@ class SessionRegistry {
   // The sessions of the group that are deeper than this one, in order of registration.
   std::vector<std::shared_ptr<OrvantadSession>> downstreamOf(const OrvantadSession& session) const;
 
-  // Tokens ever registered. Any thread, no lock.
-  std::size_t tokenCount() const { return _tokenCount.load(std::memory_order_relaxed); }
+  // Of tokens ever registered, those of empty groups included.
+  std::size_t tokenCount() const { return _correlatedSessions.size(); }
 
  private:
-  // Sessions by level, then by order of registration: "the first session of a level" is one look-up however large the
-  // group is.
+  // Sessions by level, then by order of registration: "the first session of a level" is one look-up, however large the
+  // group is. A level that has become empty is erased.
   using Level = std::map<std::uint64_t, std::shared_ptr<OrvantadSession>>;
   struct Group {
     std::map<std::int64_t, Level> levels;
     std::size_t size = 0;
   };
   struct Place {
-    std::string token;
+    Group* group;
     std::int64_t level;
     std::uint64_t order;
   };
 
-  const Group* groupOf(const OrvantadSession& session) const;  // null: no such token
+  // Of the session's token, whether or not the session is in it; null for one that was never registered.
+  const Group* groupOf(const OrvantadSession& session) const;
   bool holds(const Group& group, const OrvantadSession& session) const;
   static std::shared_ptr<OrvantadSession> getFirstSessionWithHierarchy(std::int64_t level, const Group& group);
 
-  std::unordered_map<std::string, Group> _correlatedSessions;
+  std::unordered_map<std::string, Group> _correlatedSessions;  // groups are never erased: places point at them
   std::unordered_map<const OrvantadSession*, Place> _places;
   std::uint64_t _nextOrder = 0;
-  std::atomic<std::size_t> _tokenCount{0};
 };
 
 }  // namespace orvanta
