@@ -138,9 +138,11 @@ TEST_F(AdaptorTest, AConfigurationThatIsOfNoUseIsToldOnceAtTheStart) {
   std::ofstream(daemon->configurationDirectory() + "/entitlements.d/b.plist")
       << "<plist><dict><key>user</key><integer>0</integer><key>entitlements</key><dict>"
          "<key>com.kovalt.private.orvantd</key><true/></dict></dict></plist>";
-  platform::UserDefaults(daemon->stateDirectory(), "com.kovalt.orvanta").set("environment", 1);
+  ASSERT_TRUE(platform::UserDefaults(daemon->stateDirectory(), "com.kovalt.orvanta").set("environment", 1));
   ASSERT_TRUE(daemon->start());
-  for (int i = 0; i < 3; ++i) platform::connectToService(daemon->runtimeDirectory(), "com.kovalt.orvantad");
+  for (int i = 0; i < 3; ++i) {
+    ASSERT_TRUE(platform::connectToService(daemon->runtimeDirectory(), "com.kovalt.orvantad"));
+  }
   ASSERT_TRUE(daemon->logged("does not have required orvanta entitlement. Closing connection...", 3));
   EXPECT_EQ(daemon->count("initWithSessionDelegate"), 0U) << "nothing is granted by default";
   for (const char* line : {
