@@ -36,17 +36,12 @@ OrvantaBackend::OrvantaBackend(Platform& platform, std::string name, SharedDicti
 
 OrvantaBackend::~OrvantaBackend() = default;
 
-std::optional<std::string> OrvantaBackend::sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
-                                                       std::uint16_t method, std::uint16_t respCode,
-                                                       std::int32_t flag) {
-  ++_eventID;
-  return sendMessage(payload, timestamp, method, respCode, _eventID, flag);
+std::optional<std::string> OrvantaBackend::sendMessage(Event& event) {
+  event.number = ++_eventID;
+  return sendNumbered(event);
 }
 
-std::optional<std::string> OrvantaBackend::sendMessage(const SharedDictionary& /*payload*/,
-                                                       platform::TimeValue /*timestamp*/, std::uint16_t /*method*/,
-                                                       std::uint16_t /*respCode*/, std::uint16_t /*eventID*/,
-                                                       std::int32_t /*flag*/) {
+std::optional<std::string> OrvantaBackend::sendNumbered(const Event& /*event*/) {
   return std::nullopt;
 }
 

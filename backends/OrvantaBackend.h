@@ -10,6 +10,7 @@
 #include <string_view>
 #include <vector>
 
+#include "backends/Event.h"
 #include "config/DeviceInfo.h"
 #include "config/Platform.h"
 #include "interface/OrvantaError.h"
@@ -64,12 +65,8 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
 
   virtual void cleanup() {}
   virtual void updateState() { setState(kBackendEnabled); }
-  // Numbers the event and hands it on; the text for the message log, or none. `payload` may be null.
-  std::optional<std::string> sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
-                                         std::uint16_t method, std::uint16_t respCode, std::int32_t flag);
-  virtual std::optional<std::string> sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
-                                                 std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID,
-                                                 std::int32_t flag);
+  // Gives the event this backend's next number and sends it. Returns the text for the message log, or nullopt.
+  std::optional<std::string> sendMessage(Event& event);
   // The completion may be empty. The base calls it at once with neither result nor error.
   virtual std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion);
   // `descriptor` is the client's open file, borrowed for the call; -1 without one. `removeFile` asks the client to
@@ -130,6 +127,9 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
   static std::string convertIntoSHA256(std::string_view text);
 
  protected:
+  // What sendMessage() does with the event once it has its number.
+  virtual std::optional<std::string> sendNumbered(const Event& event);
+
   Platform& platform() const { return _platform; }
   const SharedDictionary& profile() const { return _profile; }
   void setDisplayURL(std::optional<std::string> url) { _displayURL = std::move(url); }

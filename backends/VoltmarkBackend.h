@@ -18,11 +18,9 @@ class VoltmarkBackend final : public OrvantaBackend {
     return std::make_shared<VoltmarkBackend>(platform, std::move(name), std::move(profile), std::move(productFamily));
   }
 
-  // Always none. Events of category 0 and events without a payload are left out.
-  using OrvantaBackend::sendMessage;
-  std::optional<std::string> sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
-                                         std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID,
-                                         std::int32_t flag) override;
+ protected:
+  // Always nullopt. Events of category 0 and events without a payload are left out.
+  std::optional<std::string> sendNumbered(const Event& event) override;
 };
 
 }  // namespace orvanta

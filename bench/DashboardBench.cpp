@@ -92,10 +92,10 @@ double rawEcho(const std::string& path, const std::vector<std::uint8_t>& call, s
 }
 
 std::vector<std::uint8_t> sampleDatagram() {
-  const Dictionary payload = samplePayload(7);
+  const auto payload = std::make_shared<const Dictionary>(samplePayload(7));
   DashboardSender sender;
   sender.deviceID = "0123456789abcdef0123456789abcdef01234567";
-  return encodeDashboardDatagram(sender, {&payload, {1'700'000'000, 0}, 5, 6, 1});
+  return encodeDashboardDatagram(sender, {payload, {1'700'000'000, 0}, 5, 6, EventFlag::none, 1});
 }
 
 // Until no more arrive; what was lost on the way is not waited for.

@@ -101,11 +101,10 @@ Encoded benchEncode(test::TestPlatform& device) {
     records.reserve(count);
     std::vector<OutgoingEvent> events(count);
     for (std::size_t i = 0; i < count; ++i) {
-      EventRecord::Numbers numbers;
-      numbers.method = 5;
-      numbers.eventID = static_cast<std::uint16_t>(first + i);
-      numbers.clientTS = 1'700'000'000.25 + static_cast<double>(first + i) * 37e-6;
-      records.emplace_back(fields, payloads[first + i], "AAAAAAAAAAAAAAAAAAAAAA==", numbers);
+      Event event{payloads[first + i], {1'700'000'000, 250'000}, 5};
+      event.number = static_cast<std::uint16_t>(first + i);
+      event.time.microseconds += static_cast<std::int32_t>(first + i) * 37;
+      records.emplace_back(fields, std::move(event), "AAAAAAAAAAAAAAAAAAAAAA==", 0);
       records.back().prepare(nullptr, filters);
       events[i].record = &records[i];
     }

@@ -8,6 +8,7 @@
 #include <string>
 #include <string_view>
 
+#include "backends/Event.h"
 #include "config/DeviceInfo.h"
 #include "config/Platform.h"
 #include "interface/ClientSessionInterface.h"
@@ -82,14 +83,6 @@ class OrvantadSession final : public ClientSessionInterface, public std::enable_
   const std::shared_ptr<platform::Connection>& connection() const { return _connection; }
 
  private:
-  // One event on its way to the backends.
-  struct Message {
-    std::uint16_t category = 0;
-    std::uint16_t type = 0;
-    SharedDictionary payload;
-    std::int32_t flag = 0;
-  };
-
   OrvantadSession(Platform& platform, OrvantadSessionDelegate& delegate,
                   std::shared_ptr<platform::Connection> connection);
 
@@ -108,15 +101,14 @@ class OrvantadSession final : public ClientSessionInterface, public std::enable_
   std::unique_lock<AgentLock> lockSharedFields(bool joiningGroup = false);
 
   // Intake.
-  std::optional<std::string> dispatch(const Message& message);
+  std::optional<std::string> dispatch(Event event);
   std::optional<std::string> send(std::uint16_t category, std::uint16_t type, SharedDictionary payload);
   void internalSendMessage(SharedDictionary payload, std::uint16_t method, std::uint16_t respCode);
   static void sendSingleMessage(Platform& platform, const SharedDictionary& sessionInfo,
-                                const SharedDictionary& userInfo, const SharedDictionary& storebag,
-                                const Message& message);
+                                const SharedDictionary& userInfo, const SharedDictionary& storebag, Event event);
 
   // Aggregation and flushing.
-  void aggregateMessage(double timestamp, const Message& message);
+  void aggregateMessage(const Event& event);
   SharedDictionary mergedPayload(const SharedDictionary& payload) const;
   void internalFlushMessagesWithCompletion(FlushReply completion);
 

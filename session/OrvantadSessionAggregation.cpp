@@ -1,3 +1,4 @@
+#include "config/Conversions.h"
 #include "interface/OrvantaLogging.h"
 #include "session/FlushRequest.h"
 #include "session/OrvantadSession.h"
@@ -6,7 +7,7 @@
 
 namespace orvanta {
 
-void OrvantadSession::aggregateMessage(double timestamp, const Message& message) {
+void OrvantadSession::aggregateMessage(const Event& event) {
   if (!_userInfo) {
     // Nobody needs the lock to learn that such a session has no ancestor; the line is due all the same.
     ORVANTA_LOG(info, "getAncestorWithAggregatorForSession: No user info found for session {}", _sessionID);
@@ -14,13 +15,14 @@ void OrvantadSession::aggregateMessage(double timestamp, const Message& message)
     // Held to the end of the hand-over, so that the hierarchy cannot change under it.
     const std::lock_guard lock(_delegate.lock());
     if (const auto ancestor = _delegate.getAncestorWithAggregatorForSession(*this)) {
-      ancestor->sendToAggregator(_sessionInfo, timestamp, message.category, message.type,
-                                 mergedPayload(message.payload));
+      ancestor->sendToAggregator(_sessionInfo, timevalToSeconds(event.time), event.category, event.type,
+                                 mergedPayload(event.payload));
       return;
     }
   }
   if (!hasAggregator()) return;
-  sendToAggregator(_sessionInfo, timestamp, message.category, message.type, mergedPayload(message.payload));
+  sendToAggregator(_sessionInfo, timevalToSeconds(event.time), event.category, event.type,
+                   mergedPayload(event.payload));
 }
 
 SharedDictionary OrvantadSession::mergedPayload(const SharedDictionary& payload) const {

@@ -1,6 +1,5 @@
 #include <fmt/format.h>
 
-#include "config/Conversions.h"
 #include "config/MessageLog.h"
 #include "interface/OrvantaLogging.h"
 #include "session/OrvantadSession.h"
@@ -48,7 +47,7 @@ std::optional<std::string> OrvantadSession::send(std::uint16_t category, std::ui
     ORVANTA_LOG(debug, "{}", kNoBackends);
     return std::nullopt;
   }
-  return dispatch({category, type, std::move(payload), 0});
+  return dispatch({.payload = std::move(payload), .category = category, .type = type});
 }
 
 void OrvantadSession::sendMessageWithDictionary(SharedDictionary parameters, StringReply reply) {
@@ -70,25 +69,25 @@ void OrvantadSession::sendMessageWithDictionary(SharedDictionary parameters, Str
     reply(std::nullopt);
     return;
   }
-  Message message{*category, *type, nullptr, 0};
+  Event event{.category = *category, .type = *type};
   if (const Value* payload = parameters->find(kOrvantaMessageParametersPayload); payload && payload->dictionary()) {
     // The payload stays inside the parameters, which it keeps alive.
-    message.payload = SharedDictionary(parameters, payload->dictionary());
+    event.payload = SharedDictionary(parameters, payload->dictionary());
   }
   if (const Value* flag = parameters->find(kOrvantaMessageParametersFlag); flag && flag->isNumber()) {
-    message.flag = static_cast<std::int32_t>(static_cast<std::uint32_t>(flag->integerValue()));
+    event.flag = static_cast<EventFlag>(static_cast<std::uint32_t>(flag->integerValue()));
   }
-  reply(dispatch(message));
+  reply(dispatch(std::move(event)));
 }
 
-std::optional<std::string> OrvantadSession::dispatch(const Message& message) {
-  const platform::TimeValue time = _platform.clock().timeOfDay();
-  aggregateMessage(timevalToSeconds(time), message);
+std::optional<std::string> OrvantadSession::dispatch(Event event) {
+  event.time = _platform.clock().timeOfDay();
+  aggregateMessage(event);
 
   std::optional<std::string> reply;
   for (const auto& [key, backend] : *_backends) {
-    if (!admits(*backend, message.category, "sendMessageWithDictionary")) continue;
-    auto result = backend->sendMessage(message.payload, time, message.category, message.type, message.flag);
+    if (!admits(*backend, event.category, "sendMessageWithDictionary")) continue;
+    auto result = backend->sendMessage(event);
     if (!result) continue;
     writeToLogFile(_platform, fmt::format("[{} -> sendMessageWithDictionary] {}", backend->name(), *result));
     const bool isHTTPS = backend->name() == kOrvantaBackendHTTPPost2 || backend->name() == kOrvantaBackendHTTPPost;
@@ -122,13 +121,14 @@ void OrvantadSession::sendMessageWithSessionInfo(SharedDictionary sessionInfo, S
     reply("storebag not available");
     return;
   }
-  sendSingleMessage(_platform, sessionInfo, userInfo, storebag, {category, type, std::move(payload), 0});
+  sendSingleMessage(_platform, sessionInfo, userInfo, storebag,
+                    {.payload = std::move(payload), .category = category, .type = type});
   reply("finished");
 }
 
 void OrvantadSession::sendSingleMessage(Platform& platform, const SharedDictionary& sessionInfo,
                                         const SharedDictionary& userInfo, const SharedDictionary& storebag,
-                                        const Message& message) {
+                                        Event event) {
   const Value* sessionID = sessionInfo ? sessionInfo->find(kOrvantaSessionInfoSessionID) : nullptr;
   ORVANTA_LOG(debug, "sendMessageWithSessionInfo: Sending single message with sessionID {}",
               sessionID ? sessionID->integerValue() : 0);
@@ -146,11 +146,11 @@ void OrvantadSession::sendSingleMessage(Platform& platform, const SharedDictiona
   if (userInfo && !SessionInfoRecord::read(*sessionInfo).requireUserInfo) {
     ORVANTA_LOG(warning, "sendMessageWithSessionInfo: user info provided without requiring it.");
   }
-  const platform::TimeValue time = platform.clock().timeOfDay();
+  event.time = platform.clock().timeOfDay();
   for (const auto& [key, backend] : *backends) {
     backend->updateState();
-    if (!admits(*backend, message.category, "sendMessageWithSessionInfo")) continue;
-    const auto result = backend->sendMessage(message.payload, time, message.category, message.type, 0);
+    if (!admits(*backend, event.category, "sendMessageWithSessionInfo")) continue;
+    const auto result = backend->sendMessage(event);
     if (result)
       writeToLogFile(platform, fmt::format("[{} -> sendMessageWithSessionInfo] {}", backend->name(), *result));
   }

@@ -69,15 +69,15 @@ BriskAdaptor::~BriskAdaptor() {
   if (_briskAdaptorClass.destroy != nullptr) _briskAdaptorClass.destroy(_briskAdaptor);
 }
 
-void BriskAdaptor::sendMessage(std::uint16_t method, std::uint16_t respCode, const Dictionary* payload) {
+void BriskAdaptor::sendMessage(const Event& event) {
   const platform::BlockingScope blocking;
-  if (payload == nullptr) {
-    _forward(_briskAdaptor, method, respCode, nullptr, 0);
+  if (!event.payload) {
+    _forward(_briskAdaptor, event.category, event.type, nullptr, 0);
     return;
   }
   std::vector<std::uint8_t> bytes;
-  platform::MessagePackWriter(bytes).dictionary(*payload);
-  _forward(_briskAdaptor, method, respCode, bytes.data(), bytes.size());
+  platform::MessagePackWriter(bytes).dictionary(*event.payload);
+  _forward(_briskAdaptor, event.category, event.type, bytes.data(), bytes.size());
 }
 
 }  // namespace orvanta

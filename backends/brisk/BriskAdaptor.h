@@ -4,9 +4,9 @@
 #include <memory>
 #include <string>
 
+#include "backends/Event.h"
 #include "config/Platform.h"
 #include "interface/PluginBundle.h"
-#include "interface/Values.h"
 
 namespace orvanta {
 
@@ -25,8 +25,8 @@ class BriskAdaptor {
   BriskAdaptor& operator=(const BriskAdaptor&) = delete;
 
   bool respondsToForwarding() const { return _forward != nullptr; }
-  // Only when it responds. `payload` may be null.
-  void sendMessage(std::uint16_t method, std::uint16_t respCode, const Dictionary* payload);
+  // Only when it responds.
+  void sendMessage(const Event& event);
   // For log lines.
   static std::string description() { return std::string("<") + kClassName + ">"; }
 

@@ -33,11 +33,9 @@ bool BriskBackend::isClientTypeAllowed(std::int32_t clientType) {
   return clientType == 7 || clientType == 11 || clientType == 13;
 }
 
-std::optional<std::string> BriskBackend::sendMessage(const SharedDictionary& payload, platform::TimeValue /*timestamp*/,
-                                                     std::uint16_t method, std::uint16_t respCode,
-                                                     std::uint16_t /*eventID*/, std::int32_t /*flag*/) {
+std::optional<std::string> BriskBackend::sendNumbered(const Event& event) {
   if (_briskAdaptor && _briskAdaptor->respondsToForwarding()) {
-    _briskAdaptor->sendMessage(method, respCode, payload.get());
+    _briskAdaptor->sendMessage(event);
   } else {
     ORVANTA_LOG(error, "BriskBackend(sendMessage): Brisk adaptor {} does not respond to forwarding selector {}",
                 _briskAdaptor ? BriskAdaptor::description() : "(null)", BriskAdaptor::kForwardingOperation);

@@ -25,11 +25,9 @@ class BriskBackend final : public OrvantaBackend {
 
   static bool isClientTypeAllowed(std::int32_t clientType);
 
-  // Always none.
-  using OrvantaBackend::sendMessage;
-  std::optional<std::string> sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
-                                         std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID,
-                                         std::int32_t flag) override;
+ protected:
+  // Always nullopt.
+  std::optional<std::string> sendNumbered(const Event& event) override;
 
  private:
   std::unique_ptr<BriskAdaptor> _briskAdaptor;  // may be null; constant after set-up

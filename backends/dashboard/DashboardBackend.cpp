@@ -192,9 +192,7 @@ std::shared_ptr<DashboardBackend> DashboardBackend::self() {
 
 // --- The session's operations ---
 
-std::optional<std::string> DashboardBackend::sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
-                                                         std::uint16_t method, std::uint16_t respCode,
-                                                         std::uint16_t eventID, std::int32_t /*flag*/) {
+std::optional<std::string> DashboardBackend::sendNumbered(const Event& event) {
   DashboardSender sender;
   sender.versionMajor = selfVersion().major;
   sender.clientType = identity().compType;
@@ -205,15 +203,15 @@ std::optional<std::string> DashboardBackend::sendMessage(const SharedDictionary&
                                            (_usingProfile ? 0 : tagReportingPacketHeader::kModeExplicitServer));
   std::vector<std::uint8_t> datagram;
   try {
-    datagram = encodeDashboardDatagram(sender, {payload.get(), timestamp, method, respCode, eventID});
+    datagram = encodeDashboardDatagram(sender, event);
   } catch (const std::bad_alloc&) {
     ORVANTA_LOG(error, "DashboardBackend(sendMessage): can't malloc.");
     return std::nullopt;
   }
   std::optional<std::string> line = writeLocalLog(datagram);
   _handOver.begin();
-  _networkProcQueue->post([self = self(), datagram = std::move(datagram), eventID]() mutable {
-    self->tryToSendMsg(std::move(datagram), eventID);
+  _networkProcQueue->post([self = self(), datagram = std::move(datagram), number = event.number]() mutable {
+    self->tryToSendMsg(std::move(datagram), number);
     self->_handOver.end();
   });
   return line;
@@ -246,8 +244,9 @@ bool DashboardBackend::uploadLogData(const SharedArray& logData) {
   }
   std::string& location = result.response->body;
   ORVANTA_LOG(debug, "DashboardBackend(uploadLogData): Log data uploaded to {}", location);
-  auto announcement = std::make_shared<const Dictionary>(Dictionary{{"LogDataUploadLocation", std::move(location)}});
-  sendMessage(announcement, platform().clock().timeOfDay(), 0, 2, 0);
+  Event announcement{std::make_shared<const Dictionary>(Dictionary{{"LogDataUploadLocation", std::move(location)}}),
+                     platform().clock().timeOfDay(), 0, 2};
+  sendMessage(announcement);
   return true;
 }
 

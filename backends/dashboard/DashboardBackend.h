@@ -42,11 +42,6 @@ class DashboardBackend final : public OrvantaBackend {
                    platform::UdpSocket socket);
   ~DashboardBackend() override;
 
-  // The local log line, before the datagram has gone out; none when it is no text. `flag` does not matter.
-  using OrvantaBackend::sendMessage;
-  std::optional<std::string> sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
-                                         std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID,
-                                         std::int32_t flag) override;
   // Blocks for the whole exchange. Whether the server took it, whatever its status; where it went is announced by an
   // event of category 0 and type 2.
   bool uploadLogData(const SharedArray& logData) override;
@@ -62,6 +57,10 @@ class DashboardBackend final : public OrvantaBackend {
   static constexpr std::chrono::milliseconds kDefaultPeriod{500};
   static constexpr std::chrono::milliseconds kLongestPeriod{86'400'000};
   static constexpr std::chrono::milliseconds kLastResortDelay{9500};
+
+ protected:
+  // The local log line, before the datagram has gone out; nullopt when it is not UTF-8. The flag does not matter.
+  std::optional<std::string> sendNumbered(const Event& event) override;
 
  private:
   class HandOver;

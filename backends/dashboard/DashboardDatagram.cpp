@@ -176,10 +176,10 @@ std::string_view tagReportingPacketHeader::deviceIDText() const {
   return {deviceID.data(), static_cast<std::size_t>(end - deviceID.begin())};
 }
 
-std::vector<std::uint8_t> encodeDashboardDatagram(const DashboardSender& sender, const DashboardEvent& event) {
+std::vector<std::uint8_t> encodeDashboardDatagram(const DashboardSender& sender, const Event& event) {
   std::array<std::uint8_t, kDashboardHeaderBytes + kDashboardMaximumText> datagram;
   const std::size_t textLength =
-      event.payload == nullptr ? 0 : writeText(*event.payload, datagram.data() + kDashboardHeaderBytes);
+      !event.payload ? 0 : writeText(*event.payload, datagram.data() + kDashboardHeaderBytes);
   const std::size_t length = kDashboardHeaderBytes + textLength;
 
   tagReportingPacketHeader header;
@@ -190,11 +190,11 @@ std::vector<std::uint8_t> encodeDashboardDatagram(const DashboardSender& sender,
   header.sessionIDComplement = ~sender.sessionID;
   header.clientVersionComplement = static_cast<std::uint16_t>(~sender.clientVersion);
   header.lengthComplement = static_cast<std::uint16_t>(~length);
-  header.method = event.method;
-  header.respCode = event.respCode;
+  header.method = event.category;
+  header.respCode = event.type;
   const std::string_view deviceID = sender.deviceID.substr(0, header.deviceID.size());
   std::copy(deviceID.begin(), deviceID.end(), header.deviceID.begin());
-  header.eventNumber = event.eventNumber;
+  header.eventNumber = event.number;
   header.mode = sender.mode;
   writeHeader(header, datagram.data());
   return {datagram.data(), datagram.data() + length};

@@ -10,8 +10,8 @@
 #include <utility>
 #include <vector>
 
+#include "backends/Event.h"
 #include "interface/Values.h"
-#include "platform/core/Clock.h"
 
 namespace orvanta {
 
@@ -62,18 +62,10 @@ struct DashboardSender {
   std::uint16_t mode = 0;
 };
 
-struct DashboardEvent {
-  const Dictionary* payload = nullptr;  // may be null
-  platform::TimeValue time;
-  std::uint16_t method = 0;
-  std::uint16_t respCode = 0;
-  std::uint16_t eventNumber = 0;
-};
-
 // The whole datagram. The text is " key=value" for each pair of the payload, in the order of their values' lengths in
 // bytes, shortest first, so that a cut at the maximum loses the fewest pairs; equal lengths keep the keys' order. A
 // zero byte ends the key or value that holds it.
-std::vector<std::uint8_t> encodeDashboardDatagram(const DashboardSender& sender, const DashboardEvent& event);
+std::vector<std::uint8_t> encodeDashboardDatagram(const DashboardSender& sender, const Event& event);
 
 // A failure says what is wrong: shorter than a header, another marker, a length that is not the datagram's.
 Result<tagReportingPacket> decodeDashboardDatagram(std::span<const std::uint8_t> datagram);

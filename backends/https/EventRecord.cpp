@@ -37,13 +37,14 @@ std::size_t footprintOf(const Dictionary& dictionary) {
 
 }  // namespace
 
-EventRecord::EventRecord(std::shared_ptr<const SessionFields> fields, SharedDictionary payload,
-                         std::optional<std::string> combinedSessionID, Numbers numbers)
+EventRecord::EventRecord(std::shared_ptr<const SessionFields> fields, Event event,
+                         std::optional<std::string> combinedSessionID, std::int32_t timezoneOffset)
     : _fields(std::move(fields)),
-      _payload(std::move(payload)),
+      _event(std::move(event)),
       _combinedSessionID(std::move(combinedSessionID)),
-      _numbers(numbers),
-      _category(numbers.method),
+      _clientTS(_fields->clientTS(_event.time)),
+      _timezoneOffset(timezoneOffset),
+      _category(_event.category),
       _present(_fields->present) {
   for (const ReservedKey key : kOwnKeys) _present |= setOf(key);
   if (!_combinedSessionID && !_fields->numericSessionID) _present &= ~setOf(ReservedKey::sessionID);
@@ -65,7 +66,7 @@ std::int32_t EventRecord::visibleNumber(ReservedKey key) const {
   if (_userInfo && (_userInfo->reservedKeys() & setOf(key)) != 0) {
     return static_cast<std::int32_t>(_userInfo->entries().find(nameOf(key))->integerValue());
   }
-  return key == ReservedKey::method ? _numbers.method : _numbers.respCode;
+  return key == ReservedKey::method ? _event.category : _event.type;
 }
 
 Value EventRecord::ownValue(ReservedKey key) const {
@@ -74,16 +75,16 @@ Value EventRecord::ownValue(ReservedKey key) const {
       if (_fields->numericSessionID) return *_fields->numericSessionID;
       return _combinedSessionID ? Value(*_combinedSessionID) : Value();
     case ReservedKey::eventNumber:
-      return static_cast<int>(_numbers.eventID);
+      return static_cast<int>(_event.number);
     case ReservedKey::method:
-      return static_cast<int>(_numbers.method);
+      return static_cast<int>(_event.category);
     case ReservedKey::status:
-      return static_cast<int>(_numbers.respCode);
+      return static_cast<int>(_event.type);
     case ReservedKey::clientTS:
     case ReservedKey::eventTime:
-      return _numbers.clientTS;
+      return _clientTS;
     case ReservedKey::timezoneOffset:
-      return static_cast<int>(_numbers.timezoneOffset);
+      return _timezoneOffset;
     default:
       return _fields->value(key);
   }
@@ -111,7 +112,7 @@ void EventRecord::applyFilters(const EventFilters& filters) {
     }
   }
   hidden |= _present;
-  for (const auto& [key, value] : orEmpty(_payload)) {
+  for (const auto& [key, value] : orEmpty(_event.payload)) {
     const auto* tag = filters.find(key, method, status);
     if (tag == nullptr || (reservedKeyNamed(key) & hidden) != 0) continue;
     if (!_userInfo || !_userInfo->holds(key)) apply(key, tag, value);
@@ -128,7 +129,7 @@ const EventRecord::Change* EventRecord::changeOf(std::string_view key) const {
 
 std::size_t EventRecord::footprint() const {
   constexpr std::size_t kReservedFieldsAbout = 512;
-  return kReservedFieldsAbout + footprintOf(orEmpty(_payload));
+  return kReservedFieldsAbout + footprintOf(orEmpty(_event.payload));
 }
 
 // From the top layer down; a key that was written, or taken away, hides the same key of the layers below.
@@ -175,7 +176,7 @@ void EventRecord::write(FieldWriter& writer, const Overlay& overlay) const {
   }
   writeReserved(writer, hidden);
   hidden |= _present;
-  for (const auto& [key, value] : orEmpty(_payload)) {
+  for (const auto& [key, value] : orEmpty(_event.payload)) {
     if ((reservedKeyNamed(key) & hidden) != 0) continue;
     if (_userInfo && _userInfo->holds(key)) continue;
     if (top != nullptr && top != _userInfo.get() && top->holds(key)) continue;
@@ -203,17 +204,17 @@ void EventRecord::writeReserved(FieldWriter& writer, ReservedKeys hidden) const 
       writer.text(ReservedKey::sessionID, *_combinedSessionID);
     }
   }
-  number(ReservedKey::eventNumber, _numbers.eventID);
-  number(ReservedKey::method, _numbers.method);
-  number(ReservedKey::status, _numbers.respCode);
+  number(ReservedKey::eventNumber, _event.number);
+  number(ReservedKey::method, _event.category);
+  number(ReservedKey::status, _event.type);
   if (visible(ReservedKey::clientTS) && visible(ReservedKey::eventTime)) {
-    writer.number({ReservedKey::clientTS, ReservedKey::eventTime}, _numbers.clientTS);
+    writer.number({ReservedKey::clientTS, ReservedKey::eventTime}, _clientTS);
   } else if (visible(ReservedKey::clientTS)) {
-    writer.number({ReservedKey::clientTS}, _numbers.clientTS);
+    writer.number({ReservedKey::clientTS}, _clientTS);
   } else if (visible(ReservedKey::eventTime)) {
-    writer.number({ReservedKey::eventTime}, _numbers.clientTS);
+    writer.number({ReservedKey::eventTime}, _clientTS);
   }
-  number(ReservedKey::timezoneOffset, _numbers.timezoneOffset);
+  number(ReservedKey::timezoneOffset, _timezoneOffset);
 }
 
 }  // namespace orvanta

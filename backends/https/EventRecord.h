@@ -8,6 +8,7 @@
 #include <string_view>
 #include <vector>
 
+#include "backends/Event.h"
 #include "backends/https/EventFilters.h"
 #include "backends/https/RecordLayer.h"
 #include "backends/https/ReservedKeys.h"
@@ -26,16 +27,10 @@ class FieldWriter;
 // Made and prepared on the session's queue; afterwards immutable.
 class EventRecord {
  public:
-  struct Numbers {
-    std::uint16_t method = 0;
-    std::uint16_t respCode = 0;
-    std::uint16_t eventID = 0;
-    std::int32_t timezoneOffset = 0;  // seconds east of GMT
-    double clientTS = 0;              // seconds, finite
-  };
-  // `payload` may be null. `combinedSessionID` gives way to the session's number where the session reports that.
-  EventRecord(std::shared_ptr<const SessionFields> fields, SharedDictionary payload,
-              std::optional<std::string> combinedSessionID, Numbers numbers);
+  // `combinedSessionID` gives way to the session's number where the session reports that. `timezoneOffset`: seconds
+  // east of GMT.
+  EventRecord(std::shared_ptr<const SessionFields> fields, Event event, std::optional<std::string> combinedSessionID,
+              std::int32_t timezoneOffset);
 
   // Merges the user info (null: none) and applies the filters. Once.
   void prepare(std::shared_ptr<const RecordLayer> userInfo, const EventFilters& filters);
@@ -68,11 +63,12 @@ class EventRecord {
   void writeReserved(FieldWriter& writer, ReservedKeys hidden) const;
 
   std::shared_ptr<const SessionFields> _fields;
-  SharedDictionary _payload;
+  Event _event;
   std::shared_ptr<const RecordLayer> _userInfo;
   std::optional<std::string> _combinedSessionID;
   std::vector<Change> _changes;  // sorted by key; nearly always empty
-  Numbers _numbers;
+  double _clientTS = 0;          // seconds, finite
+  std::int32_t _timezoneOffset = 0;
   std::int32_t _category = 0;
   ReservedKeys _present = 0;
 };

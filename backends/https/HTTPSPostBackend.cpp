@@ -19,14 +19,8 @@ constexpr std::int32_t kLocalFailure = -1;
 // More than that is milliseconds of work to put into a message.
 constexpr std::size_t kLargeBatch = 512U << 10U;
 
-bool isRealtime(std::int32_t flag) {
-  return flag == 1 || flag == 3;
-}
-bool isPromoting(std::int32_t flag) {
-  return flag == 2 || flag == 3;
-}
-bool isSessionEnd(std::uint16_t method, std::uint16_t respCode) {
-  return method == 0 && respCode == 1;
+bool isSessionEnd(const Event& event) {
+  return event.category == 0 && event.type == 1;
 }
 
 void completeWithError(FlushCompletion& completion, const char* description) {
@@ -77,29 +71,28 @@ void HTTPSPostBackend::setUserInfoDict(SharedDictionary userInfo) {
   OrvantaBackend::setUserInfoDict(std::move(userInfo));
 }
 
-std::optional<std::string> HTTPSPostBackend::sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
-                                                         std::uint16_t method, std::uint16_t respCode,
-                                                         std::uint16_t eventID, std::int32_t flag) {
+std::optional<std::string> HTTPSPostBackend::sendNumbered(const Event& event) {
   if (state() == kBackendDisabled) return std::nullopt;
-  SharedDictionary sent = isSessionEnd(method, respCode) ? sessionEndPayload(payload) : payload;
-  PreparedEvent event = newEventDictfromPayload(std::move(sent), timestamp, method, respCode, eventID);
-  event.record.prepare(_userInfo, _filters);
+  Event kept = event;
+  if (isSessionEnd(event)) kept.payload = sessionEndPayload(event.payload);
+  PreparedEvent prepared = newEventDict(std::move(kept));
+  prepared.record.prepare(_userInfo, _filters);
 
-  if (isPromoting(flag)) {
+  if (isPromoting(event.flag)) {
     // Only a held backend is promoted: the server may have disabled it this moment.
     std::int32_t held = kBackendSampledOut;
     stateCell().compare_exchange_strong(held, kBackendEnabled);
   }
-  const bool realtime = isRealtime(flag);
+  const bool realtime = isRealtime(event.flag);
   ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): realtime is {:d}", realtime);
   const std::int32_t now = state();
   const bool mayPost = now != kBackendWaiting && now != kBackendSampledOut;
   const bool hasInfo = !identity().requireUserInfo || userInfoDict() != nullptr;
-  if (mayPost && (realtime || !batchEvents()) && hasInfo) return sendDirectly(event.record, method, respCode, flag);
+  if (mayPost && (realtime || !batchEvents()) && hasInfo) return sendDirectly(prepared.record, event);
 
   ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): Batching {}, {:d}, {:d}", now, batchEvents(),
               identity().requireUserInfo);
-  return batchEvent(std::move(event));
+  return batchEvent(std::move(prepared));
 }
 
 SharedDictionary HTTPSPostBackend::sessionEndPayload(const SharedDictionary& payload) const {
@@ -119,10 +112,7 @@ SharedDictionary HTTPSPostBackend::sessionEndPayload(const SharedDictionary& pay
   return extended;
 }
 
-HTTPSPostBackend::PreparedEvent HTTPSPostBackend::newEventDictfromPayload(SharedDictionary payload,
-                                                                          platform::TimeValue timestamp,
-                                                                          std::uint16_t method, std::uint16_t respCode,
-                                                                          std::uint16_t eventID) {
+HTTPSPostBackend::PreparedEvent HTTPSPostBackend::newEventDict(Event event) {
   if (!_sessionFields) _sessionFields = SessionFields::of(*this, isInternalBuild(platform()));
   std::uint64_t labelsSeen = 0;
   {
@@ -130,13 +120,8 @@ HTTPSPostBackend::PreparedEvent HTTPSPostBackend::newEventDictfromPayload(Shared
     const std::lock_guard lock(mutex());
     labelsSeen = _batchedEvents.labels();
   }
-  EventRecord::Numbers numbers;
-  numbers.method = method;
-  numbers.respCode = respCode;
-  numbers.eventID = eventID;
-  numbers.timezoneOffset = platform().device().timeZoneOffset(platform().clock().wallSeconds());
-  numbers.clientTS = _sessionFields->clientTS(timestamp);
-  return {EventRecord(_sessionFields, std::move(payload), combinedSessionIDString(), numbers), labelsSeen};
+  const std::int32_t timezoneOffset = platform().device().timeZoneOffset(platform().clock().wallSeconds());
+  return {EventRecord(_sessionFields, std::move(event), combinedSessionIDString(), timezoneOffset), labelsSeen};
 }
 
 std::optional<std::string> HTTPSPostBackend::batchEvent(PreparedEvent event) {
@@ -181,10 +166,9 @@ std::optional<std::string> HTTPSPostBackend::batchEvent(PreparedEvent event) {
   return flushed;
 }
 
-std::optional<std::string> HTTPSPostBackend::sendDirectly(const EventRecord& record, std::uint16_t method,
-                                                          std::uint16_t respCode, std::int32_t flag) {
+std::optional<std::string> HTTPSPostBackend::sendDirectly(const EventRecord& record, const Event& event) {
   std::optional<std::string> flushed;
-  if (state() == kBackendEnabled && isRealtime(flag) && hasBatched()) {
+  if (state() == kBackendEnabled && isRealtime(event.flag) && hasBatched()) {
     ORVANTA_LOG(debug,
                 "HTTPSPostBackend(sendMessage): Got a realtime event and some events have already been batched. "
                 "Forcing Flush here to keep events in order.");
@@ -192,13 +176,13 @@ std::optional<std::string> HTTPSPostBackend::sendDirectly(const EventRecord& rec
   }
   ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): Sending {}, {:d}, {:d}", state(), batchEvents(),
               identity().requireUserInfo);
-  const OutgoingEvent event{&record, {}};
-  PostMessage message = buildMessage({&event, 1});
+  const OutgoingEvent outgoing{&record, {}};
+  PostMessage message = buildMessage({&outgoing, 1});
   std::optional<std::string> result = std::move(message.prettyJsonString);
   if (flushed) {
     result = fmt::format("Flushed events:\n{}\nStandalone event:\n{}", *flushed, result.value_or("(null)"));
   }
-  postJSONMessage(std::move(message.json), flag, EventMap{method, respCode}, {});
+  postJSONMessage(std::move(message.json), &event, {});
   if (flushed) _immutable = true;
   return result;
 }
@@ -246,7 +230,7 @@ std::optional<std::string> HTTPSPostBackend::flushEnabled(FlushCompletion comple
     posted = [completion = std::move(completion), text = std::move(message.prettyJsonString)](
                  std::optional<OrvantaError> error) mutable { completion(std::move(text), std::move(error)); };
   }
-  postJSONMessage(std::move(message.json), 0, std::nullopt, std::move(posted));
+  postJSONMessage(std::move(message.json), nullptr, std::move(posted));
   if (text) _immutable = true;
   return text;
 }

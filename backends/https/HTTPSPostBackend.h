@@ -35,10 +35,6 @@ class HTTPSPostBackend final : public OrvantaBackend {
                                                   std::string productFamily);
 
   void updateState() override;
-  using OrvantaBackend::sendMessage;
-  std::optional<std::string> sendMessage(const SharedDictionary& payload, platform::TimeValue timestamp,
-                                         std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID,
-                                         std::int32_t flag) override;
   std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion) override;
   void setCorrelatedSessionID(std::optional<std::string> combined) override;
   void setUserInfoDict(SharedDictionary userInfo) override;
@@ -50,6 +46,9 @@ class HTTPSPostBackend final : public OrvantaBackend {
 
   // A batch that would take more memory than this is flushed like one that has reached its event threshold.
   static constexpr std::size_t kMaximumBatchBytes = 16U << 20U;
+
+ protected:
+  std::optional<std::string> sendNumbered(const Event& event) override;
 
  private:
   HTTPSPostBackend(Platform& platform, std::string name, SharedDictionary profile, std::string productFamily);
@@ -66,12 +65,10 @@ class HTTPSPostBackend final : public OrvantaBackend {
     EventRecord record;
     std::uint64_t labelsSeen;  // see EventBatch
   };
-  PreparedEvent newEventDictfromPayload(SharedDictionary payload, platform::TimeValue timestamp, std::uint16_t method,
-                                        std::uint16_t respCode, std::uint16_t eventID);
+  PreparedEvent newEventDict(Event event);
   SharedDictionary sessionEndPayload(const SharedDictionary& payload) const;
   std::optional<std::string> batchEvent(PreparedEvent event);
-  std::optional<std::string> sendDirectly(const EventRecord& record, std::uint16_t method, std::uint16_t respCode,
-                                          std::int32_t flag);
+  std::optional<std::string> sendDirectly(const EventRecord& record, const Event& event);
   std::optional<std::string> flushEnabled(FlushCompletion completion);
   std::vector<OutgoingEvent> outgoingEvents(const EventBatch::Events& events, const RecordLayer* userInfo) const;
   PostMessage buildMessage(std::span<const OutgoingEvent> events) const;
@@ -80,13 +77,9 @@ class HTTPSPostBackend final : public OrvantaBackend {
   std::size_t batchedBytes() const;
 
   // HTTPSPostRequest.cpp
-  struct EventMap {
-    std::uint16_t method;
-    std::uint16_t respCode;
-  };
-  void postJSONMessage(std::string json, std::int32_t flag, std::optional<EventMap> eventMap,
-                       PostCompletion completion);
-  std::vector<platform::HttpHeader> postHeaders(const std::optional<EventMap>& eventMap) const;
+  // `event`: the one that the message holds; null for a batch.
+  void postJSONMessage(std::string json, const Event* event, PostCompletion completion);
+  std::vector<platform::HttpHeader> postHeaders(const Event* event) const;
 
   // Constant after construction.
   const bool _dnuEnabled;         // the user's consent to diagnostics submission

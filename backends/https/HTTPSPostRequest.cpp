@@ -14,19 +14,18 @@ std::optional<std::string> userInfoText(const SharedDictionary& userInfo, std::s
   return value->description();
 }
 
-void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t flag, std::optional<EventMap> eventMap,
-                                       PostCompletion completion) {
-  const bool realtime = flag == 1 || flag == 3;
+void HTTPSPostBackend::postJSONMessage(std::string json, const Event* event, PostCompletion completion) {
+  const bool realtime = event != nullptr && isRealtime(event->flag);
   std::optional<std::string> url = realtime ? _realtimePostURL : postURL();
   if (!url) {
     if (completion) completion(makeOrvantaError("postURL is nil", -1));
     return;
   }
   if (!_postQueue) _postQueue = std::make_shared<PostQueue>(platform(), weak_from_this(), name());
-  _postQueue->post({std::move(*url), postHeaders(eventMap), std::move(json), std::move(completion)});
+  _postQueue->post({std::move(*url), postHeaders(event), std::move(json), std::move(completion)});
 }
 
-std::vector<platform::HttpHeader> HTTPSPostBackend::postHeaders(const std::optional<EventMap>& eventMap) const {
+std::vector<platform::HttpHeader> HTTPSPostBackend::postHeaders(const Event* event) const {
   const BackendIdentity& facts = identity();
   std::vector<platform::HttpHeader> headers;
   headers.reserve(12);
@@ -42,8 +41,8 @@ std::vector<platform::HttpHeader> HTTPSPostBackend::postHeaders(const std::optio
                                  facts.productVersion.value_or("(null)"))});
   headers.push_back({"X-ORV-Client-Version", std::to_string(facts.clientVersion)});
   headers.push_back({"X-ORV-Sender", std::string(senderCodeForClientType(facts.compType))});
-  if (eventMap) {
-    headers.push_back({"X-ORV-Event-Map", fmt::format("{} {}", eventMap->method, eventMap->respCode)});
+  if (event != nullptr) {
+    headers.push_back({"X-ORV-Event-Map", fmt::format("{} {}", event->category, event->type)});
   }
   headers.push_back({"Accept", "application/json"});
   headers.push_back({"Content-Type", "application/json"});

@@ -28,12 +28,10 @@ class OrvantaBackendTest : public HTTPSFixture {
   // Remembers the numbers of its events and opens up the lists.
   struct Recorder final : OrvantaBackend {
     using OrvantaBackend::OrvantaBackend;
-    using OrvantaBackend::sendMessage;
     using OrvantaBackend::setEventBlacklist;
     using OrvantaBackend::setEventWhitelist;
-    std::optional<std::string> sendMessage(const SharedDictionary&, platform::TimeValue, std::uint16_t, std::uint16_t,
-                                           std::uint16_t eventID, std::int32_t) override {
-      last = eventID;
+    std::optional<std::string> sendNumbered(const Event& event) override {
+      last = event.number;
       return "sent";
     }
     int last = -1;

@@ -36,8 +36,13 @@ void takeApart(Bytes datagram) {
   sender.sessionID = packet->header.sessionID();
   sender.deviceID = packet->header.deviceIDText();
   const auto& header = packet->header;
-  const auto again = decodeDashboardDatagram(encodeDashboardDatagram(
-      sender, {&payload, {static_cast<std::int32_t>(header.timeSeconds), 0}, header.method, header.respCode, 7}));
+  const auto again =
+      decodeDashboardDatagram(encodeDashboardDatagram(sender, {std::make_shared<const Dictionary>(payload),
+                                                               {static_cast<std::int32_t>(header.timeSeconds), 0},
+                                                               header.method,
+                                                               header.respCode,
+                                                               EventFlag::none,
+                                                               7}));
   REQUIRE(again && again->text.size() <= kDashboardMaximumText);
   REQUIRE(again->header.sessionID() == header.sessionID() && again->header.method == header.method);
   REQUIRE(again->header.deviceIDText() == header.deviceIDText());
@@ -91,7 +96,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t siz
       takeApart(rest);
       break;
     case 1: {
-      auto datagram = encodeDashboardDatagram({}, {nullptr, {}, 1, 2, 3});
+      auto datagram = encodeDashboardDatagram({}, {.category = 1, .type = 2, .number = 3});
       const auto length = static_cast<std::uint16_t>(std::min<std::size_t>(datagram.size() + rest.size(), 0xffff));
       datagram.insert(datagram.end(), rest.begin(), rest.begin() + (length - kDashboardHeaderBytes));
       datagram[14] = static_cast<std::uint8_t>(~length >> 8);

@@ -16,10 +16,10 @@ namespace {
 class DashboardServerTest : public CollectorFixture {
  protected:
   static std::string datagram(std::uint16_t eventNumber, bool reliable = true) {
-    const Dictionary payload{{"a", "q"}, {"b", "x=y"}};
+    const auto payload = std::make_shared<const Dictionary>(Dictionary{{"a", "q"}, {"b", "x=y"}});
     DashboardSender sender;
     sender.mode = reliable ? 1 : 0;
-    const auto bytes = encodeDashboardDatagram(sender, {&payload, {123, 4999}, 300, 2, eventNumber});
+    const auto bytes = encodeDashboardDatagram(sender, {payload, {123, 4999}, 300, 2, EventFlag::none, eventNumber});
     return {bytes.begin(), bytes.end()};
   }
   void send(const std::string& bytes) {

@@ -66,7 +66,8 @@ TEST_F(BriskBackendTest, EveryFaultyBundleIsExplainedOnceAndEachEventLeavesALine
     log.clear();
     const auto backend = make(fresh, 7);
     ASSERT_NE(backend, nullptr) << reason;
-    for (int i = 0; i < 2; ++i) backend->sendMessage(nullptr, {}, 1, 1, 0);
+    Event event{.category = 1, .type = 1};
+    for (int i = 0; i < 2; ++i) backend->sendMessage(event);
     EXPECT_EQ(log.count(reason), 1U) << ::testing::PrintToString(log.lines());
     EXPECT_EQ(log.count("<3>BriskBackend(sendMessage): Brisk adaptor " + adaptor + kNotResponding), 2U);
     EXPECT_EQ(log.count("<3>"), 3U);

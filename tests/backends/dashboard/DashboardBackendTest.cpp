@@ -52,7 +52,8 @@ class DashboardBackendTest : public ::testing::Test {
     return backend;
   }
   static std::optional<std::string> send(DashboardBackend& backend, const SharedDictionary& payload = nullptr) {
-    return backend.sendMessage(payload, {123, 0}, 5, 6, 0);
+    Event event{payload, {123, 0}, 5, 6};
+    return backend.sendMessage(event);
   }
   // The next datagram taken apart.
   tagReportingPacket received() {

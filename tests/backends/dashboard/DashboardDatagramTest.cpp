@@ -15,36 +15,35 @@ std::string textOf(const std::vector<std::uint8_t>& datagram) {
 }
 
 std::vector<std::uint8_t> datagramOf(const Dictionary& payload) {
-  DashboardEvent event;
-  event.payload = &payload;
-  return encodeDashboardDatagram({}, event);
+  return encodeDashboardDatagram({}, {.payload = std::make_shared<const Dictionary>(payload)});
 }
 
 TEST(DashboardDatagram, EveryByteOfTheHeader) {
   const std::string udid = "0123456789abcdef0123456789abcdef01234567";
-  const Dictionary payload{{"b", "xyz"}, {"a", "q"}};
+  const auto payload = std::make_shared<const Dictionary>(Dictionary{{"b", "xyz"}, {"a", "q"}});
+  constexpr auto kNone = EventFlag::none;
   const struct {
     const char* what;
     DashboardSender sender;
-    DashboardEvent event;
+    Event event;
     std::string header;  // in hexadecimal: before the device identifier, that, behind it
     const char* line;
   } rows[] = {
       {"all fields",
        {8, 7, 1, 0, udid, 1},
-       {&payload, {123, 4999}, 0x0102, 0x0304, 0x0506},
+       {payload, {123, 4999}, 0x0102, 0x0304, kNone, 0x0506},
        "080701010000007bfffffffeffffffb501020304"
        "30313233343536373839616263646566303132333435363738396162636465663031323334353637"
        "05060001",
        "123.004 0123456789abcdef0123456789abcdef01234567 127.0.0.1 XF     0     1  1286   258   772  a=q b=xyz"},
       {"short device, explicit server, latest time",
        {255, 14, 0xffffffff, 0xffff, "D", 3},
-       {&payload, {-1, 999'999}, 65535, 0, 0},
+       {payload, {-1, 999'999}, 65535, 0, kNone, 0},
        "ff0e01f9ffffffff000000000000ffb5ffff000044" + std::string(78, '0') + "00000003",
        "4294967295.996 D 127.0.0.1 QB-ZIRL 65535 4294967295     0 65535     0  a=q b=xyz"},
       {"no such client type",
        {0, 256 + 19, 0, 0, "", 0},
-       {&payload, {0, 3999}, 0, 0, 9},
+       {payload, {0, 3999}, 0, 0, kNone, 9},
        "0013010000000000ffffffffffffffb500000000" + std::string(80, '0') + "00090000",
        "0.000  127.0.0.1      0     0     9     0     0  a=q b=xyz"},
   };
@@ -58,7 +57,7 @@ TEST(DashboardDatagram, EveryByteOfTheHeader) {
     ASSERT_TRUE(decoded) << decoded.error();
     EXPECT_EQ(decoded->header.sessionID(), row.sender.sessionID);
     EXPECT_EQ(decoded->header.deviceIDText(), row.sender.deviceID);
-    EXPECT_EQ(decoded->header.eventNumber, row.event.eventNumber);
+    EXPECT_EQ(decoded->header.eventNumber, row.event.number);
   }
   const std::string longer = udid + "89";
   DashboardSender longDevice;

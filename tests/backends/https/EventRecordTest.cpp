@@ -45,13 +45,7 @@ class EventRecordTest : public HTTPSFixture {
 
 TEST_F(EventRecordTest, EveryReservedKeyWithItsType) {
   const auto fields = fieldsOf(defaultIdentity());
-  EventRecord::Numbers numbers;
-  numbers.method = 3;
-  numbers.respCode = 4;
-  numbers.eventID = 65535;
-  numbers.timezoneOffset = -3600;
-  numbers.clientTS = fields->clientTS({1'700'000'000, 500'000});
-  EventRecord record(fields, nullptr, "root.own", numbers);
+  EventRecord record(fields, {nullptr, {1'700'000'000, 500'000}, 3, 4, EventFlag::none, 65535}, "root.own", -3600);
   record.prepare(nullptr, {});
   EXPECT_EQ(write(record, FieldWriter::Form::compact),
             "{\"_startTS\":1699999980,\"_sender\":\"ZK\",\"_clientVersion\":42,\"_productFamily\":\"Parva\","
@@ -93,7 +87,7 @@ TEST_F(EventRecordTest, ReservedKeysThatDependOnTheSession) {
   for (const auto& row : rows) {
     BackendIdentity identity = defaultIdentity();
     row.change(identity);
-    EventRecord record(fieldsOf(identity, row.internalBuild), nullptr, row.combined, {});
+    EventRecord record(fieldsOf(identity, row.internalBuild), {}, row.combined, 0);
     record.prepare(nullptr, {});
     const Dictionary event = parsed(write(record, FieldWriter::Form::compact));
     const Value* value = event.find(row.key);
@@ -116,7 +110,7 @@ TEST_F(EventRecordTest, JsonTypesOfPayloads) {
                                {"infinite", -std::numeric_limits<double>::infinity()},
                                {"nan", std::nan("")},
                                {"null", nullptr}});
-  EventRecord record(fieldsOf(defaultIdentity()), payload, "own", {});
+  EventRecord record(fieldsOf(defaultIdentity()), {.payload = payload}, "own", 0);
   record.prepare(nullptr, {});
   const std::string json = write(record, FieldWriter::Form::compact);
   EXPECT_NE(json.find("\"bool\":true,\"date\":12.5,\"huge\":18446744073709551615,\"int\":-5,\"never\":-1"),
@@ -177,12 +171,11 @@ TEST_F(EventRecordTest, EqualsTheStepwiseDictionary) {
     const SharedDictionary payload = random.chance(0.1) ? nullptr : shared(random.dictionary(12));
     const SharedDictionary userInfo = random.chance(0.2) ? nullptr : shared(random.dictionary(5));
     const std::optional<std::string> combined = random.chance(0.3) ? std::nullopt : std::optional<std::string>("own");
-    EventRecord::Numbers numbers;
-    numbers.method = static_cast<std::uint16_t>(random.upTo(4));
-    numbers.respCode = static_cast<std::uint16_t>(random.upTo(3));
-    numbers.clientTS = 1000.5;
+    Event event{payload, {1000, 500'000}};
+    event.category = static_cast<std::uint16_t>(random.upTo(4));
+    event.type = static_cast<std::uint16_t>(random.upTo(3));
     const EventFilters filters = random.filters();
-    EventRecord record(fields, payload, combined, numbers);
+    EventRecord record(fields, event, combined, 0);
     const auto layer = RecordLayer::of(userInfo);
     record.prepare(layer, filters);
 
@@ -194,10 +187,10 @@ TEST_F(EventRecordTest, EqualsTheStepwiseDictionary) {
     if (combined) flat.set("_sessionID", *combined);
     if (fields->numericSessionID) flat.set("_sessionID", *fields->numericSessionID);
     flat.merge({{"_eventNumber", 0},
-                {"_method", int{numbers.method}},
-                {"_status", int{numbers.respCode}},
-                {"_clientTS", numbers.clientTS},
-                {"eventTime", numbers.clientTS},
+                {"_method", int{event.category}},
+                {"_status", int{event.type}},
+                {"_clientTS", fields->clientTS(event.time)},
+                {"eventTime", fields->clientTS(event.time)},
                 {"_timezoneOffset", 0}});
     if (userInfo) flat.merge(*userInfo);
     filters.filterEvent(flat);
@@ -243,8 +236,8 @@ TEST_F(EventRecordTest, Message) {
   Array rules;
   for (const auto name : kReservedKeyNames) rules.emplace_back(Dictionary{{"key", name}, {"action", "remove"}});
   const auto filters = EventFilters::createFiltersFromArray(rules);
-  EventRecord record(fieldsOf(defaultIdentity()), shared({{"a", 1}}), "own", {});
-  EventRecord nothing(fieldsOf(defaultIdentity()), nullptr, "own", {});
+  EventRecord record(fieldsOf(defaultIdentity()), {.payload = shared({{"a", 1}})}, "own", 0);
+  EventRecord nothing(fieldsOf(defaultIdentity()), {}, "own", 0);
   record.prepare(nullptr, *filters);
   nothing.prepare(nullptr, *filters);
   EXPECT_EQ(nothing.category(), 0);

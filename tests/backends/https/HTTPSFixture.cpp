@@ -87,7 +87,8 @@ std::shared_ptr<HTTPSPostBackend> HTTPSFixture::makeBackend(const Setup& setup, 
 
 std::optional<std::string> HTTPSFixture::send(OrvantaBackend& backend, std::uint16_t method, std::int32_t flag,
                                               const SharedDictionary& payload, std::uint16_t respCode) {
-  return backend.sendMessage(payload, platform.clock.timeOfDay(), method, respCode, flag);
+  Event event{payload, platform.clock.timeOfDay(), method, respCode, static_cast<EventFlag>(flag)};
+  return backend.sendMessage(event);
 }
 
 FlushAnswer HTTPSFixture::flush(HTTPSPostBackend& backend) {

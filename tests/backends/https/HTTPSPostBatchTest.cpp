@@ -44,7 +44,7 @@ TEST_F(HTTPSPostBatchTest, ARelabellingReachesTheEventThatIsBeingMade) {
   OrvantaBackend backend(platform, "http_post", shared({}), "Parva");
   backend.setIdentity(defaultIdentity());
   const auto fields = SessionFields::of(backend, false);
-  const auto event = [&] { return EventRecord(fields, nullptr, "own", {}); };
+  const auto event = [&] { return EventRecord(fields, {}, "own", 0); };
   EventBatch batch;
   batch.append(event(), 1, 0, batch.labels());
   const std::uint64_t seen = batch.labels();

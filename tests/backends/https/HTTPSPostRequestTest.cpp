@@ -140,7 +140,8 @@ TEST_F(HTTPSPostRequestTest, ADroppedPostIsReported) {
     TestPlatform own;
     own.http.hold = true;
     const auto backend = makeBackend(batching(), own);
-    backend->sendMessage(nullptr, {}, 1, 1, 0);
+    Event event{.category = 1, .type = 1};
+    backend->sendMessage(event);
     backend->flushMessagesWithCompletion(pending.completion());
     ASSERT_TRUE(PendingPosts::of(own)->waitUntilHandedIn(kHangGuard));
     EXPECT_EQ(pending.answer->calls, 0);
