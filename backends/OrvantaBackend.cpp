@@ -7,7 +7,6 @@
 #include <cstdlib>
 #include <span>
 
-#include "config/Conversions.h"
 #include "platform/host/Digest.h"
 
 namespace orvanta {
@@ -27,12 +26,14 @@ bool holdsCategory(const std::vector<std::int32_t>& list, std::uint16_t category
 }  // namespace
 
 OrvantaBackend::OrvantaBackend(Platform& platform, std::string name, SharedDictionary profile,
-                               std::string productFamily)
+                               const BackendSetup& setup)
     : _platform(platform),
       _name(std::move(name)),
       _profile(std::move(profile)),
-      _productFamily(std::move(productFamily)),
-      _samplingFactor(nextSamplingDraw()) {}
+      _identity(setup.identity),
+      _samplingFactor(nextSamplingDraw()),
+      _batchEvents(setup.batchEvents),
+      _userInfoDict(setup.userInfo) {}
 
 OrvantaBackend::~OrvantaBackend() = default;
 
@@ -66,12 +67,6 @@ bool OrvantaBackend::isBlacklistedEvent(std::uint16_t category) const {
   return _eventBlacklist && holdsCategory(*_eventBlacklist, category);
 }
 
-void OrvantaBackend::setIdentity(BackendIdentity identity) {
-  _identity = std::move(identity);
-  _selfVersion = SelfVersion::parse(_identity.selfVersion);
-  _startTimeStamp = timevalToSeconds(_identity.startTimestamp);
-}
-
 std::optional<double> OrvantaBackend::samplingThreshold() const {
   const std::lock_guard lock(_mutex);
   return _samplingThreshold;
@@ -92,7 +87,7 @@ void OrvantaBackend::setCombinedSessionIDString(std::optional<std::string> combi
   _combinedSessionIDString.swap(combined);
 }
 
-OrvantaBackend::SelfVersion OrvantaBackend::SelfVersion::parse(std::string_view text) {
+SelfVersion SelfVersion::parse(std::string_view text) {
   std::array<std::uint8_t, 3> parts{};
   for (std::uint8_t& part : parts) {
     const std::size_t dot = text.find('.');
@@ -103,7 +98,7 @@ OrvantaBackend::SelfVersion OrvantaBackend::SelfVersion::parse(std::string_view 
   return {parts[0], parts[1], parts[2]};
 }
 
-std::string OrvantaBackend::SelfVersion::text() const {
+std::string SelfVersion::text() const {
   return minor == 0 ? fmt::format("{}.{}", major, middle) : fmt::format("{}.{}.{}", major, middle, minor);
 }
 

@@ -10,6 +10,7 @@
 #include <string_view>
 #include <vector>
 
+#include "backends/BackendSetup.h"
 #include "backends/Event.h"
 #include "config/DeviceInfo.h"
 #include "config/Platform.h"
@@ -28,35 +29,19 @@ enum BackendState : std::int32_t {
   kBackendSampledOut = 3,  // held
 };
 
-// Facts of the session and the device that every backend of a session shares. Set once, right after construction.
-struct BackendIdentity {
-  std::uint32_t sessionID = 0;
-  std::int32_t compType = 0;  // client type
-  std::uint16_t clientVersion = 0;
-  std::string udid;  // unique device identifier, at most 40 bytes; empty when the device reports none
-  std::optional<std::string> productVersion;
-  std::optional<std::string> buildVersion;
-  std::optional<std::string> hardwareType;  // product type
-  bool isInternal = false;
-  bool requireUserInfo = false;
-  std::string selfVersion;             // "major.middle.minor" of the client framework
-  platform::TimeValue startTimestamp;  // of the session
-};
-
 // Called exactly once: the text of what was flushed or none, and an error or none. Any thread, none of our locks held.
 using FlushCompletion = platform::UniqueFunction<void(std::optional<std::string>, std::optional<OrvantaError>)>;
 
 // One way to deliver a session's events. Every operation that a backend has no use for has a harmless default.
 //
-// Owned by its session (or by one one-off send), which calls everything on its own queue, one operation at a time, in
-// the order: factory, setIdentity, setBatchEvents, setUserInfoDict, then updateState, sends and flushes, at last
-// cleanup. Other sessions' threads may call state/setState, samplingThreshold/setSamplingThreshold,
+// Owned by its session (or by one one-off send), which calls everything on its own queue, one operation at a time, and
+// cleanup() last. Other sessions' threads may call state/setState, samplingThreshold/setSamplingThreshold,
 // setCorrelatedSessionID and combinedSessionIDString at any time meanwhile; HTTP threads may set the state. Kept by
 // shared_ptr because posts in flight hold weak references to it.
 class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
  public:
   // Draws the sampling factor: one draw per backend constructed, from the process's drand48 sequence.
-  OrvantaBackend(Platform& platform, std::string name, SharedDictionary profile, std::string productFamily);
+  OrvantaBackend(Platform& platform, std::string name, SharedDictionary profile, const BackendSetup& setup);
   virtual ~OrvantaBackend();
   OrvantaBackend(const OrvantaBackend&) = delete;
   OrvantaBackend& operator=(const OrvantaBackend&) = delete;
@@ -89,10 +74,8 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
 
   // --- Properties ---
 
-  void setIdentity(BackendIdentity identity);
   const BackendIdentity& identity() const { return _identity; }
   const std::string& name() const { return _name; }
-  const std::string& productFamily() const { return _productFamily; }
   const std::optional<std::string>& displayURL() const { return _displayURL; }
 
   std::int32_t state() const { return _state.load(std::memory_order_acquire); }
@@ -109,19 +92,7 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
   const SharedDictionary& userInfoDict() const { return _userInfoDict; }
   virtual void setUserInfoDict(SharedDictionary userInfo) { _userInfoDict = std::move(userInfo); }
 
-  // The three version bytes of "major.middle.minor": leading integers, cut to 8 bits, 0 when missing.
-  struct SelfVersion {
-    std::uint8_t major = 0;
-    std::uint8_t middle = 0;
-    std::uint8_t minor = 0;
-    auto operator<=>(const SelfVersion&) const =
-        default;  // NOLINT(modernize-use-nullptr): sees a 0 in what is generated
-    static SelfVersion parse(std::string_view text);
-    // "major.middle", and ".minor" unless that is 0.
-    std::string text() const;
-  };
-  SelfVersion selfVersion() const { return _selfVersion; }
-  double startTimeStamp() const { return _startTimeStamp; }
+  using SelfVersion = orvanta::SelfVersion;
 
   // 64 lower-case hexadecimal digits over the text's bytes.
   static std::string convertIntoSHA256(std::string_view text);
@@ -141,19 +112,16 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
 
  private:
   Platform& _platform;
-  // Constant after construction (the identity and sampling factor: after set-up).
+  // Constant after construction (the sampling factor and display URL: after set-up).
   const std::string _name;
   const SharedDictionary _profile;
-  const std::string _productFamily;
+  const BackendIdentity _identity;
   std::optional<std::string> _displayURL;
-  BackendIdentity _identity;
-  SelfVersion _selfVersion;
-  double _startTimeStamp = 0;
   double _samplingFactor = 0;
 
   // Session's queue only.
   std::uint16_t _eventID = 0;
-  bool _batchEvents = false;
+  bool _batchEvents;
   SharedDictionary _userInfoDict;
   std::optional<std::vector<std::int32_t>> _eventWhitelist;
   std::optional<std::vector<std::int32_t>> _eventBlacklist;

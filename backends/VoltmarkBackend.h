@@ -14,8 +14,8 @@ class VoltmarkBackend final : public OrvantaBackend {
  public:
   using OrvantaBackend::OrvantaBackend;
   static std::shared_ptr<VoltmarkBackend> create(Platform& platform, std::string name, SharedDictionary profile,
-                                                 std::string productFamily) {
-    return std::make_shared<VoltmarkBackend>(platform, std::move(name), std::move(profile), std::move(productFamily));
+                                                 const BackendSetup& setup) {
+    return std::make_shared<VoltmarkBackend>(platform, std::move(name), std::move(profile), setup);
   }
 
  protected:

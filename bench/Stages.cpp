@@ -80,17 +80,15 @@ struct Encoded {
 };
 
 Encoded benchEncode(test::TestPlatform& device) {
-  const auto profile = std::make_shared<const Dictionary>();
-  const auto backend = std::make_shared<OrvantaBackend>(device.get(), "http_post", profile, "Parva");
   BackendIdentity identity;
-  identity.compType = 5;
+  identity.clientType = 5;
+  identity.productFamily = "Parva";
   identity.productVersion = "12.5";
   identity.buildVersion = "12F5";
-  identity.hardwareType = "Parva3,2";
-  identity.selfVersion = "8.0.0";
+  identity.productType = "Parva3,2";
+  identity.selfVersion = {8, 0, 0};
   identity.startTimestamp = device.clock.timeOfDay();
-  backend->setIdentity(identity);
-  const auto fields = SessionFields::of(*backend, false);
+  const auto fields = SessionFields::of(identity, false);
   std::vector<SharedDictionary> payloads;
   for (std::uint32_t i = 0; i < kBodies * kBatch; ++i) {
     payloads.push_back(std::make_shared<const Dictionary>(samplePayload(i)));

@@ -11,22 +11,10 @@
 namespace orvanta {
 namespace {
 
-struct Arguments {
-  Platform& platform;
-  const std::string& name;
-  const SharedDictionary& profile;
-  const std::string& productFamily;
-  std::int32_t clientType;
-};
-
 template <class Backend>
-std::shared_ptr<OrvantaBackend> create(const Arguments& arguments) {
-  return Backend::create(arguments.platform, arguments.name, arguments.profile, arguments.productFamily);
-}
-
-std::shared_ptr<OrvantaBackend> createBrisk(const Arguments& arguments) {
-  return BriskBackend::create(arguments.platform, arguments.name, arguments.profile, arguments.productFamily,
-                              arguments.clientType);
+std::shared_ptr<OrvantaBackend> create(Platform& platform, const std::string& name, const SharedDictionary& profile,
+                                       const BackendSetup& setup) {
+  return Backend::create(platform, name, profile, setup);
 }
 
 // Desktop devices have no diagnostics adaptor.
@@ -37,25 +25,25 @@ bool supportsBrisk(Platform& platform) {
 struct BackendClass {
   std::string_view name;
   // Null where the device does not support the class.
-  std::shared_ptr<OrvantaBackend> (*create)(const Arguments& arguments);
+  std::shared_ptr<OrvantaBackend> (*create)(Platform& platform, const std::string& name,
+                                            const SharedDictionary& profile, const BackendSetup& setup);
   bool (*isSupported)(Platform& platform) = nullptr;  // null: everywhere
 };
 
 constexpr BackendClass kBackendClasses[] = {
     {kOrvantaBackendDashboard, create<DashboardBackend>}, {kOrvantaBackendUploadServer, create<UploadBackend>},
     {kOrvantaBackendHTTPPost, create<HTTPSPostBackend>},  {kOrvantaBackendHTTPPost2, create<HTTPSPostBackend>},
-    {kOrvantaBackendVoltmark, create<VoltmarkBackend>},   {kOrvantaBackendBrisk, createBrisk, supportsBrisk},
+    {kOrvantaBackendVoltmark, create<VoltmarkBackend>},   {kOrvantaBackendBrisk, create<BriskBackend>, supportsBrisk},
 };
 
 }  // namespace
 
 std::shared_ptr<OrvantaBackend> newBackendWithName(Platform& platform, const std::string& name,
-                                                   const SharedDictionary& profile, const std::string& productFamily,
-                                                   std::int32_t clientType) {
+                                                   const SharedDictionary& profile, const BackendSetup& setup) {
   for (const BackendClass& row : kBackendClasses) {
     if (row.name != name) continue;
     if (row.isSupported != nullptr && !row.isSupported(platform)) break;
-    if (auto backend = row.create({platform, name, profile, productFamily, clientType})) return backend;
+    if (auto backend = row.create(platform, name, profile, setup)) return backend;
     break;
   }
   ORVANTA_LOG(error, "OrvantaBackend(newBackendWithName): {}", name);

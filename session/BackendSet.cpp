@@ -22,31 +22,30 @@ std::optional<BackendSet> createBackends(Platform& platform, const SharedDiction
 
   const SessionInfoRecord info = SessionInfoRecord::read(*sessionInfo);
   const auto& device = platform.device();
-  const std::string productFamily = device.deviceName().value_or("");
 
-  BackendIdentity identity;
+  BackendSetup setup;
+  BackendIdentity& identity = setup.identity;
   identity.startTimestamp = platform.clock().timeOfDay();
   identity.sessionID = info.sessionID;
-  identity.compType = info.clientType;
+  identity.clientType = info.clientType;
   identity.clientVersion = info.clientVersion;
-  identity.udid = std::string(deviceIDText(deviceID));
+  identity.deviceID = std::string(deviceIDText(deviceID));
+  identity.productFamily = device.deviceName().value_or("");
   identity.productVersion = device.productVersion();
   identity.buildVersion = device.buildVersion();
-  identity.hardwareType = device.productType();
+  identity.productType = device.productType();
   identity.isInternal = isInternalBuild(platform);
   identity.requireUserInfo = info.requireUserInfo;
-  identity.selfVersion = Orvanta::of(platform).bundleVersion();
+  identity.selfVersion = SelfVersion::parse(Orvanta::of(platform).bundleVersion());
+  setup.batchEvents = info.batchEvent;
+  setup.userInfo = userInfo;
 
   BackendSet backends;
   for (const auto& [key, value] : *storebag) {
     // The profile stays inside the storebag, which lives as long as any backend made from it.
     const SharedDictionary profile(storebag, value.dictionary());
-    auto backend = newBackendWithName(platform, key, profile, productFamily, info.clientType);
-    if (!backend) continue;
-    backend->setIdentity(identity);
-    backend->setBatchEvents(info.batchEvent);
-    backend->setUserInfoDict(userInfo);
-    backends.add(key, std::move(backend));
+    auto backend = newBackendWithName(platform, key, profile, setup);
+    if (backend) backends.add(key, std::move(backend));
   }
   return backends;
 }

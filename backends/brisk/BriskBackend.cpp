@@ -7,9 +7,9 @@
 namespace orvanta {
 
 std::shared_ptr<BriskBackend> BriskBackend::create(Platform& platform, std::string name, SharedDictionary profile,
-                                                   std::string productFamily, std::int32_t clientType) {
-  auto backend =
-      std::make_shared<BriskBackend>(Made{}, platform, std::move(name), std::move(profile), std::move(productFamily));
+                                                   const BackendSetup& setup) {
+  const std::int32_t clientType = setup.identity.clientType;
+  auto backend = std::make_shared<BriskBackend>(Made{}, platform, std::move(name), std::move(profile), setup);
   ORVANTA_LOG(info, "BriskBackend(initWithName): Loading Brisk adaptor class for client type {}", clientType);
   if (!isClientTypeAllowed(clientType)) {
     ORVANTA_LOG(error, "BriskBackend(initWithName): No matching bundle found for client type {}", clientType);
@@ -19,14 +19,9 @@ std::shared_ptr<BriskBackend> BriskBackend::create(Platform& platform, std::stri
   return backend;
 }
 
-std::shared_ptr<BriskBackend> BriskBackend::create(Platform& platform, std::string name, SharedDictionary profile,
-                                                   std::string productFamily) {
-  return create(platform, std::move(name), std::move(profile), std::move(productFamily), 0);
-}
-
 BriskBackend::BriskBackend(Made, Platform& platform, std::string name, SharedDictionary profile,
-                           std::string productFamily)
-    : OrvantaBackend(platform, std::move(name), std::move(profile), std::move(productFamily)) {}
+                           const BackendSetup& setup)
+    : OrvantaBackend(platform, std::move(name), std::move(profile), setup) {}
 
 // The client types whose configuration is "confluo".
 bool BriskBackend::isClientTypeAllowed(std::int32_t clientType) {

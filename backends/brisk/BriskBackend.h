@@ -17,11 +17,8 @@ class BriskBackend final : public OrvantaBackend {
  public:
   // Null, with a log line, for client types that have no adaptor.
   static std::shared_ptr<BriskBackend> create(Platform& platform, std::string name, SharedDictionary profile,
-                                              std::string productFamily, std::int32_t clientType);
-  // Client type 0: always null.
-  static std::shared_ptr<BriskBackend> create(Platform& platform, std::string name, SharedDictionary profile,
-                                              std::string productFamily);
-  BriskBackend(Made, Platform& platform, std::string name, SharedDictionary profile, std::string productFamily);
+                                              const BackendSetup& setup);
+  BriskBackend(Made, Platform& platform, std::string name, SharedDictionary profile, const BackendSetup& setup);
 
   static bool isClientTypeAllowed(std::int32_t clientType);
 

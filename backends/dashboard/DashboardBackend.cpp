@@ -80,26 +80,26 @@ class DashboardBackend::HandOver {
 // --- Set-up ---
 
 std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, std::string name,
-                                                           SharedDictionary profile, std::string productFamily) {
+                                                           SharedDictionary profile, const BackendSetup& setup) {
   const Value* ip = valueAt(profile, "ip");
   const Value* port = valueAt(profile, "port");
   std::optional<std::string> serverIP;
   if (ip != nullptr) serverIP = ip->description();
   return create(platform, std::move(name), std::move(profile), std::move(serverIP),
-                port == nullptr ? std::uint16_t{0} : portOf(*port), std::move(productFamily));
+                port == nullptr ? std::uint16_t{0} : portOf(*port), setup);
 }
 
 std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, std::string name,
                                                            std::optional<std::string> serverIP,
-                                                           std::uint16_t serverPort, std::string productFamily) {
+                                                           std::uint16_t serverPort, const BackendSetup& setup) {
   if (!serverIP) return nullptr;
-  return create(platform, std::move(name), nullptr, std::move(serverIP), serverPort, std::move(productFamily));
+  return create(platform, std::move(name), nullptr, std::move(serverIP), serverPort, setup);
 }
 
 std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, std::string name,
                                                            SharedDictionary profile,
                                                            std::optional<std::string> serverIP,
-                                                           std::uint16_t serverPort, std::string productFamily) {
+                                                           std::uint16_t serverPort, const BackendSetup& setup) {
   if (profile) {
     const Value* ip = valueAt(profile, "ip");
     if (ip == nullptr) {
@@ -119,15 +119,15 @@ std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, s
     ORVANTA_LOG(error, "DashboardBackend(initWithName): socket() failed ({})", error);
     return nullptr;
   }
-  auto backend = std::make_shared<DashboardBackend>(Made{}, platform, std::move(name), std::move(profile),
-                                                    std::move(productFamily), std::move(socket));
+  auto backend = std::make_shared<DashboardBackend>(Made{}, platform, std::move(name), std::move(profile), setup,
+                                                    std::move(socket));
   if (!backend->setUp(serverIP, serverPort)) return nullptr;
   return backend;
 }
 
 DashboardBackend::DashboardBackend(Made, Platform& platform, std::string name, SharedDictionary profile,
-                                   std::string productFamily, platform::UdpSocket socket)
-    : OrvantaBackend(platform, std::move(name), std::move(profile), std::move(productFamily)),
+                                   const BackendSetup& setup, platform::UdpSocket socket)
+    : OrvantaBackend(platform, std::move(name), std::move(profile), setup),
       _handOver(HandOver::of(platform)),
       _networkProcQueue(platform.pool().makeQueue()),
       _socket(std::move(socket)) {}
@@ -194,11 +194,11 @@ std::shared_ptr<DashboardBackend> DashboardBackend::self() {
 
 std::optional<std::string> DashboardBackend::sendNumbered(const Event& event) {
   DashboardSender sender;
-  sender.versionMajor = selfVersion().major;
-  sender.clientType = identity().compType;
+  sender.versionMajor = identity().selfVersion.major;
+  sender.clientType = identity().clientType;
   sender.sessionID = identity().sessionID;
   sender.clientVersion = identity().clientVersion;
-  sender.deviceID = identity().udid;
+  sender.deviceID = identity().deviceID;
   sender.mode = static_cast<std::uint16_t>((_reliableUDP ? tagReportingPacketHeader::kModeAcknowledged : 0) |
                                            (_usingProfile ? 0 : tagReportingPacketHeader::kModeExplicitServer));
   std::vector<std::uint8_t> datagram;

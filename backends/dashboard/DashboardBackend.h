@@ -30,15 +30,12 @@ class DashboardBackend final : public OrvantaBackend {
  public:
   // With a profile: its "ip" and "port" name the server. Null when something is missing or fails, with a log line.
   static std::shared_ptr<DashboardBackend> create(Platform& platform, std::string name, SharedDictionary profile,
-                                                  std::string productFamily);
-  // The server address counts only without a profile; delivery is then acknowledged.
-  static std::shared_ptr<DashboardBackend> create(Platform& platform, std::string name, SharedDictionary profile,
-                                                  std::optional<std::string> serverIP, std::uint16_t serverPort,
-                                                  std::string productFamily);
+                                                  const BackendSetup& setup);
+  // Without one; delivery is then acknowledged.
   static std::shared_ptr<DashboardBackend> create(Platform& platform, std::string name,
                                                   std::optional<std::string> serverIP, std::uint16_t serverPort,
-                                                  std::string productFamily);
-  DashboardBackend(Made, Platform& platform, std::string name, SharedDictionary profile, std::string productFamily,
+                                                  const BackendSetup& setup);
+  DashboardBackend(Made, Platform& platform, std::string name, SharedDictionary profile, const BackendSetup& setup,
                    platform::UdpSocket socket);
   ~DashboardBackend() override;
 
@@ -64,6 +61,11 @@ class DashboardBackend final : public OrvantaBackend {
 
  private:
   class HandOver;
+
+  // The server address counts only without a profile.
+  static std::shared_ptr<DashboardBackend> create(Platform& platform, std::string name, SharedDictionary profile,
+                                                  std::optional<std::string> serverIP, std::uint16_t serverPort,
+                                                  const BackendSetup& setup);
 
   bool setUp(const std::optional<std::string>& serverIP, std::uint16_t serverPort);
   void useReliableUDP();

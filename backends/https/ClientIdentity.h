@@ -25,8 +25,8 @@ class ClientIdentity {
   void setExtrasOnInternal(std::int32_t extras) { _extrasOnInternal = extras; }
 
   // The identifier of the next message. An internal device's own identifier stands in only where there is one.
-  const std::string& choose(bool isInternal, const std::string& udid) const {
-    if (_extrasOnInternal != 0 && isInternal && !udid.empty()) return udid;
+  const std::string& choose(bool isInternal, const std::string& deviceID) const {
+    if (_extrasOnInternal != 0 && isInternal && !deviceID.empty()) return deviceID;
     if (!_uuidCustom.empty()) return _uuidCustom;
     return _dnuType != kConsentRespected ? _uuidOverrideDnu : _uuidRespectDnu;
   }

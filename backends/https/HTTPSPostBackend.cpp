@@ -35,23 +35,24 @@ bool forcesEventLogging(Platform& platform) {
 }  // namespace
 
 std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::create(Platform& platform, std::string name,
-                                                           SharedDictionary profile, std::string productFamily) {
-  if (!profile || productFamily.empty()) return nullptr;
+                                                           SharedDictionary profile, const BackendSetup& setup) {
+  if (!profile || setup.identity.productFamily.empty()) return nullptr;
   if (clientSections(*profile) == nullptr) {
     ORVANTA_LOG(error, "HTTPSPostBackend(initWithName): can't find the client list.");
     return nullptr;
   }
-  return std::shared_ptr<HTTPSPostBackend>(
-      new HTTPSPostBackend(platform, std::move(name), std::move(profile), std::move(productFamily)));
+  return std::shared_ptr<HTTPSPostBackend>(new HTTPSPostBackend(platform, std::move(name), std::move(profile), setup));
 }
 
 HTTPSPostBackend::HTTPSPostBackend(Platform& platform, std::string name, SharedDictionary profile,
-                                   std::string productFamily)
-    : OrvantaBackend(platform, std::move(name), std::move(profile), std::move(productFamily)),
+                                   const BackendSetup& setup)
+    : OrvantaBackend(platform, std::move(name), std::move(profile), setup),
       _dnuEnabled(platform.device().diagnosticsSubmissionAllowed()),
       _forceEventLogging(forcesEventLogging(platform)),
+      _sessionFields(SessionFields::of(setup.identity, isInternalBuild(platform))),
       _clientIdentity{Orvanta::of(platform).getPersistentIdentifierForDNU(true),
                       Orvanta::of(platform).getPersistentIdentifierForDNU(false)},
+      _userInfo(RecordLayer::of(setup.userInfo)),
       _realtimePostURL(userDefaultStringForKey(platform, kRealtimePostURLKey)),
       _postURL(userDefaultStringForKey(platform, kPostURLKey)) {
   if (_postURL) {
@@ -113,7 +114,6 @@ SharedDictionary HTTPSPostBackend::sessionEndPayload(const SharedDictionary& pay
 }
 
 HTTPSPostBackend::PreparedEvent HTTPSPostBackend::newEventDict(Event event) {
-  if (!_sessionFields) _sessionFields = SessionFields::of(*this, isInternalBuild(platform()));
   std::uint64_t labelsSeen = 0;
   {
     // Before the identifier is read, so that a relabelling in between is taken for one that the record missed.
@@ -263,7 +263,7 @@ std::vector<OutgoingEvent> HTTPSPostBackend::outgoingEvents(const EventBatch::Ev
 
 PostMessage HTTPSPostBackend::buildMessage(std::span<const OutgoingEvent> events) const {
   const double postTime = timevalToSeconds(platform().clock().timeOfDay());
-  return createMessageForPostAndLogging(postTime, _clientIdentity.choose(identity().isInternal, identity().udid),
+  return createMessageForPostAndLogging(postTime, _clientIdentity.choose(identity().isInternal, identity().deviceID),
                                         events, showsMessages());
 }
 

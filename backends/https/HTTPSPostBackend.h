@@ -32,7 +32,7 @@ class HTTPSPostBackend final : public OrvantaBackend {
  public:
   // Null when there is no profile, no product family or (logged) no client list in the profile.
   static std::shared_ptr<HTTPSPostBackend> create(Platform& platform, std::string name, SharedDictionary profile,
-                                                  std::string productFamily);
+                                                  const BackendSetup& setup);
 
   void updateState() override;
   std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion) override;
@@ -51,7 +51,7 @@ class HTTPSPostBackend final : public OrvantaBackend {
   std::optional<std::string> sendNumbered(const Event& event) override;
 
  private:
-  HTTPSPostBackend(Platform& platform, std::string name, SharedDictionary profile, std::string productFamily);
+  HTTPSPostBackend(Platform& platform, std::string name, SharedDictionary profile, const BackendSetup& setup);
 
   // HTTPSPostConfiguration.cpp
   std::int32_t updateBackendState();
@@ -84,6 +84,7 @@ class HTTPSPostBackend final : public OrvantaBackend {
   // Constant after construction.
   const bool _dnuEnabled;         // the user's consent to diagnostics submission
   const bool _forceEventLogging;  // show people what is posted, on development and internal environments
+  const std::shared_ptr<const SessionFields> _sessionFields;
 
   // Session's queue only.
   ClientIdentity _clientIdentity;
@@ -92,9 +93,8 @@ class HTTPSPostBackend final : public OrvantaBackend {
   std::optional<double> _overrideSampling;
   bool _immutable = false;  // the state is frozen: people have been shown what was sent
   std::optional<ReportingReason> _reason;
-  std::shared_ptr<const RecordLayer> _userInfo;         // of userInfoDict
-  std::shared_ptr<const SessionFields> _sessionFields;  // made with the first event
-  std::shared_ptr<PostQueue> _postQueue;                // made with the first post
+  std::shared_ptr<const RecordLayer> _userInfo;  // of userInfoDict
+  std::shared_ptr<PostQueue> _postQueue;         // made with the first post
   std::optional<std::string> _realtimePostURL;
   bool _useDefaultPostURL = false;  // the URL is a user default and stays, as the other one
   bool _useDefaultRealtimePostURL = false;

@@ -53,11 +53,11 @@ ReportingFacts HTTPSPostBackend::gatherFacts() const {
   facts.serviceName = userInfoText(userInfoDict(), kOrvantaUserInfoServiceName);
   facts.requireUserInfo = identity().requireUserInfo;
   facts.hasUserInfo = userInfoDict() != nullptr;
-  facts.ownVersion = selfVersion();
+  facts.ownVersion = identity().selfVersion;
   facts.consent = _dnuEnabled;
   facts.countryCode = platform().device().countryCode();
-  facts.productFamily = productFamily();
-  facts.productModel = identity().hardwareType;
+  facts.productFamily = identity().productFamily;
+  facts.productType = identity().productType;
   facts.samplingFactor = samplingFactor();
   facts.postURLFixed = _useDefaultPostURL && postURL().has_value();
   return facts;

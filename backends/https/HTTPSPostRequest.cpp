@@ -37,10 +37,10 @@ std::vector<platform::HttpHeader> HTTPSPostBackend::postHeaders(const Event* eve
   }
   if (facts.isInternal) headers.push_back({"X-ORV-Internal-Build", "1"});
   headers.push_back(
-      {"User-Agent", fmt::format("Orvanta/{} ({}; {})", selfVersion().text(), facts.hardwareType.value_or("(null)"),
+      {"User-Agent", fmt::format("Orvanta/{} ({}; {})", facts.selfVersion.text(), facts.productType.value_or("(null)"),
                                  facts.productVersion.value_or("(null)"))});
   headers.push_back({"X-ORV-Client-Version", std::to_string(facts.clientVersion)});
-  headers.push_back({"X-ORV-Sender", std::string(senderCodeForClientType(facts.compType))});
+  headers.push_back({"X-ORV-Sender", std::string(senderCodeForClientType(facts.clientType))});
   if (event != nullptr) {
     headers.push_back({"X-ORV-Event-Map", fmt::format("{} {}", event->category, event->type)});
   }

@@ -98,8 +98,8 @@ bool passesTests(ReportingDecision& decision, const Dictionary& section, const R
   if (!matchStringWithList(textsUnder(section, "device_whitelist"), facts.productFamily, true)) {
     return refuseByList(reason, ReportingTest::familyNotListed, section, "device_whitelist", facts.productFamily);
   }
-  if (matchStringWithList(textsUnder(section, "device_blacklist"), facts.productModel, false)) {
-    return refuseByList(reason, ReportingTest::modelBlacklisted, section, "device_blacklist", facts.productModel);
+  if (matchStringWithList(textsUnder(section, "device_blacklist"), facts.productType, false)) {
+    return refuseByList(reason, ReportingTest::modelBlacklisted, section, "device_blacklist", facts.productType);
   }
   const Value* filters = section.find("filters");
   reason.test = ReportingTest::filtersMissing;

@@ -22,7 +22,7 @@ struct ReportingFacts {
   bool consent = false;  // the user's, to diagnostics submission
   std::optional<std::string> countryCode;
   std::string productFamily;
-  std::optional<std::string> productModel;
+  std::optional<std::string> productType;
   double samplingFactor = 0;
   bool postURLFixed = false;  // by a user default, so that no section supplies it
 };

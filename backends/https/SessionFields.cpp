@@ -18,20 +18,19 @@ Value valueOrNull(const std::optional<std::string>& text) {
 
 }  // namespace
 
-std::shared_ptr<const SessionFields> SessionFields::of(const OrvantaBackend& backend, bool internalBuild) {
-  const BackendIdentity& identity = backend.identity();
+std::shared_ptr<const SessionFields> SessionFields::of(const BackendIdentity& identity, bool internalBuild) {
   auto fields = std::make_shared<SessionFields>();
-  fields->startTimeStamp = backend.startTimeStamp();
+  fields->startTimeStamp = timevalToSeconds(identity.startTimestamp);
   fields->startTS = roundDownToMinute(static_cast<std::int32_t>(fields->startTimeStamp));
-  fields->sender = senderCodeForClientType(identity.compType);
+  fields->sender = senderCodeForClientType(identity.clientType);
   fields->clientVersion = identity.clientVersion;
-  fields->productFamily = backend.productFamily();
-  fields->productModel = identity.hardwareType;
+  fields->productFamily = identity.productFamily;
+  fields->productModel = identity.productType;
   fields->osVersion = identity.productVersion;
   fields->build = identity.buildVersion;
   fields->internal = internalBuild ? 3 : 2;
-  fields->reportVers = backend.selfVersion().text();
-  if (reportsNumericSessionID(identity.compType, identity.isInternal)) fields->numericSessionID = identity.sessionID;
+  fields->reportVers = identity.selfVersion.text();
+  if (reportsNumericSessionID(identity.clientType, identity.isInternal)) fields->numericSessionID = identity.sessionID;
 
   FieldWriter writer(fields->json, FieldWriter::Form::compact);
   for (std::size_t i = 0; i <= static_cast<std::size_t>(ReservedKey::reportVers); ++i) {

@@ -5,7 +5,7 @@
 #include <optional>
 #include <string>
 
-#include "backends/OrvantaBackend.h"
+#include "backends/BackendSetup.h"
 #include "backends/https/ReservedKeys.h"
 #include "interface/Values.h"
 
@@ -14,8 +14,7 @@ namespace orvanta {
 // The reserved fields that are the same in every event of a session, and their JSON, written once. Immutable; shared by
 // the records of the session, which outlive their backend in no case but tests.
 struct SessionFields {
-  // From the identity that the session gave the backend. `internalBuild`: the device runs one.
-  static std::shared_ptr<const SessionFields> of(const OrvantaBackend& backend, bool internalBuild);
+  static std::shared_ptr<const SessionFields> of(const BackendIdentity& identity, bool internalBuild);
 
   std::int64_t startTS = 0;  // whole minutes
   std::string sender;

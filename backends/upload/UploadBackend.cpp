@@ -45,21 +45,20 @@ std::optional<std::string> compressedContent(const platform::ExtensionHandle& ha
 }  // namespace
 
 std::shared_ptr<UploadBackend> UploadBackend::create(Platform& platform, std::string name, SharedDictionary profile,
-                                                     std::string productFamily) {
+                                                     const BackendSetup& setup) {
   std::optional<std::string> url = textAt(profile, "post_url");
   if (!url) {
     ORVANTA_LOG(error, "UploadBackend(initWithName): can't resolve upload post URL.");
     return nullptr;
   }
-  auto backend =
-      std::make_shared<UploadBackend>(Made{}, platform, std::move(name), std::move(profile), std::move(productFamily));
+  auto backend = std::make_shared<UploadBackend>(Made{}, platform, std::move(name), std::move(profile), setup);
   backend->setUploadURL(std::move(url));
   return backend;
 }
 
 UploadBackend::UploadBackend(Made, Platform& platform, std::string name, SharedDictionary profile,
-                             std::string productFamily)
-    : OrvantaBackend(platform, std::move(name), std::move(profile), std::move(productFamily)) {
+                             const BackendSetup& setup)
+    : OrvantaBackend(platform, std::move(name), std::move(profile), setup) {
   setDisplayURL(textAt(this->profile(), "display_url"));
 }
 
@@ -115,7 +114,7 @@ std::optional<platform::HttpRequest> UploadBackend::makeRequest(const std::strin
                                                                 std::string body) const {
   platform::HttpRequest request;
   request.method = "POST";
-  request.url = fileUploadURL(uploadURL, identity().udid, identity().sessionID, file.path);
+  request.url = fileUploadURL(uploadURL, identity().deviceID, identity().sessionID, file.path);
   if (!isValidURL(request.url)) {
     ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): Unable to create URL request");
     return std::nullopt;

@@ -19,8 +19,8 @@ class UploadBackend final : public OrvantaBackend {
  public:
   // Null, with a log line, when the profile has no "post_url".
   static std::shared_ptr<UploadBackend> create(Platform& platform, std::string name, SharedDictionary profile,
-                                               std::string productFamily);
-  UploadBackend(Made, Platform& platform, std::string name, SharedDictionary profile, std::string productFamily);
+                                               const BackendSetup& setup);
+  UploadBackend(Made, Platform& platform, std::string name, SharedDictionary profile, const BackendSetup& setup);
 
   // Whether the request was made, whatever came of it. A file above UploadBudget::kMaximumFileBytes is refused.
   bool uploadFileAtPath(const UploadFile& file) override;

@@ -13,8 +13,6 @@
 namespace orvanta::test {
 namespace {
 
-using SelfVersion = OrvantaBackend::SelfVersion;
-
 TEST(SelfVersion, Parse) {
   const std::pair<const char*, SelfVersion> rows[] = {
       {"2.10.300", {2, 10, 44}}, {"7", {7, 0, 0}},         {"", {0, 0, 0}},    {"1.2.3.4", {1, 2, 3}},
@@ -39,7 +37,7 @@ class OrvantaBackendTest : public HTTPSFixture {
 };
 
 TEST_F(OrvantaBackendTest, EventNumbersWrap) {
-  Recorder backend(platform, "x", shared({}), "Parva");
+  Recorder backend(platform, "x", shared({}), {});
   for (int i = 1; i <= 65536; ++i) {
     EXPECT_EQ(send(backend, 1), "sent");
     ASSERT_EQ(backend.last, i % 65536);
@@ -48,7 +46,7 @@ TEST_F(OrvantaBackendTest, EventNumbersWrap) {
 
 TEST_F(OrvantaBackendTest, Lists) {
   using List = std::vector<std::int32_t>;
-  Recorder backend(platform, "x", shared({}), "Parva");
+  Recorder backend(platform, "x", shared({}), {});
   EXPECT_TRUE(backend.isWhitelistedEvent(12) && !backend.isBlacklistedEvent(12)) << "no list";
   backend.setEventWhitelist(List{});
   backend.setEventBlacklist(List{});
@@ -74,16 +72,18 @@ std::array<unsigned short, 3> generatorState() {
 TEST_F(OrvantaBackendTest, EachBackendDrawsOnceFromTheGenerator) {
   const LogCapture log;
   auto state = generatorState();
+  BackendSetup setup;
+  setup.identity.productFamily = "Parva";
   for (int i = 0; i < 3; ++i) {
     // These construct nothing and so draw nothing.
-    EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", nullptr, "Parva"), nullptr);
-    EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", shared({{"clients", "Mail"}}), "Parva"), nullptr);
-    EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", shared(profileOf({})), ""), nullptr);
+    EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", nullptr, setup), nullptr);
+    EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", shared({{"clients", "Mail"}}), setup), nullptr);
+    EXPECT_EQ(HTTPSPostBackend::create(platform, "http_post", shared(profileOf({})), {}), nullptr);
     // This one is constructed before it is refused.
     ::erand48(state.data());
-    EXPECT_EQ(BriskBackend::create(platform, "brisk", nullptr, "Parva", 6), nullptr);
+    EXPECT_EQ(BriskBackend::create(platform, "brisk", nullptr, setup), nullptr);
     const double expected = ::erand48(state.data());
-    const auto backend = HTTPSPostBackend::create(platform, "http_post", shared(profileOf({})), "Parva");
+    const auto backend = HTTPSPostBackend::create(platform, "http_post", shared(profileOf({})), setup);
     EXPECT_EQ(backend->samplingFactor(), expected);
     EXPECT_TRUE(expected >= 0 && expected < 1);
   }

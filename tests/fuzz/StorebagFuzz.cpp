@@ -34,14 +34,14 @@ struct World {
 
 void evaluate(Platform& platform, const Value& profile) {
   if (profile.dictionary() == nullptr) return;
-  const auto backend = HTTPSPostBackend::create(platform, "http_post",
-                                                std::make_shared<const Dictionary>(*profile.dictionary()), "Parva");
+  BackendSetup setup;
+  setup.identity.clientType = 5;
+  setup.identity.productFamily = "Parva";
+  setup.identity.requireUserInfo = true;
+  setup.identity.selfVersion = SelfVersion::parse("8.0.0");
+  const auto backend =
+      HTTPSPostBackend::create(platform, "http_post", std::make_shared<const Dictionary>(*profile.dictionary()), setup);
   if (!backend) return;
-  BackendIdentity identity;
-  identity.compType = 5;
-  identity.requireUserInfo = true;
-  identity.selfVersion = "8.0.0";
-  backend->setIdentity(std::move(identity));
   backend->updateState();
   REQUIRE(backend->state() == kBackendWaiting);
   backend->setUserInfoDict(std::make_shared<const Dictionary>(Dictionary{{"clientName", "c"}, {"serviceName", "s"}}));

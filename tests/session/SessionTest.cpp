@@ -59,7 +59,7 @@ TEST_F(SessionSetupTest, BackendsGetTheSessionsAndTheDevicesFacts) {
   ASSERT_NE(backend, nullptr);
   const auto& identity = backend->identity();
   EXPECT_EQ(identity.sessionID, 4'000'000'000U);
-  EXPECT_EQ(identity.compType, 9);
+  EXPECT_EQ(identity.clientType, 9);
   EXPECT_EQ(identity.clientVersion, 0x2345);
   EXPECT_TRUE(identity.isInternal && identity.requireUserInfo && backend->batchEvents());
   EXPECT_EQ(backend->combinedSessionIDString(), session->sessionIDString());

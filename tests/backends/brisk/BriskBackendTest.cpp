@@ -28,7 +28,9 @@ class BriskBackendTest : public ::testing::Test {
     }
   }
   static std::shared_ptr<BriskBackend> make(test::TestPlatform& on, std::int32_t clientType) {
-    return BriskBackend::create(on, "brisk", nullptr, "Parva", clientType);
+    BackendSetup setup;
+    setup.identity.clientType = clientType;
+    return BriskBackend::create(on, "brisk", nullptr, setup);
   }
 
   test::TestPlatform platform;
@@ -44,7 +46,6 @@ TEST_F(BriskBackendTest, RefusesOtherClientTypes) {
                                "<6>BriskBackend(initWithName): Loading Brisk adaptor class for client type " + number,
                                "<3>BriskBackend(initWithName): No matching bundle found for client type " + number}));
   }
-  EXPECT_EQ(BriskBackend::create(platform, "brisk", nullptr, "Parva"), nullptr);
 }
 
 TEST_F(BriskBackendTest, EveryFaultyBundleIsExplainedOnceAndEachEventLeavesALine) {

@@ -42,14 +42,12 @@ class DashboardBackendTest : public ::testing::Test {
   }
   Backend make(const std::optional<Dictionary>& content) {
     const auto shared = content ? std::make_shared<const Dictionary>(*content) : nullptr;
-    auto backend = DashboardBackend::create(platform, "dashboard", shared, "Parva");
-    BackendIdentity identity;
-    identity.sessionID = 1;
-    identity.compType = 7;
-    identity.udid = "D";
-    identity.selfVersion = "8.0";
-    if (backend) backend->setIdentity(std::move(identity));
-    return backend;
+    BackendSetup setup;
+    setup.identity.sessionID = 1;
+    setup.identity.clientType = 7;
+    setup.identity.deviceID = "D";
+    setup.identity.selfVersion = {8, 0, 0};
+    return DashboardBackend::create(platform, "dashboard", shared, setup);
   }
   static std::optional<std::string> send(DashboardBackend& backend, const SharedDictionary& payload = nullptr) {
     Event event{payload, {123, 0}, 5, 6};
@@ -95,7 +93,7 @@ TEST_F(DashboardBackendTest, SetUpFailuresLeaveOneLineAndNoSocket) {
   refuses(Dictionary{{"ip", "127.0.0.1"}}, "can't resolve server port");
   refuses(Dictionary{{"ip", "localhost"}, {"port", 1}}, "socket connect() failed.");
   refuses(Dictionary{{"ip", "127.0.0.1 and more"}, {"port", 1}, {"reliable", 5}}, "socket connect() failed.");
-  EXPECT_EQ(DashboardBackend::create(platform, "dashboard", std::nullopt, 1, "Parva"), nullptr);
+  EXPECT_EQ(DashboardBackend::create(platform, "dashboard", std::nullopt, 1, {}), nullptr);
   EXPECT_EQ(openSockets(), before);
 
   rlimit limit{};
@@ -139,7 +137,7 @@ TEST_F(DashboardBackendTest, SendsEachEventAndReturnsItsLine) {
   const auto reliable = make(profile({{"reliable", 60'000}}));
   send(*reliable);
   EXPECT_EQ(received().header.mode, 1);
-  auto explicitServer = DashboardBackend::create(platform, "dashboard", "127.0.0.1", server.port(), "Parva");
+  auto explicitServer = DashboardBackend::create(platform, "dashboard", "127.0.0.1", server.port(), {});
   send(*explicitServer);
   EXPECT_EQ(received().header.mode, 3);
   EXPECT_TRUE(DashboardBackend::waitUntilSent(platform, test::kHangGuard));

@@ -19,7 +19,7 @@ std::vector<std::uint8_t> datagramOf(const Dictionary& payload) {
 }
 
 TEST(DashboardDatagram, EveryByteOfTheHeader) {
-  const std::string udid = "0123456789abcdef0123456789abcdef01234567";
+  const std::string deviceID = "0123456789abcdef0123456789abcdef01234567";
   const auto payload = std::make_shared<const Dictionary>(Dictionary{{"b", "xyz"}, {"a", "q"}});
   constexpr auto kNone = EventFlag::none;
   const struct {
@@ -30,7 +30,7 @@ TEST(DashboardDatagram, EveryByteOfTheHeader) {
     const char* line;
   } rows[] = {
       {"all fields",
-       {8, 7, 1, 0, udid, 1},
+       {8, 7, 1, 0, deviceID, 1},
        {payload, {123, 4999}, 0x0102, 0x0304, kNone, 0x0506},
        "080701010000007bfffffffeffffffb501020304"
        "30313233343536373839616263646566303132333435363738396162636465663031323334353637"
@@ -59,14 +59,14 @@ TEST(DashboardDatagram, EveryByteOfTheHeader) {
     EXPECT_EQ(decoded->header.deviceIDText(), row.sender.deviceID);
     EXPECT_EQ(decoded->header.eventNumber, row.event.number);
   }
-  const std::string longer = udid + "89";
+  const std::string longer = deviceID + "89";
   DashboardSender longDevice;
   longDevice.deviceID = longer;
   const auto bare = encodeDashboardDatagram(longDevice, {});
   EXPECT_EQ(bare.size(), 64U);
   const auto decoded = decodeDashboardDatagram(bare);
   EXPECT_EQ(decoded->header.lengthComplement, 0xffbf);
-  EXPECT_EQ(decoded->header.deviceIDText(), udid);
+  EXPECT_EQ(decoded->header.deviceIDText(), deviceID);
 }
 
 TEST(DashboardDatagram, Text) {

@@ -20,10 +20,8 @@ constexpr const char* kRemovedLine =
 
 class EventRecordTest : public HTTPSFixture {
  protected:
-  std::shared_ptr<const SessionFields> fieldsOf(const BackendIdentity& identity, bool internalBuild = false) {
-    OrvantaBackend backend(platform, "http_post", shared({}), "Parva");
-    backend.setIdentity(identity);
-    return SessionFields::of(backend, internalBuild);
+  static std::shared_ptr<const SessionFields> fieldsOf(const BackendIdentity& identity, bool internalBuild = false) {
+    return SessionFields::of(identity, internalBuild);
   }
   static Dictionary parsed(const std::string& json) {
     auto value = platform::parseJson(json);
@@ -58,7 +56,7 @@ TEST_F(EventRecordTest, ReservedKeysThatDependOnTheSession) {
   using Identity = BackendIdentity;
   const auto type = [](int clientType, bool isInternal = false, std::uint32_t sessionID = 77) {
     return [=](Identity& identity) {
-      identity.compType = clientType;
+      identity.clientType = clientType;
       identity.isInternal = isInternal;
       identity.sessionID = sessionID;
     };
@@ -81,7 +79,7 @@ TEST_F(EventRecordTest, ReservedKeysThatDependOnTheSession) {
       {"largest number", type(7, false, 4'294'967'295U), "_sessionID", 4'294'967'295U},
       {"type 15", type(15), "_sender", "QB-JOVEX"},
       {"internal build", same, "_internal", 3, "a", true},
-      {"no model", [](Identity& i) { i.hardwareType.reset(); }, "_productModel", nullptr},
+      {"no model", [](Identity& i) { i.productType.reset(); }, "_productModel", nullptr},
       {"start within a minute", [](Identity& i) { i.startTimestamp.seconds = 1'000'059; }, "_startTS", 1'000'020},
   };
   for (const auto& row : rows) {
@@ -166,7 +164,7 @@ TEST_F(EventRecordTest, EqualsTheStepwiseDictionary) {
     RandomRecords random{std::mt19937(seed)};
     BackendIdentity identity = defaultIdentity();
     if (random.chance(0.3)) identity.productVersion.reset();
-    if (random.chance(0.3)) identity.compType = 7;
+    if (random.chance(0.3)) identity.clientType = 7;
     const auto fields = fieldsOf(identity);
     const SharedDictionary payload = random.chance(0.1) ? nullptr : shared(random.dictionary(12));
     const SharedDictionary userInfo = random.chance(0.2) ? nullptr : shared(random.dictionary(5));

@@ -62,23 +62,22 @@ HTTPSFixture::Setup HTTPSFixture::requiring(const Dictionary& more, bool batches
 BackendIdentity HTTPSFixture::defaultIdentity() {
   BackendIdentity identity;
   identity.sessionID = 77;
-  identity.compType = 5;
+  identity.clientType = 5;
   identity.clientVersion = 42;
-  identity.udid = "0123456789abcdef0123456789abcdef01234567";
+  identity.deviceID = "0123456789abcdef0123456789abcdef01234567";
+  identity.productFamily = "Parva";
   identity.productVersion = "12.5";
   identity.buildVersion = "12F5";
-  identity.hardwareType = "Parva3,2";
-  identity.selfVersion = "8.0.0";
+  identity.productType = "Parva3,2";
+  identity.selfVersion = {8, 0, 0};
   identity.startTimestamp = {1'699'999'990, 250'000};
   return identity;
 }
 
 std::shared_ptr<HTTPSPostBackend> HTTPSFixture::makeBackend(const Setup& setup, TestPlatform& on) {
-  auto backend = HTTPSPostBackend::create(on, setup.name, shared(setup.profile), "Parva");
+  auto backend = HTTPSPostBackend::create(on, setup.name, shared(setup.profile),
+                                          {setup.identity, setup.batchEvents, setup.userInfo});
   if (!backend) return nullptr;
-  backend->setIdentity(setup.identity);
-  backend->setBatchEvents(setup.batchEvents);
-  backend->setUserInfoDict(setup.userInfo);
   backend->setSamplingFactor(setup.samplingFactor);
   backend->setCombinedSessionIDString("own");
   if (setup.evaluate) backend->updateState();

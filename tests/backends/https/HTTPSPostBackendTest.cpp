@@ -9,11 +9,13 @@ namespace {
 
 class HTTPSPostBackendTest : public HTTPSFixture {
  protected:
-  // Whether an evaluation that would wait for user info changes nothing.
+  // One that shows what it posts, or does not.
+  static Setup showing(bool shown, bool batches = true) {
+    return requiring({{"override_dnu", shown ? 0 : 1}}, batches);
+  }
+  // Returns whether an evaluation that would wait for user info changes nothing.
   static bool isFrozen(HTTPSPostBackend& backend) {
-    BackendIdentity waiting = defaultIdentity();
-    waiting.requireUserInfo = true;
-    backend.setIdentity(waiting);
+    backend.setUserInfoDict(nullptr);
     backend.updateState();
     return backend.state() != kBackendWaiting;
   }
@@ -179,15 +181,14 @@ TEST_F(HTTPSPostBackendTest, WhoIsShownWhatWasSent) {
 }
 
 TEST_F(HTTPSPostBackendTest, OnlyAShownFlushFreezesTheState) {
+  platform.device.consent = true;
   for (const bool shown : {true, false}) {
-    platform.device.consent = shown;
-    const auto flushed = makeBackend(batching());
+    const auto flushed = makeBackend(showing(shown));
     send(*flushed, 1);
     EXPECT_EQ(flush(*flushed).text.has_value(), shown);
     EXPECT_EQ(isFrozen(*flushed), shown);
   }
-  platform.device.consent = true;
-  const auto forced = makeBackend(batching());
+  const auto forced = makeBackend(showing(true));
   send(*forced, 1);
   send(*forced, 2, 1);
   EXPECT_TRUE(isFrozen(*forced));
@@ -196,7 +197,7 @@ TEST_F(HTTPSPostBackendTest, OnlyAShownFlushFreezesTheState) {
   forced->updateState();
   EXPECT_EQ(forced->state(), kBackendDisabled);
 
-  const auto direct = makeBackend({});
+  const auto direct = makeBackend(showing(true, false));
   ASSERT_TRUE(send(*direct, 1)) << "shown, but no flush";
   EXPECT_FALSE(isFrozen(*direct));
   settle();

@@ -41,9 +41,7 @@ TEST_F(HTTPSPostBatchTest, AFlushThatSendsBeginsEveryCountAnew) {
 
 // A relabelling between the moment when an event reads its identifier and the moment when it is batched.
 TEST_F(HTTPSPostBatchTest, ARelabellingReachesTheEventThatIsBeingMade) {
-  OrvantaBackend backend(platform, "http_post", shared({}), "Parva");
-  backend.setIdentity(defaultIdentity());
-  const auto fields = SessionFields::of(backend, false);
+  const auto fields = SessionFields::of(defaultIdentity(), false);
   const auto event = [&] { return EventRecord(fields, {}, "own", 0); };
   EventBatch batch;
   batch.append(event(), 1, 0, batch.labels());
@@ -140,7 +138,7 @@ TEST_F(HTTPSPostBatchTest, Correlation) {
 
   // Numbers give way in waiting events and return in later ones; user info that names the key has the last word.
   Setup setup = batching();
-  setup.identity.compType = 7;
+  setup.identity.clientType = 7;
   const auto numeric = makeBackend(setup);
   send(*numeric, 1);
   numeric->setCorrelatedSessionID("b");

@@ -136,7 +136,7 @@ TEST_F(HTTPSPostConfigurationTest, ClientIdentifiers) {
     setup.identity.isInternal = row.isInternal;
     send(*makeBackend(setup), 1);
     EXPECT_EQ(*envelopeOf(requests().at(0)).find("clientId")->string(),
-              row.key.empty() ? setup.identity.udid : platform.get().defaults().text(row.key).value_or("(none)"))
+              row.key.empty() ? setup.identity.deviceID : platform.get().defaults().text(row.key).value_or("(none)"))
         << row.what;
   }
 }

@@ -31,7 +31,7 @@ class HTTPSPostRequestTest : public HTTPSFixture {
 TEST_F(HTTPSPostRequestTest, HeadersInTheirOrder) {
   Setup setup;
   setup.identity.isInternal = true;
-  setup.identity.selfVersion = "4.2.1";
+  setup.identity.selfVersion = {4, 2, 1};
   setup.userInfo = shared({{"clientName", "Mail"}, {"serviceName", 17}, {"other", "x"}});
   send(*makeBackend(setup), 65535, 0, nullptr, 1);
   const HttpRequest request = requests().at(0);
@@ -47,7 +47,7 @@ TEST_F(HTTPSPostRequestTest, HeadersInTheirOrder) {
                        "Content-Length: " + std::to_string(request.body.size()), "Content-Encoding: gzip"}));
 
   setup = {};
-  setup.identity.hardwareType.reset();
+  setup.identity.productType.reset();
   setup.userInfo = shared({{"clientName", Array{"Mail"}}});
   send(*makeBackend(setup), 1);
   const HttpRequest bare = requests().at(1);

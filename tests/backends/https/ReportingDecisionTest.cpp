@@ -34,7 +34,7 @@ ReportingDecision decide(Array clients, const Change& change = {}) {
   facts.consent = true;
   facts.countryCode = "DE";
   facts.productFamily = "Parva";
-  facts.productModel = "xABCy";
+  facts.productType = "xABCy";
   facts.samplingFactor = 0.2;
   if (change) change(facts);
   return evaluate({{"clients", std::move(clients)}}, facts);
@@ -73,7 +73,7 @@ const Change noClient = [](auto& facts) { facts.clientName.reset(); };
 const Change noService = [](auto& facts) { facts.serviceName.reset(); };
 const Change noConsent = [](auto& facts) { facts.consent = false; };
 const Change noCountry = [](auto& facts) { facts.countryCode.reset(); };
-const Change noModel = [](auto& facts) { facts.productModel.reset(); };
+const Change noModel = [](auto& facts) { facts.productType.reset(); };
 const Change notRequired = [](auto& facts) { facts.requireUserInfo = facts.consent = false; };
 const Change noUserInfo = [](auto& facts) { facts.hasUserInfo = false; };
 Change draw(double factor) {

@@ -46,13 +46,12 @@ class UploadBackendTest : public ::testing::Test {
   UploadBackendTest() { make("http://up.example/u"); }
 
   void make(const std::string& url) {
+    BackendSetup setup;
+    setup.identity.sessionID = 7;
+    setup.identity.deviceID = "D";
     backend = UploadBackend::create(
         platform, "upload_server",
-        std::make_shared<const Dictionary>(Dictionary{{"post_url", url}, {"display_url", "http://show"}}), "Parva");
-    BackendIdentity identity;
-    identity.sessionID = 7;
-    identity.udid = "D";
-    backend->setIdentity(std::move(identity));
+        std::make_shared<const Dictionary>(Dictionary{{"post_url", url}, {"display_url", "http://show"}}), setup);
   }
   bool upload(const std::string& path, int descriptor) {
     return backend->uploadFileAtPath({path, "token", descriptor, [this] { ++removals; }});
@@ -164,7 +163,7 @@ TEST_F(UploadBackendTest, RequestsThatCannotBeMade) {
 
   for (const auto& profile : {SharedDictionary(), std::make_shared<const Dictionary>(),
                               std::make_shared<const Dictionary>(Dictionary{{"post_url", 1}})}) {
-    EXPECT_EQ(UploadBackend::create(platform, "upload_server", profile, "Parva"), nullptr);
+    EXPECT_EQ(UploadBackend::create(platform, "upload_server", profile, {}), nullptr);
   }
   EXPECT_EQ(log.count("<3>UploadBackend(initWithName): can't resolve upload post URL."), 3U);
 }
