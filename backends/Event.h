@@ -27,8 +27,8 @@ constexpr bool isPromoting(EventFlag flag) {
 // `category` and `type` are what the backends' described operations and datagrams call `method` and `respCode`, and
 // filters and the JSON of events `method` and `status`.
 struct Event {
-  SharedDictionary payload;  // may be null
-  platform::TimeValue time;  // when the daemon took it
+  SharedDictionary payload = nullptr;
+  platform::TimeValue time = {};  // when the daemon took it
   std::uint16_t category = 0;
   std::uint16_t type = 0;
   EventFlag flag = EventFlag::none;

@@ -23,10 +23,10 @@ namespace orvanta {
 
 // Whether and how a backend reports.
 enum BackendState : std::int32_t {
-  kBackendWaiting = 0,  // for user info
-  kBackendDisabled = 1,
-  kBackendEnabled = 2,
-  kBackendSampledOut = 3,  // held
+  kBackendWaiting = 0,   // batches its events until there is user info to decide by
+  kBackendDisabled = 1,  // drops them
+  kBackendEnabled = 2,   // sends or batches them
+  kBackendHeld = 3,      // batches them; a promoting one turns it to enabled
 };
 
 // Called exactly once: the text of what was flushed or none, and an error or none. Any thread, none of our locks held.
@@ -78,8 +78,8 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
   const std::string& name() const { return _name; }
   const std::optional<std::string>& displayURL() const { return _displayURL; }
 
-  std::int32_t state() const { return _state.load(std::memory_order_acquire); }
-  virtual void setState(std::int32_t state) { _state.store(state, std::memory_order_release); }
+  BackendState state() const { return _state.load(std::memory_order_acquire); }
+  void setState(BackendState state) { _state.store(state, std::memory_order_release); }
   double samplingFactor() const { return _samplingFactor; }
   void setSamplingFactor(double factor) { _samplingFactor = factor; }  // before the first evaluation
   std::optional<double> samplingThreshold() const;
@@ -107,7 +107,7 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
   void setEventWhitelist(std::optional<std::vector<std::int32_t>> list) { _eventWhitelist = std::move(list); }
   void setEventBlacklist(std::optional<std::vector<std::int32_t>> list) { _eventBlacklist = std::move(list); }
   // For subclasses whose rules are compare-exchange.
-  std::atomic<std::int32_t>& stateCell() { return _state; }
+  std::atomic<BackendState>& stateCell() { return _state; }
   std::mutex& mutex() const { return _mutex; }
 
  private:
@@ -127,7 +127,7 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
   std::optional<std::vector<std::int32_t>> _eventBlacklist;
 
   // Any thread.
-  std::atomic<std::int32_t> _state{kBackendWaiting};
+  std::atomic<BackendState> _state{kBackendWaiting};
   mutable std::mutex _mutex;                            // the backend's one lock; subclasses use it too
   std::optional<double> _samplingThreshold;             // guarded by _mutex
   std::optional<std::string> _combinedSessionIDString;  // guarded by _mutex

@@ -151,7 +151,7 @@ void OrvantadSession::syncReportingStates() {
       }
       continue;
     }
-    if (backend->state() == kBackendSampledOut) continue;
+    if (backend->state() == kBackendHeld) continue;
     const auto* parents = parent->_backends ? parent->_backends->find(key) : nullptr;
     if (parents == nullptr) {
       backend->setState(kBackendDisabled);
@@ -162,7 +162,7 @@ void OrvantadSession::syncReportingStates() {
     backend->setState(state);
     backend->setSamplingThreshold(threshold);
     ORVANTA_LOG(debug, "HTTPSPostBackend(syncReportingStates): {}: state and sampling rate updated to {}, {:.02f}%",
-                backend->name(), state, static_cast<float>(threshold.value_or(0)));
+                backend->name(), int{state}, static_cast<float>(threshold.value_or(0)));
   }
 }
 
@@ -171,7 +171,7 @@ BackendNames OrvantadSession::fetchReportingStates() const {
   std::vector<std::string> names;
   for (const auto& [key, backend] : *_backends) {
     const auto state = backend->state();
-    if (state == kBackendEnabled || state == kBackendSampledOut) names.push_back(backend->name());
+    if (state == kBackendEnabled || state == kBackendHeld) names.push_back(backend->name());
   }
   return names;
 }

@@ -2,6 +2,7 @@
 
 #include <utility>
 
+#include "config/ClientTypes.h"
 #include "interface/OrvantaLogging.h"
 
 namespace orvanta {
@@ -23,9 +24,8 @@ BriskBackend::BriskBackend(Made, Platform& platform, std::string name, SharedDic
                            const BackendSetup& setup)
     : OrvantaBackend(platform, std::move(name), std::move(profile), setup) {}
 
-// The client types whose configuration is "confluo".
 bool BriskBackend::isClientTypeAllowed(std::int32_t clientType) {
-  return clientType == 7 || clientType == 11 || clientType == 13;
+  return clientType == kClientTypeXF || clientType == kClientTypeZJ || clientType == kClientTypeZEPHQ;
 }
 
 std::optional<std::string> BriskBackend::sendNumbered(const Event& event) {

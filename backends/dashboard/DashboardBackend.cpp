@@ -199,8 +199,8 @@ std::optional<std::string> DashboardBackend::sendNumbered(const Event& event) {
   sender.sessionID = identity().sessionID;
   sender.clientVersion = identity().clientVersion;
   sender.deviceID = identity().deviceID;
-  sender.mode = static_cast<std::uint16_t>((_reliableUDP ? tagReportingPacketHeader::kModeAcknowledged : 0) |
-                                           (_usingProfile ? 0 : tagReportingPacketHeader::kModeExplicitServer));
+  sender.mode = static_cast<std::uint16_t>((_reliableUDP ? DashboardHeader::kModeAcknowledged : 0) |
+                                           (_usingProfile ? 0 : DashboardHeader::kModeExplicitServer));
   std::vector<std::uint8_t> datagram;
   try {
     datagram = encodeDashboardDatagram(sender, event);

@@ -55,7 +55,7 @@ class HeaderReader {
   const std::uint8_t* _from;
 };
 
-void writeHeader(const tagReportingPacketHeader& header, std::uint8_t* to) {
+void writeHeader(const DashboardHeader& header, std::uint8_t* to) {
   HeaderWriter writer(to);
   writer.u8(header.versionMajor);
   writer.u8(header.clientType);
@@ -72,9 +72,9 @@ void writeHeader(const tagReportingPacketHeader& header, std::uint8_t* to) {
   writer.u16(header.mode);
 }
 
-tagReportingPacketHeader readHeader(const std::uint8_t* from) {
+DashboardHeader readHeader(const std::uint8_t* from) {
   HeaderReader reader(from);
-  tagReportingPacketHeader header;
+  DashboardHeader header;
   header.versionMajor = reader.u8();
   header.clientType = reader.u8();
   header.marker = reader.u8();
@@ -171,7 +171,7 @@ std::size_t writeText(const Dictionary& payload, std::uint8_t* to) {
 
 }  // namespace
 
-std::string_view tagReportingPacketHeader::deviceIDText() const {
+std::string_view DashboardHeader::deviceIDText() const {
   const auto end = std::find(deviceID.begin(), deviceID.end(), '\0');
   return {deviceID.data(), static_cast<std::size_t>(end - deviceID.begin())};
 }
@@ -182,7 +182,7 @@ std::vector<std::uint8_t> encodeDashboardDatagram(const DashboardSender& sender,
       !event.payload ? 0 : writeText(*event.payload, datagram.data() + kDashboardHeaderBytes);
   const std::size_t length = kDashboardHeaderBytes + textLength;
 
-  tagReportingPacketHeader header;
+  DashboardHeader header;
   header.versionMajor = sender.versionMajor;
   header.clientType = static_cast<std::uint8_t>(sender.clientType);
   header.timeQuarterMs = static_cast<std::uint8_t>(event.time.microseconds / 4000);
@@ -200,12 +200,12 @@ std::vector<std::uint8_t> encodeDashboardDatagram(const DashboardSender& sender,
   return {datagram.data(), datagram.data() + length};
 }
 
-Result<tagReportingPacket> decodeDashboardDatagram(std::span<const std::uint8_t> datagram) {
+Result<DashboardPacket> decodeDashboardDatagram(std::span<const std::uint8_t> datagram) {
   if (datagram.size() < kDashboardHeaderBytes) {
     return Failure{
         fmt::format("the datagram has {} bytes, its header alone takes {}", datagram.size(), kDashboardHeaderBytes)};
   }
-  tagReportingPacket packet{readHeader(datagram.data()), {}};
+  DashboardPacket packet{readHeader(datagram.data()), {}};
   if (packet.header.marker != 1) return Failure{fmt::format("the marker is {} instead of 1", packet.header.marker)};
   if (packet.header.length() != datagram.size()) {
     return Failure{
@@ -242,7 +242,7 @@ std::vector<std::pair<std::string, std::string>> parseDashboardText(std::string_
 
 std::optional<std::string> writeLocalLog(std::span<const std::uint8_t> datagram) {
   if (datagram.size() < kDashboardHeaderBytes) return std::nullopt;
-  const tagReportingPacketHeader header = readHeader(datagram.data());
+  const DashboardHeader header = readHeader(datagram.data());
   const std::string_view text(reinterpret_cast<const char*>(datagram.data()) + kDashboardHeaderBytes,
                               datagram.size() - kDashboardHeaderBytes);
   std::string line;

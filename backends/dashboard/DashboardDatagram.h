@@ -23,7 +23,7 @@ inline constexpr std::size_t kDashboardMaximumLogLine = 1151;
 inline constexpr std::size_t kDashboardEventNumberOffset = 60;  // in a datagram and in its acknowledgement
 
 // The header's fields in host order; on the wire they follow each other big-endian, without gaps.
-struct tagReportingPacketHeader {
+struct DashboardHeader {
   static constexpr std::uint16_t kModeAcknowledged = 1;    // the server is to acknowledge
   static constexpr std::uint16_t kModeExplicitServer = 2;  // the server's address came from no profile
 
@@ -47,8 +47,8 @@ struct tagReportingPacketHeader {
   std::string_view deviceIDText() const;  // up to the first zero
 };
 
-struct tagReportingPacket {
-  tagReportingPacketHeader header;
+struct DashboardPacket {
+  DashboardHeader header;
   std::string text;
 };
 
@@ -68,7 +68,7 @@ struct DashboardSender {
 std::vector<std::uint8_t> encodeDashboardDatagram(const DashboardSender& sender, const Event& event);
 
 // A failure says what is wrong: shorter than a header, another marker, a length that is not the datagram's.
-Result<tagReportingPacket> decodeDashboardDatagram(std::span<const std::uint8_t> datagram);
+Result<DashboardPacket> decodeDashboardDatagram(std::span<const std::uint8_t> datagram);
 
 // The pairs of a datagram's text, unescaped, for keys without spaces and "=". What a cut left of a pair before its "="
 // cannot be told from the end of the value before it.

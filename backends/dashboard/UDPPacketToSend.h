@@ -16,7 +16,7 @@ struct UDPPacketToSend {
   UDPPacketToSend(std::vector<std::uint8_t> bytes, std::uint16_t eventNum)
       : eventNumber(eventNum), data(std::move(bytes)) {}
 
-  std::int32_t state = kUnsent;
+  State state = kUnsent;
   std::int32_t numberOfChecks = 0;       // timer ticks since the last transmission
   std::int32_t numberOfRetransmits = 0;  // 0 to 4
   std::uint16_t eventNumber;

@@ -19,8 +19,8 @@ class ClientIdentity {
   ClientIdentity(std::string respectDnu, std::string overrideDnu)
       : _uuidRespectDnu(std::move(respectDnu)), _uuidOverrideDnu(std::move(overrideDnu)) {}
 
-  std::int32_t dnuType() const { return _dnuType; }
-  void setDnuType(std::int32_t type) { _dnuType = type; }
+  DnuType dnuType() const { return _dnuType; }
+  void setDnuType(DnuType type) { _dnuType = type; }
   void setUuidCustom(std::string uuid) { _uuidCustom = std::move(uuid); }
   void setExtrasOnInternal(std::int32_t extras) { _extrasOnInternal = extras; }
 
@@ -35,7 +35,7 @@ class ClientIdentity {
   const std::string _uuidRespectDnu;
   const std::string _uuidOverrideDnu;
   std::string _uuidCustom;  // empty: none
-  std::int32_t _dnuType = kConsentRespected;
+  DnuType _dnuType = kConsentRespected;
   std::int32_t _extrasOnInternal = 0;
 };
 

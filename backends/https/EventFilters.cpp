@@ -40,33 +40,33 @@ Result<EventFilters> EventFilters::createFiltersFromArray(const Array& definitio
     const auto refuse = [&](std::string_view why) { return Failure{fmt::format("filter {} {}", i, why)}; };
     const Dictionary* definition = definitions[i].dictionary();
     if (definition == nullptr) return refuse("is no dictionary");
-    filterTag tag;
-    if (!readNumber(*definition, "method", tag.method)) return refuse("has a \"method\" that is no number");
-    if (!readNumber(*definition, "status", tag.status)) return refuse("has a \"status\" that is no number");
+    FilterRule rule;
+    if (!readNumber(*definition, "method", rule.method)) return refuse("has a \"method\" that is no number");
+    if (!readNumber(*definition, "status", rule.status)) return refuse("has a \"status\" that is no number");
     if (const Value* key = definition->find("key")) {
       if (key->string() == nullptr) return refuse("has a \"key\" that is no text");
-      tag.key = *key->string();
+      rule.key = *key->string();
     }
     if (const Value* action = definition->find("action"); action != nullptr && action->string() != nullptr) {
-      if (*action->string() == "remove") tag.action = filterTag::kRemove;
-      if (*action->string() == "sha256") tag.action = filterTag::kSHA256;
+      if (*action->string() == "remove") rule.action = FilterRule::Action::remove;
+      if (*action->string() == "sha256") rule.action = FilterRule::Action::sha256;
     }
-    if (tag.key) {
+    if (rule.key) {
       // Letters beyond ASCII may change their length with their case.
-      made._keyBits |= isAscii(*tag.key) ? bitOf(*tag.key) : ~std::uint64_t{0};
+      made._keyBits |= isAscii(*rule.key) ? bitOf(*rule.key) : ~std::uint64_t{0};
       made._namesReservedKey |= std::any_of(kReservedKeyNames.begin(), kReservedKeyNames.end(),
-                                            [&](std::string_view name) { return equalsIgnoringCase(name, *tag.key); });
+                                            [&](std::string_view name) { return equalsIgnoringCase(name, *rule.key); });
     }
-    made._filters.push_back(std::move(tag));
+    made._filters.push_back(std::move(rule));
   }
   return made;
 }
 
-const filterTag* EventFilters::search(std::string_view key, std::int32_t method, std::int32_t status) const {
-  for (const filterTag& tag : _filters) {
-    if (tag.method >= 0 && tag.method != method) continue;
-    if (tag.status >= 0 && tag.status != status) continue;
-    if (tag.key && equalsIgnoringCase(*tag.key, key)) return &tag;
+const FilterRule* EventFilters::search(std::string_view key, std::int32_t method, std::int32_t status) const {
+  for (const FilterRule& rule : _filters) {
+    if (rule.method >= 0 && rule.method != method) continue;
+    if (rule.status >= 0 && rule.status != status) continue;
+    if (rule.key && equalsIgnoringCase(*rule.key, key)) return &rule;
   }
   return nullptr;
 }
@@ -78,11 +78,11 @@ void EventFilters::filterEvent(Dictionary& event) const {
   std::vector<Dictionary::Entry> kept;
   kept.reserve(event.size());
   for (auto& [key, value] : event) {
-    const filterTag* tag = find(key, method, status);
-    const std::int32_t action = tag == nullptr ? filterTag::kNone : tag->action;
-    if (action == filterTag::kNone) {
+    const FilterRule* rule = find(key, method, status);
+    const FilterRule::Action action = rule == nullptr ? FilterRule::Action::none : rule->action;
+    if (action == FilterRule::Action::none) {
       kept.emplace_back(key, std::move(value));
-    } else if (auto digest = action == filterTag::kSHA256 ? digestOf(value) : std::nullopt) {
+    } else if (auto digest = action == FilterRule::Action::sha256 ? digestOf(value) : std::nullopt) {
       kept.emplace_back(key, std::move(*digest));
     }
   }

@@ -11,11 +11,11 @@
 namespace orvanta {
 
 // One rule: what happens to the field of that name in events of that category and type.
-struct filterTag {
-  enum Action : std::int32_t { kNone = 0, kRemove = 1, kSHA256 = 2 };
+struct FilterRule {
+  enum class Action { none, remove, sha256 };
   std::int32_t method = -1;  // category; negative: any
   std::int32_t status = -1;  // type; negative: any
-  std::int32_t action = kNone;
+  Action action = Action::none;
   std::optional<std::string> key;  // compared without case; none: never matches
 };
 
@@ -28,12 +28,11 @@ class EventFilters {
   static Result<EventFilters> createFiltersFromArray(const Array& definitions);
 
   bool empty() const { return _filters.empty(); }
-  const std::vector<filterTag>& table() const { return _filters; }
   // Whether some rule may name one of the reserved keys.
   bool namesReservedKey() const { return _namesReservedKey; }
 
   // The first rule, in table order, for that field of an event of that category and type; null when there is none.
-  const filterTag* find(std::string_view key, std::int32_t method, std::int32_t status) const {
+  const FilterRule* find(std::string_view key, std::int32_t method, std::int32_t status) const {
     return (_keyBits & bitOf(key)) == 0 ? nullptr : search(key, method, status);
   }
 
@@ -47,9 +46,9 @@ class EventFilters {
     const auto first = key.empty() ? 0U : static_cast<unsigned char>(key.front()) | 0x20U;
     return std::uint64_t{1} << ((key.size() * 7U + first) % 64U);
   }
-  const filterTag* search(std::string_view key, std::int32_t method, std::int32_t status) const;
+  const FilterRule* search(std::string_view key, std::int32_t method, std::int32_t status) const;
 
-  std::vector<filterTag> _filters;
+  std::vector<FilterRule> _filters;
   std::uint64_t _keyBits = 0;
   bool _namesReservedKey = false;
 };

@@ -93,29 +93,29 @@ Value EventRecord::ownValue(ReservedKey key) const {
 void EventRecord::applyFilters(const EventFilters& filters) {
   const std::int32_t method = visibleNumber(ReservedKey::method);
   const std::int32_t status = visibleNumber(ReservedKey::status);
-  const auto apply = [&](std::string_view key, const filterTag* tag, const Value& value) {
-    if (tag->action == filterTag::kRemove) _changes.push_back({key, std::nullopt});
-    if (tag->action == filterTag::kSHA256) _changes.push_back({key, digestOf(value)});
+  const auto apply = [&](std::string_view key, const FilterRule* rule, const Value& value) {
+    if (rule->action == FilterRule::Action::remove) _changes.push_back({key, std::nullopt});
+    if (rule->action == FilterRule::Action::sha256) _changes.push_back({key, digestOf(value)});
   };
   ReservedKeys hidden = 0;
   if (_userInfo) {
     hidden = _userInfo->reservedKeys();
     for (const auto& [key, value] : _userInfo->entries()) {
-      if (const auto* tag = filters.find(key, method, status)) apply(key, tag, value);
+      if (const auto* rule = filters.find(key, method, status)) apply(key, rule, value);
     }
   }
   if (filters.namesReservedKey()) {
     for (std::size_t i = 0; i < kReservedKeyCount; ++i) {
       const auto key = static_cast<ReservedKey>(i);
       if ((_present & ~hidden & setOf(key)) == 0) continue;
-      if (const auto* tag = filters.find(nameOf(key), method, status)) apply(nameOf(key), tag, ownValue(key));
+      if (const auto* rule = filters.find(nameOf(key), method, status)) apply(nameOf(key), rule, ownValue(key));
     }
   }
   hidden |= _present;
   for (const auto& [key, value] : orEmpty(_event.payload)) {
-    const auto* tag = filters.find(key, method, status);
-    if (tag == nullptr || (reservedKeyNamed(key) & hidden) != 0) continue;
-    if (!_userInfo || !_userInfo->holds(key)) apply(key, tag, value);
+    const auto* rule = filters.find(key, method, status);
+    if (rule == nullptr || (reservedKeyNamed(key) & hidden) != 0) continue;
+    if (!_userInfo || !_userInfo->holds(key)) apply(key, rule, value);
   }
   std::sort(_changes.begin(), _changes.end(), [](const Change& a, const Change& b) { return a.key < b.key; });
 }

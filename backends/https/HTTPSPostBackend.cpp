@@ -47,7 +47,7 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::create(Platform& platform, s
 HTTPSPostBackend::HTTPSPostBackend(Platform& platform, std::string name, SharedDictionary profile,
                                    const BackendSetup& setup)
     : OrvantaBackend(platform, std::move(name), std::move(profile), setup),
-      _dnuEnabled(platform.device().diagnosticsSubmissionAllowed()),
+      _consentGiven(platform.device().diagnosticsSubmissionAllowed()),
       _forceEventLogging(forcesEventLogging(platform)),
       _sessionFields(SessionFields::of(setup.identity, isInternalBuild(platform))),
       _clientIdentity{Orvanta::of(platform).getPersistentIdentifierForDNU(true),
@@ -81,17 +81,17 @@ std::optional<std::string> HTTPSPostBackend::sendNumbered(const Event& event) {
 
   if (isPromoting(event.flag)) {
     // Only a held backend is promoted: the server may have disabled it this moment.
-    std::int32_t held = kBackendSampledOut;
+    BackendState held = kBackendHeld;
     stateCell().compare_exchange_strong(held, kBackendEnabled);
   }
   const bool realtime = isRealtime(event.flag);
   ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): realtime is {:d}", realtime);
-  const std::int32_t now = state();
-  const bool mayPost = now != kBackendWaiting && now != kBackendSampledOut;
+  const BackendState now = state();
+  const bool mayPost = now != kBackendWaiting && now != kBackendHeld;
   const bool hasInfo = !identity().requireUserInfo || userInfoDict() != nullptr;
   if (mayPost && (realtime || !batchEvents()) && hasInfo) return sendDirectly(prepared.record, event);
 
-  ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): Batching {}, {:d}, {:d}", now, batchEvents(),
+  ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): Batching {}, {:d}, {:d}", int{now}, batchEvents(),
               identity().requireUserInfo);
   return batchEvent(std::move(prepared));
 }
@@ -174,7 +174,7 @@ std::optional<std::string> HTTPSPostBackend::sendDirectly(const EventRecord& rec
                 "Forcing Flush here to keep events in order.");
     flushed = flushMessagesWithCompletion({});
   }
-  ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): Sending {}, {:d}, {:d}", state(), batchEvents(),
+  ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): Sending {}, {:d}, {:d}", int{state()}, batchEvents(),
               identity().requireUserInfo);
   const OutgoingEvent outgoing{&record, {}};
   PostMessage message = buildMessage({&outgoing, 1});
@@ -269,7 +269,7 @@ PostMessage HTTPSPostBackend::buildMessage(std::span<const OutgoingEvent> events
 
 // People see what was sent where they have agreed to it, or where the environment is theirs and they have asked for it.
 bool HTTPSPostBackend::showsMessages() const {
-  if (_clientIdentity.dnuType() == ClientIdentity::kConsentRespected && _dnuEnabled) return true;
+  if (_clientIdentity.dnuType() == ClientIdentity::kConsentRespected && _consentGiven) return true;
   if (!_forceEventLogging) return false;
   const EnvironmentType environment = currentEnvironmentType(platform());
   return environment == EnvironmentType::development || environment == EnvironmentType::internal;

@@ -54,7 +54,7 @@ class HTTPSPostBackend final : public OrvantaBackend {
   HTTPSPostBackend(Platform& platform, std::string name, SharedDictionary profile, const BackendSetup& setup);
 
   // HTTPSPostConfiguration.cpp
-  std::int32_t updateBackendState();
+  BackendState updateBackendState();
   ReportingFacts gatherFacts() const;
   void apply(ReportingDecision&& decision, const ReportingFacts& facts);
   bool updatePostLink(const Dictionary& section);
@@ -82,7 +82,7 @@ class HTTPSPostBackend final : public OrvantaBackend {
   std::vector<platform::HttpHeader> postHeaders(const Event* event) const;
 
   // Constant after construction.
-  const bool _dnuEnabled;         // the user's consent to diagnostics submission
+  const bool _consentGiven;       // the user's consent to diagnostics submission
   const bool _forceEventLogging;  // show people what is posted, on development and internal environments
   const std::shared_ptr<const SessionFields> _sessionFields;
 

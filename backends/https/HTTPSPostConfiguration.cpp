@@ -38,11 +38,11 @@ void HTTPSPostBackend::updateState() {
   if (!_immutable) setState(updateBackendState());
 }
 
-std::int32_t HTTPSPostBackend::updateBackendState() {
+BackendState HTTPSPostBackend::updateBackendState() {
   if (_immutable) return state();
   const ReportingFacts facts = gatherFacts();
   ReportingDecision decision = evaluate(*profile(), facts);
-  const std::int32_t decided = decision.state;
+  const BackendState decided = decision.state;
   apply(std::move(decision), facts);
   return decided;
 }
@@ -54,7 +54,7 @@ ReportingFacts HTTPSPostBackend::gatherFacts() const {
   facts.requireUserInfo = identity().requireUserInfo;
   facts.hasUserInfo = userInfoDict() != nullptr;
   facts.ownVersion = identity().selfVersion;
-  facts.consent = _dnuEnabled;
+  facts.consentGiven = _consentGiven;
   facts.countryCode = platform().device().countryCode();
   facts.productFamily = identity().productFamily;
   facts.productType = identity().productType;
@@ -92,7 +92,7 @@ void HTTPSPostBackend::apply(ReportingDecision&& decision, const ReportingFacts&
   }
   if (facts.requireUserInfo && settings.sampling) {
     ORVANTA_LOG(debug, "HTTPSPostBackend(updateBackendState): {}: client found {}:{}, state={}, samplingFactor={:f}",
-                name(), orNull(facts.clientName), orNull(facts.serviceName), decision.state, facts.samplingFactor);
+                name(), orNull(facts.clientName), orNull(facts.serviceName), int{decision.state}, facts.samplingFactor);
     for (const auto* section : settings.linkSections) updatePostLink(*section);
   }
   if (auto& list = settings.eventWhitelist) {

@@ -19,7 +19,6 @@ class RecordLayer {
   static std::shared_ptr<const RecordLayer> of(SharedDictionary entries);
 
   const Dictionary& entries() const { return *_entries; }
-  const SharedDictionary& shared() const { return _entries; }
   bool holds(std::string_view key) const { return (_keyBits & bitOf(key)) != 0 && _entries->contains(key); }
   ReservedKeys reservedKeys() const { return _reservedKeys; }
   // Compact, a comma behind each field, without what can never be sent.

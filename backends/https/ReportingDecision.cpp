@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <cmath>
 
-#include "backends/https/ClientIdentity.h"
 #include "backends/https/ClientSection.h"
 #include "backends/https/StringMatching.h"
 
@@ -85,11 +84,11 @@ bool passesTests(ReportingDecision& decision, const Dictionary& section, const R
   // Compared unrounded: 1.5 is not the 1 that overrides.
   if (reason.overrideDNU == 1 && realUnder(section, "override_dnu") == 1.0) {
     decision.settings.dnuType =
-        facts.consent ? ClientIdentity::kConsentOverriddenGiven : ClientIdentity::kConsentOverriddenNotGiven;
+        facts.consentGiven ? ClientIdentity::kConsentOverriddenGiven : ClientIdentity::kConsentOverriddenNotGiven;
   } else {
     decision.settings.dnuType = ClientIdentity::kConsentRespected;
     reason.test = ReportingTest::consentMissing;
-    if (!facts.consent) return false;
+    if (!facts.consentGiven) return false;
   }
   // An unknown country passes any list that has an entry; without one nobody reports.
   if (!matchStringWithList(textsUnder(section, "locale_whitelist"), facts.countryCode, false)) {
@@ -142,9 +141,9 @@ void decideBySampling(ReportingDecision& decision, const Dictionary& section, do
   reason.overrideSampling = realUnder(section, "override_sampling");
   decision.settings.overrideSampling.emplace().value = reason.overrideSampling;
   if (!reason.overrideSampling || factor <= *reason.overrideSampling) {
-    return conclude(kBackendSampledOut, ReportingTest::held);
+    return conclude(kBackendHeld, ReportingTest::heldBySampling);
   }
-  conclude(kBackendDisabled, ReportingTest::sampledOut);
+  conclude(kBackendDisabled, ReportingTest::disabledBySampling);
 }
 
 std::optional<ReportingSettings::EventList> eventList(const Dictionary& section, std::string_view key) {

@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "backends/OrvantaBackend.h"
+#include "backends/https/ClientIdentity.h"
 #include "backends/https/EventFilters.h"
 #include "backends/https/ReportingReason.h"
 #include "interface/Values.h"
@@ -19,7 +20,7 @@ struct ReportingFacts {
   bool requireUserInfo = false;
   bool hasUserInfo = false;
   OrvantaBackend::SelfVersion ownVersion;
-  bool consent = false;  // the user's, to diagnostics submission
+  bool consentGiven = false;  // the user's, to diagnostics submission
   std::optional<std::string> countryCode;
   std::string productFamily;
   std::optional<std::string> productType;
@@ -52,7 +53,7 @@ struct ReportingSettings {
   };
 
   std::optional<bool> batchEvents;
-  std::optional<std::int32_t> dnuType;
+  std::optional<ClientIdentity::DnuType> dnuType;
   std::optional<EventFilters> filters;
   std::optional<Sampling> sampling;
   std::optional<OverrideSampling> overrideSampling;
@@ -64,7 +65,7 @@ struct ReportingSettings {
 };
 
 struct ReportingDecision {
-  std::int32_t state = kBackendDisabled;
+  BackendState state = kBackendDisabled;
   ReportingReason reason;
   ReportingSettings settings;
 };

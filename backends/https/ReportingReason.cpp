@@ -43,13 +43,13 @@ std::string describe(const ReportingReason& reason) {
       return "there is no sampling threshold.";
     case ReportingTest::sampledIn:
       return fmt::format("sampling factor {:f} is within the threshold {:f}.", factor, threshold);
-    case ReportingTest::held:
+    case ReportingTest::heldBySampling:
       if (!reason.overrideSampling) {
         return fmt::format("sampling factor {:f} is above the threshold {:f}; events are held.", factor, threshold);
       }
       return fmt::format("sampling factor {:f} is above the threshold {:f} but within {:f}; events are held.", factor,
                          threshold, *reason.overrideSampling);
-    case ReportingTest::sampledOut:
+    case ReportingTest::disabledBySampling:
       return fmt::format("sampling factor {:f} is above the thresholds {:f} and {:f}.", factor, threshold,
                          reason.overrideSampling.value_or(0));
   }

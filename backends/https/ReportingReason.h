@@ -23,9 +23,9 @@ enum class ReportingTest {
   modelBlacklisted,
   filtersMissing,
   noSamplingThreshold,
-  sampledIn,   // enabled
-  held,        // above the threshold, within the wider share
-  sampledOut,  // above both
+  sampledIn,           // enabled
+  heldBySampling,      // above the threshold, within the wider share
+  disabledBySampling,  // above both
 };
 
 // Why an evaluation came out as it did: the test and what it looked at. A value, from which log lines, tests and tools

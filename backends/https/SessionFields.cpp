@@ -9,7 +9,7 @@ namespace {
 
 // These client types are told apart by the number that the client gave its session.
 bool reportsNumericSessionID(std::int32_t clientType, bool isInternal) {
-  return clientType == 7 || (isInternal && (clientType == 11 || clientType == 13));
+  return clientType == kClientTypeXF || (isInternal && (clientType == kClientTypeZJ || clientType == kClientTypeZEPHQ));
 }
 
 Value valueOrNull(const std::optional<std::string>& text) {

@@ -121,7 +121,7 @@ TEST_F(HierarchyTest, ChildrenCarryTheChainOfIdentifiersAndFollowTheirParentsSta
   EXPECT_EQ(backend(*leaf).combinedSessionIDString(), chain);
   EXPECT_EQ(backend(*root).combinedSessionIDString(), root->sessionIDString());
 
-  const auto stateAfterSync = [&](std::int32_t parents, std::int32_t childs) {
+  const auto stateAfterSync = [&](BackendState parents, BackendState childs) {
     backend(*root).setState(parents);
     backend(*child).setState(childs);
     child->syncReportingStates();
@@ -133,8 +133,8 @@ TEST_F(HierarchyTest, ChildrenCarryTheChainOfIdentifiersAndFollowTheirParentsSta
   EXPECT_TRUE(
       log.contains("<7>HTTPSPostBackend(syncReportingStates): http_post: state and sampling rate updated to 1, "
                    "0.25%"));
-  EXPECT_EQ(stateAfterSync(kBackendDisabled, kBackendSampledOut), kBackendSampledOut) << "one sampled out stays so";
-  EXPECT_EQ(stateAfterSync(kBackendSampledOut, kBackendEnabled), kBackendSampledOut);
+  EXPECT_EQ(stateAfterSync(kBackendDisabled, kBackendHeld), kBackendHeld) << "one sampled out stays so";
+  EXPECT_EQ(stateAfterSync(kBackendHeld, kBackendEnabled), kBackendHeld);
 
   leave(root);
   child->syncReportingStates();

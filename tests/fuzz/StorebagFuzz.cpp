@@ -46,7 +46,7 @@ void evaluate(Platform& platform, const Value& profile) {
   REQUIRE(backend->state() == kBackendWaiting);
   backend->setUserInfoDict(std::make_shared<const Dictionary>(Dictionary{{"clientName", "c"}, {"serviceName", "s"}}));
   backend->updateState();
-  REQUIRE(backend->state() >= kBackendWaiting && backend->state() <= kBackendSampledOut);
+  REQUIRE(backend->state() >= kBackendWaiting && backend->state() <= kBackendHeld);
   REQUIRE(backend->state() == kBackendWaiting || backend->reason());
 }
 

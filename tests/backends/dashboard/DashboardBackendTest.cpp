@@ -54,11 +54,11 @@ class DashboardBackendTest : public ::testing::Test {
     return backend.sendMessage(event);
   }
   // The next datagram taken apart.
-  tagReportingPacket received() {
+  DashboardPacket received() {
     const auto datagram = server.receive();
     EXPECT_TRUE(datagram) << "no datagram came";
     const auto packet = decodeDashboardDatagram(datagram.value_or(std::vector<std::uint8_t>()));
-    return packet ? *packet : tagReportingPacket{};
+    return packet ? *packet : DashboardPacket{};
   }
   static std::size_t openSockets() {
     std::size_t count = 0;

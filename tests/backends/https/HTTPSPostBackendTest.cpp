@@ -46,7 +46,7 @@ TEST_F(HTTPSPostBackendTest, WhatASendDoesInEachState) {
     platform.http.clear();
     const Setup setup = requiring({}, row.batchEvents);
     const auto backend = makeBackend(setup);
-    backend->setState(row.state);
+    backend->setState(static_cast<BackendState>(row.state));
     if (!row.hasUserInfo) backend->setUserInfoDict(nullptr);
     EXPECT_EQ(send(*backend, 5, row.flag), std::nullopt);
     EXPECT_EQ(backend->state(), row.stateAfter);
@@ -80,7 +80,7 @@ TEST_F(HTTPSPostBackendTest, FlushInEachState) {
     const Setup setup = requiring({}, true);
     const auto backend = makeBackend(setup);
     if (row.batched) send(*backend, 5);
-    backend->setState(row.state);
+    backend->setState(static_cast<BackendState>(row.state));
     if (!row.hasUserInfo) backend->setUserInfoDict(nullptr);
     const FlushAnswer answer = flush(*backend);
     EXPECT_EQ(answer.calls, 1);
@@ -141,7 +141,7 @@ TEST_F(HTTPSPostBackendTest, SessionEndRecord) {
   Setup setup = requiring({{"sampling_threshold", 0.25}, {"override_sampling", 0.75}}, true);
   setup.samplingFactor = 0.5;
   const auto held = makeBackend(setup);
-  ASSERT_EQ(held->state(), kBackendSampledOut);
+  ASSERT_EQ(held->state(), kBackendHeld);
   held->setState(kBackendEnabled);
   held->setSamplingThreshold(0.125);  // as copied from a parent session
   expect(endRecord(*held, shared({})),

@@ -30,7 +30,7 @@ TEST_F(HTTPSPostConfigurationTest, LinesOfAnEvaluation) {
   const auto backend = makeBackend(setup);
   const LogCapture log;
   backend->updateState();
-  EXPECT_EQ(backend->state(), kBackendSampledOut);
+  EXPECT_EQ(backend->state(), kBackendHeld);
   const std::string prefix = "<7>HTTPSPostBackend(updateBackendState): ";
   const std::string link = "<7>HTTPSPostBackend(updatePostLink): ", url = "'https://events.example/batch'";
   EXPECT_EQ(log.lines(), (std::vector<std::string>{
@@ -47,7 +47,7 @@ TEST_F(HTTPSPostConfigurationTest, LinesOfAnEvaluation) {
   EXPECT_TRUE(backend->batchEvents());
   EXPECT_EQ(backend->samplingThreshold(), 0.5);
   EXPECT_TRUE(backend->isWhitelistedEvent(3) && !backend->isWhitelistedEvent(9) && backend->isBlacklistedEvent(5));
-  EXPECT_EQ(backend->reason()->test, ReportingTest::held);
+  EXPECT_EQ(backend->reason()->test, ReportingTest::heldBySampling);
 }
 
 TEST_F(HTTPSPostConfigurationTest, AMalformedSectionIsAWarningAndDisables) {

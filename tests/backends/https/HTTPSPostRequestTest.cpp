@@ -111,7 +111,7 @@ TEST_F(HTTPSPostRequestTest, APromotionDoesNotUndoTheServersAnswer) {
   const auto backend = makeBackend({});
   send(*backend, 1);
   settle();
-  backend->setState(kBackendSampledOut);
+  backend->setState(kBackendHeld);
   ASSERT_TRUE(platform.http.finishHeld(ScriptedHttpClient::status(500)));
   send(*backend, 2, 2);
   EXPECT_EQ(backend->state(), kBackendDisabled);

@@ -27,7 +27,7 @@ TEST_F(HTTPSPostStressTest, EverythingAtOnce) {
         if (!seen) break;
         seen->setCorrelatedSessionID("root." + std::to_string(i));
         seen->setSamplingThreshold(0.5);
-        if (i % 7 == 0) seen->setState(i % 2 == 0 ? kBackendSampledOut : kBackendEnabled);
+        if (i % 7 == 0) seen->setState(i % 2 == 0 ? kBackendHeld : kBackendEnabled);
         EXPECT_TRUE(seen->combinedSessionIDString().has_value());
         EXPECT_TRUE(seen->samplingThreshold().has_value());
       }

@@ -31,7 +31,7 @@ ReportingDecision decide(Array clients, const Change& change = {}) {
   facts.requireUserInfo = true;
   facts.hasUserInfo = true;
   facts.ownVersion = {2, 1, 5};
-  facts.consent = true;
+  facts.consentGiven = true;
   facts.countryCode = "DE";
   facts.productFamily = "Parva";
   facts.productType = "xABCy";
@@ -43,7 +43,7 @@ ReportingDecision decide(Array clients, const Change& change = {}) {
 std::int32_t stateOf(ReportingTest test) {
   if (test == waitingForUserInfo) return 0;
   if (test == userInfoNotRequired || test == sampledIn) return 2;
-  return test == held ? 3 : 1;
+  return test == heldBySampling ? 3 : 1;
 }
 
 void check(const char* what, const ReportingDecision& decision, ReportingTest test) {
@@ -71,10 +71,10 @@ void check(std::initializer_list<Row> rows) {
 
 const Change noClient = [](auto& facts) { facts.clientName.reset(); };
 const Change noService = [](auto& facts) { facts.serviceName.reset(); };
-const Change noConsent = [](auto& facts) { facts.consent = false; };
+const Change noConsent = [](auto& facts) { facts.consentGiven = false; };
 const Change noCountry = [](auto& facts) { facts.countryCode.reset(); };
 const Change noModel = [](auto& facts) { facts.productType.reset(); };
-const Change notRequired = [](auto& facts) { facts.requireUserInfo = facts.consent = false; };
+const Change notRequired = [](auto& facts) { facts.requireUserInfo = facts.consentGiven = false; };
 const Change noUserInfo = [](auto& facts) { facts.hasUserInfo = false; };
 Change draw(double factor) {
   return [factor](auto& facts) { facts.samplingFactor = factor; };
@@ -92,7 +92,7 @@ TEST(ReportingDecision, Sections) {
       {"one of them a section", {"text", open()}, sampledIn},
       {"the first that matches decides",
        {open({{"client", "News"}}), open({{"sampling_threshold", 0.1}}), open()},
-       held},
+       heldBySampling},
       {"one that is too new is passed over", {open({{"enabledSince", "3"}}), open()}, sampledIn},
   };
   for (const auto& row : rows) check(row.what, decide(row.clients, row.change), row.test);
@@ -206,21 +206,25 @@ TEST(ReportingDecision, Sampling) {
   };
   check({
       {"no threshold", {{"sampling_threshold", nullptr}}, noSamplingThreshold, {}, "there is no sampling threshold."},
-      {"above", {}, held, draw(0.5), "sampling factor 0.500000 is above the threshold 0.250000; events are held."},
+      {"above",
+       {},
+       heldBySampling,
+       draw(0.5),
+       "sampling factor 0.500000 is above the threshold 0.250000; events are held."},
       {"NaN", {{"sampling_threshold", std::numeric_limits<double>::quiet_NaN()}}, noSamplingThreshold},
       {"exactly", {}, sampledIn, draw(0.25)},
-      {"just above", {}, held, draw(std::nextafter(0.25, 1.0))},
-      {"within the override", {{"override_sampling", 0.4}}, held, draw(0.3)},
-      {"exactly the override", {{"override_sampling", 0.3}}, held, draw(0.3)},
+      {"just above", {}, heldBySampling, draw(std::nextafter(0.25, 1.0))},
+      {"within the override", {{"override_sampling", 0.4}}, heldBySampling, draw(0.3)},
+      {"exactly the override", {{"override_sampling", 0.3}}, heldBySampling, draw(0.3)},
       {"above the override",
        {{"override_sampling", 0.2}},
-       sampledOut,
+       disabledBySampling,
        draw(0.3),
        "sampling factor 0.300000 is above the thresholds 0.250000 and 0.200000."},
       {"threshold 0, draw 0", {{"sampling_threshold", 0}}, sampledIn, draw(0)},
       {"the first entry for the country", perCountry, sampledIn, draw(0.4)},
-      {"country codes are exact", perCountry, held, smallLetters},
-      {"country unknown", perCountry, held, nowhere},
+      {"country codes are exact", perCountry, heldBySampling, smallLetters},
+      {"country unknown", perCountry, heldBySampling, nowhere},
       {"a country without a threshold", noCountrysThreshold, noSamplingThreshold},
       {"an entry for no country", noThresholdsCountry, sampledIn},
   });

@@ -29,7 +29,7 @@ ReceivedDatagram readDatagram(std::string_view bytes) {
   datagram.bytes = bytes;
   const auto packet = decodeDashboardDatagram({reinterpret_cast<const std::uint8_t*>(bytes.data()), bytes.size()});
   if (!packet) return datagram;
-  const tagReportingPacketHeader& header = packet->header;
+  const DashboardHeader& header = packet->header;
   datagram.wellFormed = true;
   datagram.versionMajor = header.versionMajor;
   datagram.clientType = header.clientType;
@@ -41,8 +41,8 @@ ReceivedDatagram readDatagram(std::string_view bytes) {
   datagram.respCode = header.respCode;
   datagram.deviceID = header.deviceIDText();
   datagram.eventNumber = header.eventNumber;
-  datagram.reliable = (header.mode & tagReportingPacketHeader::kModeAcknowledged) != 0;
-  datagram.explicitServer = (header.mode & tagReportingPacketHeader::kModeExplicitServer) != 0;
+  datagram.reliable = (header.mode & DashboardHeader::kModeAcknowledged) != 0;
+  datagram.explicitServer = (header.mode & DashboardHeader::kModeExplicitServer) != 0;
   datagram.text = packet->text;
   return datagram;
 }
