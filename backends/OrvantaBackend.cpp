@@ -7,6 +7,7 @@
 #include <cstdlib>
 #include <span>
 
+#include "platform/core/Text.h"
 #include "platform/host/Digest.h"
 
 namespace orvanta {
@@ -104,7 +105,7 @@ std::string SelfVersion::text() const {
 
 std::string OrvantaBackend::convertIntoSHA256(std::string_view text) {
   const std::span bytes(reinterpret_cast<const std::uint8_t*>(text.data()), text.size());
-  return platform::hexDigits(platform::sha256(bytes));
+  return platform::hexText(platform::sha256(bytes));
 }
 
 }  // namespace orvanta

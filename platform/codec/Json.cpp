@@ -6,12 +6,12 @@
 #include <cstring>
 
 #include "platform/codec/PropertyList.h"
+#include "platform/core/Text.h"
 
 namespace orvanta::platform {
 
 namespace {
 
-constexpr std::string_view kHexDigits = "0123456789abcdef";
 constexpr std::string_view kReplacement = "\xef\xbf\xbd";  // U+FFFD
 constexpr std::size_t kIndent = 2;
 
@@ -66,9 +66,7 @@ void appendEscaped(std::string& out, char c) {
       out += "\\t";
       return;
     default:
-      out += "\\u00";
-      out += kHexDigits[static_cast<unsigned char>(c) >> 4U];
-      out += kHexDigits[static_cast<unsigned char>(c) & 0x0fU];
+      (out += "\\u00") += hexText({&c, 1});
   }
 }
 

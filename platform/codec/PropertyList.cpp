@@ -4,10 +4,10 @@
 #include <sys/stat.h>
 
 #include <cerrno>
-#include <system_error>
 
 #include <fmt/format.h>
 
+#include "platform/core/Text.h"
 #include "platform/core/UniqueFd.h"
 #include "platform/core/WholeFile.h"
 
@@ -16,10 +16,6 @@ namespace orvanta::platform {
 namespace {
 
 constexpr std::string_view kBinaryMagic = "bplist";
-
-std::string errnoText(int error) {
-  return std::generic_category().message(error);
-}
 
 Result<std::string> readFile(const std::string& path, std::size_t maximumBytes) {
   // Non-blocking, so that a FIFO in a file's place does not hold the caller.

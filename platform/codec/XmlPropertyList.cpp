@@ -11,6 +11,7 @@
 #include "platform/codec/PropertyList.h"
 #include "platform/codec/XmlCharacters.h"
 #include "platform/core/PropertyListDate.h"
+#include "platform/core/Text.h"
 #include "platform/core/Utf8.h"
 
 namespace orvanta::platform {
@@ -28,11 +29,6 @@ std::string_view trimmed(std::string_view text) {
   const std::size_t first = text.find_first_not_of(kWhiteSpace);
   if (first == text.npos) return {};
   return text.substr(first, text.find_last_not_of(kWhiteSpace) - first + 1);
-}
-
-bool equalsIgnoringCase(std::string_view text, std::string_view lowerCase) {
-  return std::equal(text.begin(), text.end(), lowerCase.begin(), lowerCase.end(),
-                    [](char a, char b) { return (a >= 'A' && a <= 'Z' ? a - 'A' + 'a' : a) == b; });
 }
 
 // What stands between "&" and ";". None for what is not predefined: a document's own entities are never looked up.

@@ -5,9 +5,9 @@
 #include <sys/stat.h>
 
 #include <cerrno>
-#include <system_error>
 #include <utility>
 
+#include "platform/core/Text.h"
 #include "platform/core/UniqueFd.h"
 #include "platform/core/WholeFile.h"
 
@@ -67,12 +67,12 @@ Result<StampedContent> readStamped(const std::string& path, std::size_t maximumB
   StampedContent content;
   if (!fd) {
     const int code = errno;
-    if (code != ENOENT && code != ENOTDIR) return failure(path, std::system_category().message(code));
+    if (code != ENOENT && code != ENOTDIR) return failure(path, errnoText(code));
     content.stamp.settled = true;
     return content;
   }
   struct stat status {};
-  if (::fstat(fd.get(), &status) != 0) return failure(path, std::system_category().message(errno));
+  if (::fstat(fd.get(), &status) != 0) return failure(path, errnoText(errno));
   if (!S_ISREG(status.st_mode)) return failure(path, "not a regular file");
   content.stamp = stampFrom(status);
   auto bytes = readToEnd(fd.get(), maximumBytes);

@@ -26,15 +26,18 @@ bool equalsIgnoringCase(std::string_view a, std::string_view b) {
   return std::equal(a.begin(), a.end(), b.begin(), b.end(), [](char x, char y) { return lowered(x) == lowered(y); });
 }
 
-std::string hexText(std::string_view bytes) {
+std::string hexText(std::span<const std::uint8_t> bytes) {
   std::string text;
   text.reserve(bytes.size() * 2);
-  for (const char c : bytes) {
-    const auto byte = static_cast<unsigned char>(c);
+  for (const std::uint8_t byte : bytes) {
     text += kLowerDigits[byte >> 4U];
     text += kLowerDigits[byte & 0xFU];
   }
   return text;
+}
+
+std::string hexText(std::string_view bytes) {
+  return hexText(std::span(reinterpret_cast<const std::uint8_t*>(bytes.data()), bytes.size()));
 }
 
 std::string errnoText(int error) {

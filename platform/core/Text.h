@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cstdint>
+#include <span>
 #include <string>
 #include <string_view>
 
@@ -11,6 +13,7 @@ namespace orvanta::platform {
 bool equalsIgnoringCase(std::string_view a, std::string_view b);
 
 // Two digits a byte, lower case.
+std::string hexText(std::span<const std::uint8_t> bytes);
 std::string hexText(std::string_view bytes);
 
 // What the system says of an errno value, such as "No such file or directory".
@@ -18,7 +21,7 @@ std::string errnoText(int error);
 
 // Each byte that `keeps` refuses becomes "%" and two upper-case hexadecimal digits.
 std::string percentEncode(std::string_view text, bool (*keeps)(char));
-// "%41" becomes "A"; what does not begin an escape stays as it is.
+// "%41" becomes "A"; a "%" that does not begin an escape stays as it is.
 std::string percentDecode(std::string_view text);
 
 }  // namespace orvanta::platform

@@ -6,6 +6,8 @@
 #include <limits>
 #include <system_error>
 
+#include "platform/core/Text.h"
+
 namespace orvanta::platform {
 
 namespace {
@@ -68,11 +70,6 @@ std::int64_t truncate(double v) {
   if (v >= 0x1p63) return std::numeric_limits<std::int64_t>::max();
   if (v <= -0x1p63) return std::numeric_limits<std::int64_t>::min();
   return static_cast<std::int64_t>(v);
-}
-
-bool equalsIgnoringCase(std::string_view text, std::string_view lowerCase) {
-  return std::equal(text.begin(), text.end(), lowerCase.begin(), lowerCase.end(),
-                    [](char a, char b) { return (a >= 'A' && a <= 'Z' ? a - 'A' + 'a' : a) == b; });
 }
 
 bool textIsTrue(std::string_view text) {

@@ -5,6 +5,7 @@
 #include <fmt/format.h>
 
 #include "platform/core/PropertyListDate.h"
+#include "platform/core/Text.h"
 #include "platform/core/Value.h"
 
 namespace orvanta::platform {
@@ -49,7 +50,7 @@ class Describer {
   void write(const Data& v, int) {
     _out += '<';
     const std::size_t shown = std::min(v.bytes.size(), kMaximumDataBytes);
-    for (std::size_t i = 0; i < shown; ++i) fmt::format_to(std::back_inserter(_out), "{:02x}", v.bytes[i]);
+    _out += hexText(std::span(v.bytes).first(shown));
     if (shown < v.bytes.size()) _out += kEllipsis;
     _out += '>';
   }

@@ -126,9 +126,8 @@ void LinuxDeviceProperties::State::reject(const FileStamp& stamp, const std::str
 
 std::optional<std::string> LinuxDeviceProperties::State::text(std::string_view key) {
   const std::lock_guard lock(_mutex);
-  const Value* value = current().find(key);
-  if (value == nullptr) return std::nullopt;
-  return *value->string();
+  if (const std::string* text = current().text(key)) return *text;
+  return std::nullopt;
 }
 
 std::optional<bool> LinuxDeviceProperties::State::boolean(std::string_view key) {

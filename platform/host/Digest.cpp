@@ -106,17 +106,6 @@ std::array<std::uint8_t, 32> sha256(std::span<const std::uint8_t> bytes) {
   return digest<32>(algorithm, "SHA-256", context, bytes);
 }
 
-std::string hexDigits(std::span<const std::uint8_t> bytes) {
-  constexpr std::string_view kDigits = "0123456789abcdef";
-  std::string text(bytes.size() * 2, '0');
-  auto out = text.begin();
-  for (const std::uint8_t byte : bytes) {
-    *out++ = kDigits[byte >> 4U];
-    *out++ = kDigits[byte & 0x0fU];
-  }
-  return text;
-}
-
 std::unique_ptr<RsaPublicKey> RsaPublicKey::fromDer(std::span<const std::uint8_t> der) {
   const ErrorQueueMark mark;
   const auto length = static_cast<long>(der.size());

@@ -12,8 +12,6 @@ namespace orvanta::platform {
 // Digests over OpenSSL, whose algorithm objects are fetched once per process. Thread-safe.
 std::array<std::uint8_t, 20> sha1(std::span<const std::uint8_t> bytes);
 std::array<std::uint8_t, 32> sha256(std::span<const std::uint8_t> bytes);
-// Lower-case hexadecimal digits.
-std::string hexDigits(std::span<const std::uint8_t> bytes);
 
 // An RSA public key for PKCS#1 v1.5 signatures over SHA-1. Immutable; verify() may be called from several threads.
 class RsaPublicKey {

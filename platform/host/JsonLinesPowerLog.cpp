@@ -6,11 +6,11 @@
 
 #include <cerrno>
 #include <cstdio>
-#include <system_error>
 #include <utility>
 
 #include "platform/codec/Json.h"
 #include "platform/core/Log.h"
+#include "platform/core/Text.h"
 
 namespace orvanta::platform {
 
@@ -48,7 +48,7 @@ void JsonLinesPowerLog::registeredEvent(std::int32_t event, std::string_view sen
   const std::lock_guard lock(_mutex);
   const bool written = append(line);
   if (!written && !_failing) {
-    PLATFORM_LOG(warning, "registeredEvent: cannot write to {}: {}", _path, std::generic_category().message(errno));
+    PLATFORM_LOG(warning, "registeredEvent: cannot write to {}: {}", _path, errnoText(errno));
   }
   _failing = !written;
 }

@@ -6,6 +6,7 @@
 #include <cstdlib>
 #include <vector>
 
+#include "platform/core/Text.h"
 #include "platform/host/Digest.h"
 
 namespace orvanta::platform {
@@ -113,7 +114,7 @@ std::optional<std::string> deriveDeviceIdentifier(std::string_view machineId, st
   std::vector<std::uint8_t> bytes(application.begin(), application.end());
   bytes.push_back(0);
   bytes.insert(bytes.end(), id.begin(), id.end());
-  return hexDigits(sha256(bytes)).substr(0, 40);
+  return hexText(sha256(bytes)).substr(0, 40);
 }
 
 }  // namespace orvanta::platform

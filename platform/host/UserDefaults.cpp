@@ -13,6 +13,7 @@
 
 #include "platform/codec/PropertyList.h"
 #include "platform/core/Log.h"
+#include "platform/core/Text.h"
 #include "platform/core/UniqueFd.h"
 #include "platform/queue/WorkQueue.h"
 
@@ -22,10 +23,6 @@ namespace {
 
 constexpr std::size_t kMaximumBytes = 16U << 20U;
 constexpr mode_t kNewFileMode = 0600;  // persistent identifiers are nobody else's business
-
-std::string reason(int code) {
-  return std::system_category().message(code);
-}
 
 bool writeAll(int fd, std::string_view bytes) {
   while (!bytes.empty()) {
@@ -47,9 +44,9 @@ class UserDefaults::DirectoryLock {
     std::error_code ignored;
     std::filesystem::create_directories(directory, ignored);  // what failed shows when the directory is opened
     UniqueFd fd(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    if (!fd) return Failure{fmt::format("cannot open {}: {}", directory, reason(errno))};
+    if (!fd) return Failure{fmt::format("cannot open {}: {}", directory, errnoText(errno))};
     while (::flock(fd.get(), LOCK_EX) != 0) {
-      if (errno != EINTR) return Failure{fmt::format("cannot lock {}: {}", directory, reason(errno))};
+      if (errno != EINTR) return Failure{fmt::format("cannot lock {}: {}", directory, errnoText(errno))};
     }
     return DirectoryLock(std::move(fd));
   }
@@ -96,7 +93,7 @@ Result<bool> UserDefaults::set(std::string_view key, Value value) {
   const auto locked = guard();
   const auto lock = DirectoryLock::take(_directory);
   if (!lock) return Failure{lock.error()};
-  if (auto loaded = load(&*lock); !loaded) return loaded;
+  if (const auto loaded = load(&*lock); !loaded) return Failure{loaded.error()};
   return change(*lock, key, std::move(value));
 }
 
@@ -124,7 +121,7 @@ const Dictionary& UserDefaults::current() {
 
 // Reads the file anew. A failure, which is logged, means that there is a file but that its content is not known; it
 // then counts as empty.
-Result<bool> UserDefaults::load(const DirectoryLock* lock) {
+Result<void> UserDefaults::load(const DirectoryLock* lock) {
   _loaded = false;
   _cached = Dictionary();
   auto content = readStamped(_path, kMaximumBytes);
@@ -148,21 +145,21 @@ Result<bool> UserDefaults::load(const DirectoryLock* lock) {
   _stamp = content->stamp;
   _loaded = true;
   _problem.clear();
-  return true;
+  return {};
 }
 
-Result<bool> UserDefaults::keepAside(const FileStamp& stamp, const std::string& why) {
+Result<void> UserDefaults::keepAside(const FileStamp& stamp, const std::string& why) {
   const std::string aside = _path + ".corrupt";
-  if (std::rename(_path.c_str(), aside.c_str()) != 0) return leaveInPlace(stamp, why, reason(errno));
+  if (std::rename(_path.c_str(), aside.c_str()) != 0) return leaveInPlace(stamp, why, errnoText(errno));
   PLATFORM_LOG(error, "UserDefaults: {} is no property list, kept aside as {}: {}", _path, aside, why);
   _stamp = FileStamp::of(_path);
   _loaded = true;
   _problem.clear();
-  return true;
+  return {};
 }
 
 // Remembers a file that makes no sense and cannot be moved, so that it is not read and logged again at every question.
-Result<bool> UserDefaults::leaveInPlace(const FileStamp& stamp, const std::string& why, const std::string& obstacle) {
+Result<void> UserDefaults::leaveInPlace(const FileStamp& stamp, const std::string& why, const std::string& obstacle) {
   _stamp = stamp;
   _loaded = true;
   const auto problem = fmt::format("{} is no property list ({}) and cannot be kept aside: {}", _path, why, obstacle);
@@ -179,15 +176,13 @@ Result<bool> UserDefaults::change(const DirectoryLock& lock, std::string_view ke
   } else {
     next.set(key, std::move(value));
   }
-  auto replaced = replaceFile(lock, next);
-  if (replaced) {
-    _cached = std::move(next);
-    _stamp = FileStamp::of(_path);
-  }
-  return replaced;
+  if (const auto replaced = replaceFile(lock, next); !replaced) return Failure{replaced.error()};
+  _cached = std::move(next);
+  _stamp = FileStamp::of(_path);
+  return true;
 }
 
-Result<bool> UserDefaults::replaceFile(const DirectoryLock& lock, const Dictionary& content) {
+Result<void> UserDefaults::replaceFile(const DirectoryLock& lock, const Dictionary& content) {
   const auto text = writeXmlPropertyList(Value(content));
   if (!text) return Failure{text.error()};
   const int directory = lock.directory();
@@ -195,23 +190,23 @@ Result<bool> UserDefaults::replaceFile(const DirectoryLock& lock, const Dictiona
   const std::string temporary = _fileName + ".new";
   ::unlinkat(directory, temporary.c_str(), 0);
   const UniqueFd fd(::openat(directory, temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, kNewFileMode));
-  if (!fd) return Failure{fmt::format("cannot make {}.new: {}", _path, reason(errno))};
+  if (!fd) return Failure{fmt::format("cannot make {}.new: {}", _path, errnoText(errno))};
   struct stat before {};
   const bool replaces = ::fstatat(directory, _fileName.c_str(), &before, 0) == 0;
   // A file that another account may read stays readable for it when an administrator's program writes; a first file
   // of root's belongs to the account that the directory belongs to.
   const bool takesOwner = replaces || (::geteuid() == 0 && ::fstat(directory, &before) == 0);
   if (takesOwner && before.st_uid != ::geteuid() && ::fchown(fd.get(), before.st_uid, before.st_gid) != 0) {
-    PLATFORM_LOG(warning, "UserDefaults: {} changes its owner: {}", _path, reason(errno));
+    PLATFORM_LOG(warning, "UserDefaults: {} changes its owner: {}", _path, errnoText(errno));
   }
   if ((replaces && ::fchmod(fd.get(), before.st_mode & 07777U) != 0) || !writeAll(fd.get(), *text) ||
       ::fsync(fd.get()) != 0 || ::renameat(directory, temporary.c_str(), directory, _fileName.c_str()) != 0) {
     const int code = errno;
     ::unlinkat(directory, temporary.c_str(), 0);
-    return Failure{fmt::format("cannot write {}: {}", _path, reason(code))};
+    return Failure{fmt::format("cannot write {}: {}", _path, errnoText(code))};
   }
-  if (::fsync(directory) != 0) PLATFORM_LOG(warning, "UserDefaults: cannot sync {}: {}", _directory, reason(errno));
-  return true;
+  if (::fsync(directory) != 0) PLATFORM_LOG(warning, "UserDefaults: cannot sync {}: {}", _directory, errnoText(errno));
+  return {};
 }
 
 void UserDefaults::logOnce(const std::string& problem) {

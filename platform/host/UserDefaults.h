@@ -47,11 +47,11 @@ class UserDefaults {
   Value storeIfAbsent(std::string_view key, Value fresh);
   // These are called under _mutex.
   const Dictionary& current();
-  Result<bool> load(const DirectoryLock* lock);
-  Result<bool> keepAside(const FileStamp& stamp, const std::string& why);
-  Result<bool> leaveInPlace(const FileStamp& stamp, const std::string& why, const std::string& obstacle);
+  Result<void> load(const DirectoryLock* lock);
+  Result<void> keepAside(const FileStamp& stamp, const std::string& why);
+  Result<void> leaveInPlace(const FileStamp& stamp, const std::string& why, const std::string& obstacle);
   Result<bool> change(const DirectoryLock& lock, std::string_view key, Value value);
-  Result<bool> replaceFile(const DirectoryLock& lock, const Dictionary& content);
+  Result<void> replaceFile(const DirectoryLock& lock, const Dictionary& content);
   void logOnce(const std::string& problem);
 
   const std::string _directory;

@@ -7,10 +7,10 @@
 #include <algorithm>
 #include <chrono>
 #include <condition_variable>
-#include <csignal>
 #include <system_error>
 #include <utility>
 
+#include "platform/core/SignalMask.h"
 #include "platform/http/HttpHeaderList.h"
 #include "platform/http/HttpRedirect.h"
 
@@ -20,31 +20,15 @@ namespace {
 
 constexpr std::chrono::milliseconds kLongestTimeout = std::chrono::hours(24 * 365);  // far from the clock's end
 
-// Signals are for the process's other threads; the resolver's threads, too, inherit this.
-class SignalsBlocked {
- public:
-  SignalsBlocked() {
-    sigset_t all;
-    ::sigfillset(&all);
-    ::pthread_sigmask(SIG_SETMASK, &all, &_before);
-  }
-  ~SignalsBlocked() { ::pthread_sigmask(SIG_SETMASK, &_before, nullptr); }
-  SignalsBlocked(const SignalsBlocked&) = delete;
-  SignalsBlocked& operator=(const SignalsBlocked&) = delete;
-
- private:
-  sigset_t _before{};
-};
-
-std::optional<std::string> whyUnsendable(const HttpRequest& request) {
-  if (request.method != "GET" && request.method != "POST") return "Unsupported method " + request.method;
+Result<void> checkSendable(const HttpRequest& request) {
+  if (request.method != "GET" && request.method != "POST") return Failure{"Unsupported method " + request.method};
   if (!isHttpUrl(request.url) && !isHttpsUrl(request.url)) {
-    return fmt::format("Unsupported URL \"{}\": neither http nor https", request.url);
+    return Failure{fmt::format("Unsupported URL \"{}\": neither http nor https", request.url)};
   }
   if (std::any_of(request.url.begin(), request.url.end(), [](unsigned char c) { return c <= 0x20 || c == 0x7f; })) {
-    return "Malformed URL: it holds a blank or a control character";
+    return Failure{"Malformed URL: it holds a blank or a control character"};
   }
-  return std::nullopt;
+  return {};
 }
 
 }  // namespace
@@ -67,7 +51,7 @@ void CurlHttpClient::start(const std::shared_ptr<HttpLane>& lane, HttpRequest re
   pending->lane = std::static_pointer_cast<HttpLaneQueue>(lane);
   pending->observe = std::move(observe);
   pending->completion = std::move(completion);
-  handIn(std::move(pending));
+  submit(std::move(pending));
 }
 
 HttpResult CurlHttpClient::perform(const std::shared_ptr<HttpLane>& lane, HttpRequest request) {
@@ -83,51 +67,53 @@ HttpResult CurlHttpClient::perform(const std::shared_ptr<HttpLane>& lane, HttpRe
     result = std::move(outcome);
     arrived.notify_one();  // under the lock: once this thread goes on, none of this is there any more
   };
-  handIn(std::move(pending));
+  submit(std::move(pending));
   const BlockingScope scope;
   std::unique_lock lock(mutex);
   arrived.wait(lock, [&] { return result.has_value(); });
   return std::move(*result);
 }
 
-void CurlHttpClient::handIn(std::unique_ptr<PendingHttpRequest> pending) {
+void CurlHttpClient::submit(std::unique_ptr<PendingHttpRequest> pending) {
   const HttpRequest& request = pending->request;
   if (request.timeout) {
     pending->deadline = std::chrono::steady_clock::now() + std::min(*request.timeout, kLongestTimeout);
   }
-  std::optional<std::string> refusal = whyUnsendable(request);
-  if (!refusal) {
-    pending->headers = makeHeaderList(request, false);
-    refusal = pending->headers ? ensureRunning() : "Out of memory";
-  }
-  if (!refusal) {
-    HttpIntake::Entry entry = _intake.handIn(pending);
-    if (entry.wake) wake();
-    refusal = std::move(entry.refusal);
-  }
-  if (refusal) HttpTransferLoop::deliver(std::move(pending), {std::nullopt, std::move(*refusal)});
+  const Result<void> accepted = accept(pending);
+  if (!accepted) HttpTransferLoop::deliver(std::move(pending), {std::nullopt, accepted.error()});
 }
 
-std::optional<std::string> CurlHttpClient::ensureRunning() {
-  if (_running.load(std::memory_order_acquire) != nullptr) return std::nullopt;
+Result<void> CurlHttpClient::accept(std::unique_ptr<PendingHttpRequest>& pending) {
+  if (auto sendable = checkSendable(pending->request); !sendable) return sendable;
+  pending->headers = makeHeaderList(pending->request, false);
+  if (!pending->headers) return Failure{"Out of memory"};
+  if (auto running = ensureRunning(); !running) return running;
+  const Result<bool> asleep = _intake.submit(pending);
+  if (!asleep) return Failure{asleep.error()};
+  if (*asleep) wake();
+  return {};
+}
+
+Result<void> CurlHttpClient::ensureRunning() {
+  if (_running.load(std::memory_order_acquire) != nullptr) return {};
   const std::lock_guard guard(_threadMutex);
-  if (_loop || _shutDown) return std::nullopt;  // after the shutdown the intake has the word
+  if (_loop || _shutDown) return {};  // after the shutdown the intake has the word
   // Takes milliseconds and megabytes, which a daemon without traffic does not need. Safe from several threads.
-  if (curl_global_init(CURL_GLOBAL_DEFAULT) != CURLE_OK) return "The HTTP client cannot start";
+  if (curl_global_init(CURL_GLOBAL_DEFAULT) != CURLE_OK) return Failure{"The HTTP client cannot start"};
   auto loop = HttpTransferLoop::create(_intake, _options);
-  if (!loop) return "The HTTP client cannot start";
+  if (!loop) return Failure{"The HTTP client cannot start"};
   try {
-    const SignalsBlocked blocked;
+    const AllSignalsBlocked blocked;  // the resolver's threads, too, inherit this
     _thread = std::thread([loop = loop.get()] {
       ::pthread_setname_np(::pthread_self(), "http");
       loop->run();
     });
   } catch (const std::system_error& error) {
-    return fmt::format("The HTTP client cannot start: {}", error.what());
+    return Failure{fmt::format("The HTTP client cannot start: {}", error.what())};
   }
   _loop = std::move(loop);
   _running.store(_loop.get(), std::memory_order_release);
-  return std::nullopt;
+  return {};
 }
 
 void CurlHttpClient::wake() {

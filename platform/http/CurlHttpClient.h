@@ -3,17 +3,16 @@
 #include <atomic>
 #include <memory>
 #include <mutex>
-#include <optional>
-#include <string>
 #include <thread>
 
+#include "platform/core/Result.h"
 #include "platform/http/HttpClient.h"
 #include "platform/http/HttpIntake.h"
 #include "platform/http/HttpTransferLoop.h"
 
 namespace orvanta::platform {
 
-// The HTTP client over libcurl: checks and hands in requests on the callers' threads, and runs a HttpTransferLoop on a
+// The HTTP client over libcurl: checks and submits requests on the callers' threads, and runs a HttpTransferLoop on a
 // thread of its own. The thread starts with the first request, so that a process can enter its sandbox before.
 class CurlHttpClient final : public HttpClient {
  public:
@@ -28,9 +27,12 @@ class CurlHttpClient final : public HttpClient {
   void shutdown(std::chrono::milliseconds patience) override;
 
  private:
-  void handIn(std::unique_ptr<PendingHttpRequest> request);
-  // Why there is no running loop; none when there is one.
-  std::optional<std::string> ensureRunning();
+  // Hands the request to the HTTP thread, or delivers why that cannot be.
+  void submit(std::unique_ptr<PendingHttpRequest> request);
+  // Takes the request, unless it fails.
+  Result<void> accept(std::unique_ptr<PendingHttpRequest>& request);
+  // Fails when there is no running loop and none can be started.
+  Result<void> ensureRunning();
   void wake();
 
   // Constant after construction.

@@ -1,22 +1,20 @@
 #include "platform/http/HttpHeaderList.h"
 
-#include <strings.h>
-
 #include <algorithm>
 #include <initializer_list>
 #include <string>
 #include <string_view>
 
 #include "platform/core/Log.h"
+#include "platform/core/Text.h"
 
 namespace orvanta::platform {
 
 namespace {
 
 bool isAnyOf(std::string_view name, std::initializer_list<std::string_view> names) {
-  return std::any_of(names.begin(), names.end(), [&](std::string_view other) {
-    return name.size() == other.size() && ::strncasecmp(name.data(), other.data(), name.size()) == 0;
-  });
+  return std::any_of(names.begin(), names.end(),
+                     [&](std::string_view other) { return equalsIgnoringCase(name, other); });
 }
 
 bool isTokenCharacter(char c) {

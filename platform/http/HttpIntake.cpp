@@ -18,21 +18,19 @@ bool fits(std::size_t charge, std::size_t used, std::size_t limit) {
 
 }  // namespace
 
-HttpIntake::Entry HttpIntake::handIn(std::unique_ptr<PendingHttpRequest>& request) {
+Result<bool> HttpIntake::submit(std::unique_ptr<PendingHttpRequest>& request) {
   HttpLaneQueue& lane = *request->lane;
   const std::size_t charge = lane.isLimited() ? request->request.body.size() + kChargePerRequest : 0;
   const std::lock_guard guard(_mutex);
-  if (_closed) return {"The HTTP client has been shut down", false};
-  if (_abortBlocking && request->blocking) return {"Aborted: the process is ending", false};
+  if (_closed) return Failure{"The HTTP client has been shut down"};
+  if (_abortBlocking && request->blocking) return Failure{"Aborted: the process is ending"};
   if (lane.isLimited() && !fits(charge, lane.charged, _limits.laneBytes)) {
-    return {fmt::format("Refused: {} bytes wait in this lane, {} more would exceed its limit of {}", lane.charged,
-                        charge, _limits.laneBytes),
-            false};
+    return Failure{fmt::format("Refused: {} bytes wait in this lane, {} more would exceed its limit of {}",
+                               lane.charged, charge, _limits.laneBytes)};
   }
   if (lane.isLimited() && !fits(charge, _charged, _limits.totalBytes)) {
-    return {fmt::format("Refused: {} bytes wait in all lanes, {} more would exceed the limit of {}", _charged, charge,
-                        _limits.totalBytes),
-            false};
+    return Failure{fmt::format("Refused: {} bytes wait in all lanes, {} more would exceed the limit of {}", _charged,
+                               charge, _limits.totalBytes)};
   }
   request->charge = charge;
   lane.charged += charge;
@@ -40,19 +38,19 @@ HttpIntake::Entry HttpIntake::handIn(std::unique_ptr<PendingHttpRequest>& reques
   ++_unfinished;
   // Behind another request of its lane it cannot start before that has ended, and then the thread is awake.
   const bool mustBeSeen = lane.unfinished++ == 0 || request->deadline.has_value();
-  _handedIn.push_back(std::move(request));
-  return {std::nullopt, mustBeSeen && std::exchange(_asleep, false)};
+  _submitted.push_back(std::move(request));
+  return mustBeSeen && std::exchange(_asleep, false);
 }
 
 HttpIntake::Orders HttpIntake::take() {
   const std::lock_guard guard(_mutex);
   _asleep = false;
-  return {std::exchange(_handedIn, {}), _abortBlocking, _stop};
+  return {std::exchange(_submitted, {}), _abortBlocking, _stop};
 }
 
 bool HttpIntake::mayFallAsleep() {
   const std::lock_guard guard(_mutex);
-  _asleep = _handedIn.empty();
+  _asleep = _submitted.empty();
   return _asleep;
 }
 

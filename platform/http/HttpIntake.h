@@ -5,10 +5,9 @@
 #include <cstddef>
 #include <memory>
 #include <mutex>
-#include <optional>
-#include <string>
 #include <vector>
 
+#include "platform/core/Result.h"
 #include "platform/http/HttpClient.h"
 #include "platform/http/PendingHttpRequest.h"
 
@@ -20,11 +19,9 @@ class HttpIntake {
  public:
   explicit HttpIntake(const HttpLimits& limits) : _limits(limits) {}
 
-  struct Entry {
-    std::optional<std::string> refusal;  // why the request was not taken; it then stays with the caller
-    bool wake = false;                   // the HTTP thread sleeps and was not woken yet
-  };
-  Entry handIn(std::unique_ptr<PendingHttpRequest>& request);
+  // Takes the request and returns whether the HTTP thread sleeps, so that the caller has to wake it. When it fails, the
+  // request stays with the caller.
+  Result<bool> submit(std::unique_ptr<PendingHttpRequest>& request);
 
   struct Orders {
     std::vector<std::unique_ptr<PendingHttpRequest>> requests;
@@ -36,7 +33,7 @@ class HttpIntake {
   // For the HTTP thread before it sleeps: false when there is something to take. While it works it is not woken, since
   // it comes back here on its own.
   bool mayFallAsleep();
-  // A request's bytes no longer wait. Before its completion runs, so that this may hand in the next.
+  // A request's bytes no longer wait. Before its completion runs, so that this may submit the next.
   void release(const PendingHttpRequest& request);
   // A request has ended, its completion is on its way.
   void ended();
@@ -54,7 +51,7 @@ class HttpIntake {
   std::mutex _mutex;
   std::condition_variable _empty;
   // Guarded by _mutex.
-  std::vector<std::unique_ptr<PendingHttpRequest>> _handedIn;
+  std::vector<std::unique_ptr<PendingHttpRequest>> _submitted;
   std::size_t _charged = 0;     // of all limited lanes
   std::size_t _unfinished = 0;  // taken in and not ended
   bool _abortBlocking = false;

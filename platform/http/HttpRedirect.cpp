@@ -1,14 +1,15 @@
 #include "platform/http/HttpRedirect.h"
 
 #include <fmt/format.h>
-#include <strings.h>
+
+#include "platform/core/Text.h"
 
 namespace orvanta::platform {
 
 namespace {
 
 bool startsWith(std::string_view text, std::string_view prefix) {
-  return text.size() >= prefix.size() && ::strncasecmp(text.data(), prefix.data(), prefix.size()) == 0;
+  return equalsIgnoringCase(text.substr(0, prefix.size()), prefix);
 }
 
 // 303 asks for a GET, and of 301 and 302 many make one: an emptied POST would deliver nothing and look delivered.

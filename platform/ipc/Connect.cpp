@@ -3,8 +3,8 @@
 #include <sys/socket.h>
 
 #include <cerrno>
-#include <cstring>
 
+#include "platform/core/Text.h"
 #include "platform/ipc/UnixAddress.h"
 
 namespace orvanta::platform {
@@ -12,7 +12,7 @@ namespace orvanta::platform {
 namespace {
 Failure failure(const std::string& path, int error, int* errorNumber) {
   if (errorNumber != nullptr) *errorNumber = error;
-  return {"Cannot connect to " + path + ": " + std::strerror(error)};
+  return {"Cannot connect to " + path + ": " + errnoText(error)};
 }
 }  // namespace
 

@@ -17,6 +17,7 @@
 #include "platform/codec/PropertyList.h"
 #include "platform/core/Log.h"
 #include "platform/core/NearestWord.h"
+#include "platform/core/Text.h"
 #include "platform/queue/WorkQueue.h"
 
 namespace orvanta::platform {
@@ -36,7 +37,7 @@ Result<const Record*> lookUp(Lookup lookup, const std::string& name, Record& rec
   }
   if (found != nullptr) return found;
   if (error == 0) return Failure{"there is no \"" + name + "\""};
-  return Failure{"\"" + name + "\" cannot be looked up: " + std::generic_category().message(error)};
+  return Failure{"\"" + name + "\" cannot be looked up: " + errnoText(error)};
 }
 
 Result<std::uint32_t> userNumber(const std::string& name) {

@@ -3,7 +3,8 @@
 #include <sys/socket.h>
 
 #include <cerrno>
-#include <cstring>
+
+#include "platform/core/Text.h"
 
 namespace orvanta::platform {
 
@@ -32,7 +33,7 @@ Result<PeerIdentity> peerIdentityOf(int socket) {
   ucred credentials{};
   socklen_t size = sizeof credentials;
   if (::getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &credentials, &size) != 0) {
-    return Failure{std::string("The socket has no peer credentials: ") + std::strerror(errno)};
+    return Failure{"The socket has no peer credentials: " + errnoText(errno)};
   }
   if (credentials.uid == kNobodyAtAll)
     return Failure{"The socket has no peer credentials: It is not connected to a process"};

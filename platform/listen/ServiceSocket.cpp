@@ -8,11 +8,10 @@
 
 #include <array>
 #include <cerrno>
-#include <cstring>
-#include <optional>
 #include <utility>
 
 #include "platform/core/Log.h"
+#include "platform/core/Text.h"
 #include "platform/ipc/Connect.h"
 #include "platform/ipc/UnixAddress.h"
 #include "platform/listen/PeerIdentity.h"
@@ -22,7 +21,7 @@ namespace orvanta::platform {
 namespace {
 
 Failure failure(const std::string& what, int error) {
-  return {what + ": " + std::strerror(error)};
+  return {what + ": " + errnoText(error)};
 }
 
 Failure takenBy(const std::string& path, const std::string& process) {
@@ -71,19 +70,19 @@ Result<UniqueFd> takeLock(const std::string& directory, const std::string& servi
   const std::string process = std::to_string(::getpid());
   if (::ftruncate(lock.get(), 0) != 0 ||
       ::pwrite(lock.get(), process.data(), process.size(), 0) != static_cast<ssize_t>(process.size())) {
-    PLATFORM_LOG(notice, "Listener: {} cannot be written: {}", lockPath, std::strerror(errno));
+    PLATFORM_LOG(notice, "Listener: {} cannot be written: {}", lockPath, errnoText(errno));
   }
   return lock;
 }
 
 // Removes a socket file that nobody listens behind; otherwise says what stands in the way.
-std::optional<Failure> removeStale(const std::string& directory, const std::string& service) {
+Result<void> removeStale(const std::string& directory, const std::string& service) {
   const std::string path = directory + "/" + service;
   int error = 0;
   const auto connected = connectToService(directory, service, &error);
   if (connected) return takenBy(path, processBehind(connected->get()));
   if (error == EAGAIN) return takenBy(path, {});  // so busy that it takes no more
-  if (error == ENOENT) return std::nullopt;
+  if (error == ENOENT) return {};
   if (error != ECONNREFUSED) return Failure{connected.error()};
 
   struct stat status {};
@@ -91,7 +90,7 @@ std::optional<Failure> removeStale(const std::string& directory, const std::stri
   if (!S_ISSOCK(status.st_mode)) return Failure{path + " is in the way: it is no socket"};
   if (::unlink(path.c_str()) != 0 && errno != ENOENT) return failure("Cannot remove the stale socket " + path, errno);
   PLATFORM_LOG(notice, "Listener: A stale socket was replaced at {}", path);
-  return std::nullopt;
+  return {};
 }
 
 }  // namespace
@@ -116,7 +115,7 @@ Result<ServiceSocket> openServiceSocket(const std::string& directory, const std:
   };
   if (!bind()) {
     if (errno != EADDRINUSE) return failure("Cannot bind " + result.path, errno);
-    if (auto obstacle = removeStale(directory, service)) return *obstacle;
+    if (const auto removed = removeStale(directory, service); !removed) return Failure{removed.error()};
     if (!bind()) return failure("Cannot bind " + result.path, errno);
   }
   // Before listening, so that nobody meets other permissions. Who is admitted is decided by entitlement.

@@ -3,34 +3,17 @@
 #include <pthread.h>
 
 #include <algorithm>
-#include <csignal>
 #include <system_error>
 #include <utility>
 
 #include "platform/core/Log.h"
+#include "platform/core/SignalMask.h"
 
 namespace orvanta::platform {
 
 namespace {
 
 thread_local PoolThreads* tCurrent = nullptr;
-
-// Threads inherit the signal mask: a pool's threads take no signals, which belong to the main thread (or, in a client,
-// to a program that knows nothing of us).
-class AllSignalsBlocked {
- public:
-  AllSignalsBlocked() {
-    sigset_t all;
-    ::sigfillset(&all);
-    ::pthread_sigmask(SIG_SETMASK, &all, &_before);
-  }
-  ~AllSignalsBlocked() { ::pthread_sigmask(SIG_SETMASK, &_before, nullptr); }
-  AllSignalsBlocked(const AllSignalsBlocked&) = delete;
-  AllSignalsBlocked& operator=(const AllSignalsBlocked&) = delete;
-
- private:
-  sigset_t _before{};
-};
 
 }  // namespace
 

@@ -7,7 +7,8 @@
 #include <memory>
 #include <span>
 #include <string>
-#include <system_error>
+
+#include "platform/core/Text.h"
 
 namespace orvanta::platform {
 
@@ -16,7 +17,7 @@ namespace {
 using Filter = std::unique_ptr<void, decltype(&::seccomp_release)>;
 
 Failure failedStep(const std::string& step, int negativeError) {
-  return Failure{"system calls: " + step + ": " + std::generic_category().message(-negativeError)};
+  return Failure{"system calls: " + step + ": " + errnoText(-negativeError)};
 }
 
 // A filter that answers what no rule mentions with `others`.
@@ -79,8 +80,8 @@ Result<int> filterCalls(const SandboxCalls& calls) {
   return failedStep("the kernel does not take the filter (it needs CONFIG_SECCOMP_FILTER)", error);
 }
 
-Result<bool> refuseStartCalls(const SandboxCalls& calls) {
-  if (calls.untilStarted.empty()) return true;
+Result<void> refuseStartCalls(const SandboxCalls& calls) {
+  if (calls.untilStarted.empty()) return {};
   const Filter filter = makeFilter(SCMP_ACT_ALLOW);
   if (!filter) return failedStep("making a filter", -ENOMEM);
   if (const int error = add(filter, SCMP_ACT_ERRNO(EPERM), calls.untilStarted); error != 0) {
@@ -89,10 +90,10 @@ Result<bool> refuseStartCalls(const SandboxCalls& calls) {
   if (const int error = ::seccomp_load(filter.get()); error != 0) {
     return failedStep("refusing those of the start", error);
   }
-  return true;
+  return {};
 }
 
-Result<bool> filterWatcherCalls() {
+Result<void> filterWatcherCalls() {
   // ppoll, pselect6 and friends: what the C library makes of poll() differs between machines. Through a pipe the builds
   // that look for undefined behaviour ask whether memory can be read.
   static constexpr int kCalls[] = {
@@ -110,7 +111,7 @@ Result<bool> filterWatcherCalls() {
   if (!filter) return failedStep("making a filter", -ENOMEM);
   if (const int error = add(filter, SCMP_ACT_ALLOW, kCalls); error != 0) return failedStep("adding a rule", error);
   if (const int error = ::seccomp_load(filter.get()); error != 0) return failedStep("filtering the watcher", error);
-  return true;
+  return {};
 }
 
 }  // namespace orvanta::platform

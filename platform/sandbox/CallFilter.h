@@ -16,10 +16,10 @@ namespace orvanta::platform {
 Result<int> filterCalls(const SandboxCalls& calls);
 
 // From now on the calls that were allowed until the start are not permitted (EPERM). Other threads stay as they are.
-Result<bool> refuseStartCalls(const SandboxCalls& calls);
+Result<void> refuseStartCalls(const SandboxCalls& calls);
 
 // Leaves the calling thread nothing but what answering refused calls and logging them takes; all else fails with
 // ENOSYS.
-Result<bool> filterWatcherCalls();
+Result<void> filterWatcherCalls();
 
 }  // namespace orvanta::platform

@@ -10,8 +10,9 @@
 #include <cstddef>
 #include <iterator>
 #include <string>
-#include <system_error>
 #include <utility>
+
+#include "platform/core/Text.h"
 
 namespace orvanta::platform {
 
@@ -28,14 +29,14 @@ constexpr std::uint64_t kBindTcp = 1U << 0U;
 constexpr std::uint64_t kScopeSignals = 1U << 1U;
 
 Failure failedStep(const char* step) {
-  return Failure{std::string(step) + ": " + std::generic_category().message(errno)};
+  return Failure{std::string(step) + ": " + errnoText(errno)};
 }
 
 Failure missingLandlock() {
   const char* reason = errno == ENOSYS       ? "the kernel has no Landlock"
                        : errno == EOPNOTSUPP ? "the kernel's Landlock is switched off"
                                              : "the kernel's Landlock cannot be used";
-  return Failure{std::string(reason) + " (" + std::generic_category().message(errno) +
+  return Failure{std::string(reason) + " (" + errnoText(errno) +
                  "): use a kernel with CONFIG_SECURITY_LANDLOCK, booted with \"landlock\" in its lsm= list, "
                  "or run without a sandbox by ORVANTA_SANDBOX=off"};
 }
@@ -75,23 +76,23 @@ Result<Landlock> Landlock::create(int highestAbi) {
   return Landlock(abi, UniqueFd(static_cast<int>(fd)));
 }
 
-Result<bool> Landlock::allow(const UniqueFd& target, std::uint64_t rights) {
+Result<void> Landlock::allow(const UniqueFd& target, std::uint64_t rights) {
   struct stat status {};
   if (::fstat(target.get(), &status) != 0) return failedStep("fstat");
   landlock_path_beneath_attr rule{};
   rule.allowed_access = rights & landlockRightsOfAbi(_abi);
   if (!S_ISDIR(status.st_mode)) rule.allowed_access = landlockFileRights(rule.allowed_access);
   rule.parent_fd = target.get();
-  if (rule.allowed_access == 0) return true;  // the kernel refuses empty rules
+  if (rule.allowed_access == 0) return {};  // the kernel refuses empty rules
   if (::syscall(SYS_landlock_add_rule, _ruleset.get(), LANDLOCK_RULE_PATH_BENEATH, &rule, 0) != 0) {
     return failedStep("landlock_add_rule");
   }
-  return true;
+  return {};
 }
 
-Result<bool> Landlock::restrictSelf() {
+Result<void> Landlock::restrictSelf() {
   if (::syscall(SYS_landlock_restrict_self, _ruleset.get(), 0) != 0) return failedStep("landlock_restrict_self");
-  return true;
+  return {};
 }
 
 }  // namespace orvanta::platform

@@ -48,9 +48,9 @@ class Landlock {
   int abi() const { return _abi; }
   // Grants `rights` to `target`, and to everything beneath a directory, as far as the kernel's ABI knows them.
   // `target` may be opened with O_PATH.
-  Result<bool> allow(const UniqueFd& target, std::uint64_t rights);
+  Result<void> allow(const UniqueFd& target, std::uint64_t rights);
   // Confines the calling thread, and those that it starts later, to what was allowed. Needs no-new-privileges.
-  Result<bool> restrictSelf();
+  Result<void> restrictSelf();
 
  private:
   Landlock(int abi, UniqueFd ruleset) : _abi(abi), _ruleset(std::move(ruleset)) {}

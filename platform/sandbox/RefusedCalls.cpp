@@ -10,7 +10,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <csignal>
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
@@ -21,6 +20,8 @@
 #include <vector>
 
 #include "platform/core/Log.h"
+#include "platform/core/SignalMask.h"
+#include "platform/core/Text.h"
 #include "platform/sandbox/CallFilter.h"
 
 namespace orvanta::platform {
@@ -33,13 +34,13 @@ constexpr int kNamedCalls = 512;
 struct RefusedCalls::Watch {
   std::set<int> limited;  // allowed with other arguments; constant after construction
   UniqueFd stop{::eventfd(0, EFD_CLOEXEC)};
-  std::promise<Result<bool>> ready;  // the watcher is confined
+  std::promise<Result<void>> ready;  // the watcher is confined
   std::promise<int> notifications;   // the descriptor to watch; -1: none
 
   void run();
 
  private:
-  Result<bool> prepare();
+  Result<void> prepare();
   // False when the descriptor is of no use any more.
   bool answer(int fd);
 
@@ -52,11 +53,10 @@ struct RefusedCalls::Watch {
 };
 
 // Before the thread is confined, as it takes a call that it will not have.
-Result<bool> RefusedCalls::Watch::prepare() {
+Result<void> RefusedCalls::Watch::prepare() {
   seccomp_notif_sizes sizes{};
   if (::syscall(SYS_seccomp, SECCOMP_GET_NOTIF_SIZES, 0, &sizes) != 0) {
-    return Failure{"system calls: refused ones cannot be watched (it takes Linux 5.0): " +
-                   std::generic_category().message(errno)};
+    return Failure{"system calls: refused ones cannot be watched (it takes Linux 5.0): " + errnoText(errno)};
   }
   _request.resize(std::max<std::size_t>(sizes.seccomp_notif, sizeof(seccomp_notif)));
   _response.resize(std::max<std::size_t>(sizes.seccomp_notif_resp, sizeof(seccomp_notif_resp)));
@@ -112,19 +112,13 @@ RefusedCalls::RefusedCalls(const SandboxCalls& calls) : _watch(std::make_unique<
 Result<std::unique_ptr<RefusedCalls>> RefusedCalls::enter(const SandboxCalls& calls) {
   std::unique_ptr<RefusedCalls> made(new RefusedCalls(calls));  // NOLINT(modernize-make-unique): private
   if (!made->_watch->stop) return Failure{"system calls: no descriptor for the watcher"};
-  // Signals are for the other threads.
-  sigset_t all;
-  sigset_t before;
-  ::sigfillset(&all);
-  ::pthread_sigmask(SIG_SETMASK, &all, &before);
   auto prepared = made->_watch->ready.get_future();
   try {
+    const AllSignalsBlocked blocked;
     made->_watcher = std::thread([watch = made->_watch.get()] { watch->run(); });
   } catch (const std::system_error& error) {
-    ::pthread_sigmask(SIG_SETMASK, &before, nullptr);
     return Failure{std::string("system calls: no thread for the watcher: ") + error.what()};
   }
-  ::pthread_sigmask(SIG_SETMASK, &before, nullptr);
   const auto ready = prepared.get();
   const auto filtered = ready ? filterCalls(calls) : Result<int>(Failure{ready.error()});
   made->_watch->notifications.set_value(filtered ? *filtered : -1);

@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "platform/codec/PropertyList.h"
+#include "platform/core/Text.h"
 #include "platform/sandbox/CallFilter.h"
 #include "platform/sandbox/Landlock.h"
 #include "platform/sandbox/SandboxProfile.h"
@@ -20,10 +21,6 @@
 namespace orvanta::platform {
 
 namespace {
-
-std::string describeErrno() {
-  return std::generic_category().message(errno);
-}
 
 // The directory in which `path` lies once symbolic links are followed; the path itself when it leads to a directory.
 // Files are replaced by renaming, and a rule for the old one would not hold for the new one.
@@ -41,21 +38,21 @@ class FileRules {
   FileRules(Landlock& landlock, const std::map<std::string, std::string>& variables)
       : _landlock(landlock), _variables(variables) {}
 
-  Result<bool> add(const SandboxProfile::FileRule& rule) {
+  Result<void> add(const SandboxProfile::FileRule& rule) {
     for (const std::string& path : rule.paths) {
       if (auto added = addPath(path, false, rule); !added) return added;
     }
     for (const std::string& path : rule.directoriesOf) {
       if (auto added = addPath(path, true, rule); !added) return added;
     }
-    return true;
+    return {};
   }
 
   std::size_t added() const { return _added; }
   const std::vector<std::string>& skipped() const { return _skipped; }
 
  private:
-  Result<bool> addPath(const std::string& written, bool itsDirectory, const SandboxProfile::FileRule& rule) {
+  Result<void> addPath(const std::string& written, bool itsDirectory, const SandboxProfile::FileRule& rule) {
     auto path = fillPlaces(written, _variables);
     if (!path) return skip(rule, written, written + " has a variable without a value");
     if (itsDirectory) {
@@ -65,18 +62,18 @@ class FileRules {
     }
     if (*path == "/") return skip(rule, written, written + " leads to the root directory, which is not opened up");
     const UniqueFd target(::open(path->c_str(), O_PATH | O_CLOEXEC));
-    if (!target) return skip(rule, *path, fmt::format("cannot open {}: {}", *path, describeErrno()));
+    if (!target) return skip(rule, *path, fmt::format("cannot open {}: {}", *path, errnoText(errno)));
     if (auto allowed = _landlock.allow(target, rule.rights); !allowed) {
       return Failure{fmt::format("rule for {}: {}", *path, allowed.error())};
     }
     ++_added;
-    return true;
+    return {};
   }
 
-  Result<bool> skip(const SandboxProfile::FileRule& rule, const std::string& path, std::string reason) {
+  Result<void> skip(const SandboxProfile::FileRule& rule, const std::string& path, std::string reason) {
     if (!rule.optional) return Failure{std::move(reason)};
     _skipped.push_back(path);
-    return true;
+    return {};
   }
 
   Landlock& _landlock;
@@ -104,7 +101,7 @@ Result<std::unique_ptr<Sandbox>> Sandbox::enter(const std::string& directory, co
     return Failure{fmt::format("sandbox profile {}: {}", name, step)};
   };
 
-  if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) return failed("no-new-privileges: " + describeErrno());
+  if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) return failed("no-new-privileges: " + errnoText(errno));
   auto landlock = Landlock::create(profile->landlockAbi);
   if (!landlock) return failed(landlock.error());
   FileRules rules(*landlock, variables);
@@ -131,7 +128,7 @@ std::unique_ptr<Sandbox> Sandbox::none() {
   return std::unique_ptr<Sandbox>(new Sandbox());  // NOLINT(modernize-make-unique): the constructor is private
 }
 
-Result<bool> Sandbox::started() {
+Result<void> Sandbox::started() {
   return refuseStartCalls(_calls);
 }
 

@@ -27,7 +27,7 @@ class Sandbox {
   const std::string& description() const { return _description; }
   // The process has made what only its start makes, and has still no threads of its own: takes back what the profile
   // allows only until then.
-  Result<bool> started();
+  Result<void> started();
 
  private:
   Sandbox() = default;

@@ -66,27 +66,27 @@ class Reader {
  public:
   explicit Reader(const Dictionary& section) : _section(section) {}
 
-  std::optional<Failure> names(const char* key, std::vector<int>& calls) {
+  Result<void> names(const char* key, std::vector<int>& calls) {
     const Value* const value = _section.find(key);
-    if (value == nullptr) return std::nullopt;
+    if (value == nullptr) return {};
     if (value->array() == nullptr) return Failure{fmt::format("calls: \"{}\" must be a list of names", key)};
     for (const Value& item : *value->array()) {
       const auto call = resolve(item, fmt::format("calls: \"{}\"", key), key);
       if (!call) return Failure{call.error()};
       if (*call) calls.push_back(**call);
     }
-    return std::nullopt;
+    return {};
   }
 
-  std::optional<Failure> limits(const char* key, std::vector<SandboxCalls::Limit>& limits) {
+  Result<void> limits(const char* key, std::vector<SandboxCalls::Limit>& limits) {
     const Value* const value = _section.find(key);
-    if (value == nullptr) return std::nullopt;
+    if (value == nullptr) return {};
     if (value->array() == nullptr) return Failure{fmt::format("calls: \"{}\" must be a list", key)};
     for (std::size_t index = 0; index < value->array()->size(); ++index) {
       auto added = limit((*value->array())[index], fmt::format("calls: {}[{}]", key, index), key, limits);
-      if (added) return added;
+      if (!added) return added;
     }
-    return std::nullopt;
+    return {};
   }
 
  private:
@@ -123,12 +123,12 @@ class Reader {
 
   static Result<std::vector<std::uint64_t>> numbers(const Dictionary& entry, const char* key,
                                                     const std::string& place) {
-    const Value* const value = entry.find(key);
-    if (value == nullptr || value->array() == nullptr || value->array()->empty()) {
+    const Array* const values = entry.array(key);
+    if (values == nullptr || values->empty()) {
       return Failure{fmt::format("{}: \"{}\" must be a list of at least one value", place, key)};
     }
     std::vector<std::uint64_t> read;
-    for (const Value& item : *value->array()) {
+    for (const Value& item : *values) {
       const auto one = number(item, place);
       if (!one) return Failure{one.error()};
       read.push_back(*one);
@@ -136,8 +136,8 @@ class Reader {
     return read;
   }
 
-  std::optional<Failure> limit(const Value& value, const std::string& place, const char* key,
-                               std::vector<SandboxCalls::Limit>& limits) {
+  Result<void> limit(const Value& value, const std::string& place, const char* key,
+                     std::vector<SandboxCalls::Limit>& limits) {
     const Dictionary* const entry = value.dictionary();
     if (entry == nullptr) return Failure{place + " must be a dictionary"};
     static constexpr std::string_view kKeys[] = {"call", "argument", "bits", "is"};
@@ -167,7 +167,7 @@ class Reader {
       limit.call = **call;
       limits.push_back(std::move(limit));
     }
-    return std::nullopt;
+    return {};
   }
 
   const Dictionary& _section;
@@ -185,11 +185,11 @@ Result<SandboxCalls> SandboxCalls::fromPropertyList(const Value& section) {
   }
   SandboxCalls calls;
   Reader reader(*content);
-  if (auto failure = reader.limits("allowWith", calls.allowWith)) return *failure;
-  if (auto failure = reader.names("allow", calls.allow)) return *failure;
-  if (auto failure = reader.names("untilStarted", calls.untilStarted)) return *failure;
-  if (auto failure = reader.names("refuse", calls.refuse)) return *failure;
-  if (auto failure = reader.names("end", calls.end)) return *failure;
+  if (auto read = reader.limits("allowWith", calls.allowWith); !read) return Failure{read.error()};
+  if (auto read = reader.names("allow", calls.allow); !read) return Failure{read.error()};
+  if (auto read = reader.names("untilStarted", calls.untilStarted); !read) return Failure{read.error()};
+  if (auto read = reader.names("refuse", calls.refuse); !read) return Failure{read.error()};
+  if (auto read = reader.names("end", calls.end); !read) return Failure{read.error()};
   for (const char* const name : kIndispensable) {
     const int number = ::seccomp_syscall_resolve_name(name);
     const auto isIt = [number](int call) { return call == number; };

@@ -55,8 +55,7 @@ Result<std::vector<std::string>> readPaths(const Dictionary& entry, const std::s
 }
 
 Result<std::uint64_t> readAccess(const Dictionary& entry, const std::string& place) {
-  const Value* value = entry.find("access");
-  const Array* list = value == nullptr ? nullptr : value->array();
+  const Array* list = entry.array("access");
   if (list == nullptr || list->empty()) return Failure{place + ": \"access\" must be a list of at least one word"};
   std::uint64_t rights = 0;
   for (const Value& item : *list) {
@@ -114,11 +113,11 @@ Result<SandboxProfile> SandboxProfile::fromPropertyList(const Value& document) {
   if (version == nullptr || !version->isInteger() || version->integerValue() != kFormatVersion) {
     return Failure{fmt::format("\"version\" must be {}", kFormatVersion)};
   }
-  const Value* files = content->find("files");
-  if (files == nullptr || files->array() == nullptr) return Failure{"\"files\" must be a list"};
+  const Array* files = content->array("files");
+  if (files == nullptr) return Failure{"\"files\" must be a list"};
   SandboxProfile profile;
-  for (std::size_t index = 0; index < files->array()->size(); ++index) {
-    auto rule = readFileRule((*files->array())[index], fmt::format("files[{}]", index));
+  for (std::size_t index = 0; index < files->size(); ++index) {
+    auto rule = readFileRule((*files)[index], fmt::format("files[{}]", index));
     if (!rule) return Failure{rule.error()};
     profile.files.push_back(std::move(*rule));
   }

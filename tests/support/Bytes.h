@@ -7,6 +7,8 @@
 #include <string_view>
 #include <vector>
 
+#include "platform/core/Text.h"
+
 namespace orvanta::test {
 
 // Bytes written down as hexadecimal digits, with blanks and line breaks anywhere, and texts in single quotes as they
@@ -40,8 +42,7 @@ inline std::string toHex(std::span<const std::uint8_t> bytes) {
   std::string text;
   for (const std::uint8_t byte : bytes) {
     if (!text.empty()) text += ' ';
-    text += "0123456789abcdef"[byte >> 4U];
-    text += "0123456789abcdef"[byte & 0x0fU];
+    text += platform::hexText(std::span(&byte, 1));
   }
   return text;
 }

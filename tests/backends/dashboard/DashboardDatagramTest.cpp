@@ -5,6 +5,7 @@
 #include <limits>
 #include <string>
 
+#include "platform/core/Text.h"
 #include "platform/host/Digest.h"
 
 namespace orvanta {
@@ -49,7 +50,7 @@ TEST(DashboardDatagram, EveryByteOfTheHeader) {
   };
   for (const auto& row : rows) {
     const auto datagram = encodeDashboardDatagram(row.sender, row.event);
-    EXPECT_EQ(platform::hexDigits(std::span(datagram).first(kDashboardHeaderBytes)), row.header) << row.what;
+    EXPECT_EQ(platform::hexText(std::span(datagram).first(kDashboardHeaderBytes)), row.header) << row.what;
     EXPECT_EQ(textOf(datagram), " a=q b=xyz") << row.what;
     EXPECT_EQ(writeLocalLog(datagram), row.line) << row.what;
 

@@ -76,5 +76,23 @@ TEST(Value, Descriptions) {
   }
 }
 
+TEST(Dictionary, TypedLookUpsGiveOnlyValuesOfTheirType) {
+  const Dictionary dictionary{{"text", "t"},      {"array", Array{1, 2}}, {"dictionary", Dictionary{{"inner", 1}}},
+                              {"number", 1},      {"null", Value()},      {"data", Data{{'t'}}},
+                              {"boolean", false}, {"date", Date{1}}};
+  for (const auto& [key, value] : dictionary) {
+    SCOPED_TRACE(key);
+    EXPECT_EQ(dictionary.text(key), key == "text" ? value.string() : nullptr);
+    EXPECT_EQ(dictionary.array(key), key == "array" ? value.array() : nullptr);
+    EXPECT_EQ(dictionary.dictionary(key), key == "dictionary" ? value.dictionary() : nullptr);
+  }
+  EXPECT_EQ(*dictionary.text("text"), "t");
+  EXPECT_EQ(dictionary.array("array")->size(), 2U);
+  EXPECT_TRUE(dictionary.dictionary("dictionary")->contains("inner"));
+  EXPECT_EQ(dictionary.text("absent"), nullptr);
+  EXPECT_EQ(dictionary.array("absent"), nullptr);
+  EXPECT_EQ(dictionary.dictionary("absent"), nullptr);
+}
+
 }  // namespace
 }  // namespace orvanta::platform

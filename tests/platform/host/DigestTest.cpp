@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <vector>
 
+#include "platform/core/Text.h"
 #include "tests/support/Bytes.h"
 #include "tests/support/Threads.h"
 
@@ -26,8 +27,8 @@ Bytes joined(std::initializer_list<Bytes> parts) {
 
 TEST(Digest, KnownAnswers) {
   const auto text = bytesOf("abcdbcdecdefdefgefghfghighijhijkijkljklmklmnlmnomnopnopq");
-  EXPECT_EQ(hexDigits(sha1(text)), "84983e441c3bd26ebaae4aa1f95129e5e54670f1");
-  EXPECT_EQ(hexDigits(sha256(text)), "248d6a61d20638b8e5c026930c3e6039a33ce45964ff2167f6ecedd419db06c1");
+  EXPECT_EQ(hexText(sha1(text)), "84983e441c3bd26ebaae4aa1f95129e5e54670f1");
+  EXPECT_EQ(hexText(sha256(text)), "248d6a61d20638b8e5c026930c3e6039a33ce45964ff2167f6ecedd419db06c1");
 }
 
 TEST(Digest, ThreadsDoNotDisturbEachOther) {
