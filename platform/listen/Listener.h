@@ -37,11 +37,11 @@ class Listener {
   static std::unique_ptr<Listener> create(WorkPool& pool, ServiceSocket socket, Handler handler);
   virtual ~Listener() = default;
   virtual void resume() = 0;
-  // Accepts no more; the socket file that create() made is removed. True: no handler runs any more, but one that calls
-  // this. False: one still did after kPatience, as one that waits for something that never comes does; it is left
-  // alone. The destructor waits for it without limit.
+  // Accepts no more and removes the socket file that create() made. Returns true once no handler runs any more, false
+  // when one still did after kStopTimeout, as one that waits for something that never comes does; that one is left
+  // alone, and the destructor waits for it without limit. Not from a handler.
   virtual bool stop() = 0;
-  static constexpr std::chrono::seconds kPatience{2};
+  static constexpr std::chrono::seconds kStopTimeout{2};
   // The most connections of one uid at a time; see docs/limits-and-log.md.
   static constexpr std::size_t kMaximumConnectionsPerUser = 4096;
 };

@@ -4,10 +4,10 @@
 #include <sys/socket.h>
 
 #include <cerrno>
-#include <cstring>
 #include <utility>
 
 #include "platform/core/Log.h"
+#include "platform/core/Text.h"
 #include "platform/ipc/SocketConnection.h"
 
 namespace orvanta::platform {
@@ -17,9 +17,6 @@ namespace {
 constexpr int kAcceptsPerTurn = 16;
 constexpr std::chrono::milliseconds kPause{100};
 constexpr std::chrono::minutes kLogInterval{1};
-
-// Whose handler the calling thread is inside: stop() must not wait for its own caller.
-thread_local const Acceptor* tOffering = nullptr;
 
 // Whether a line that could come at any rate is due again.
 bool isDue(std::optional<std::chrono::steady_clock::time_point>& logged) {
@@ -76,7 +73,7 @@ bool Acceptor::acceptOne() {
 void Acceptor::pause(int error) {
   if (isDue(_pauseLogged)) {
     PLATFORM_LOG(error, "Listener: No connection can be accepted, trying again every {} ms: {}", kPause.count(),
-                 std::strerror(error));
+                 errnoText(error));
   }
   if (!_timer) _timer = _queue->makeTimer();
   _timer->runAfter(kPause, [self = shared_from_this()] { self->acceptSome(); });
@@ -106,13 +103,11 @@ void Acceptor::offer(UniqueFd socket, PeerIdentity peer, std::shared_ptr<void> p
     if (_stopped) return;
     ++_offering;
   }
-  const Acceptor* const before = std::exchange(tOffering, this);
   const int fd = socket.get();
   const auto connection = SocketConnection::create(_pool, std::move(socket), {});
   connection->setDescription(fmt::format("fd {} (pid {}, uid {})", fd, peer.pid, peer.uid));
   connection->hold(std::move(place));
   if (!_handler({connection, std::move(peer)})) connection->cancel(std::chrono::milliseconds(0));
-  tOffering = before;
 
   const std::lock_guard lock(_mutex);
   --_offering;
@@ -128,9 +123,8 @@ bool Acceptor::stop(std::optional<std::chrono::seconds> limit) {
       _queue->post([self = shared_from_this()] { self->close(); });
     }
   }
-  const std::size_t own = tOffering == this ? 1 : 0;
   std::unique_lock lock(_mutex);
-  const auto ended = [&] { return _offering <= own; };
+  const auto ended = [&] { return _offering == 0; };
   if (ended()) return true;
   lock.unlock();
   const BlockingScope blocking;

@@ -68,7 +68,7 @@ class ServiceListener final : public Listener {
   ~ServiceListener() override { _acceptor->stop(std::nullopt); }
 
   void resume() override { _acceptor->start(); }
-  bool stop() override { return _acceptor->stop(kPatience); }
+  bool stop() override { return _acceptor->stop(kStopTimeout); }
 
  private:
   const std::shared_ptr<Acceptor> _acceptor;

@@ -45,10 +45,8 @@ class WorkPool {
   // Threads that run the loop's jobs now, those added for blocked ones included.
   std::size_t threadCount() const;
 
-  struct Implementation;
-  Implementation& implementation() { return *_implementation; }
-
  private:
+  struct Implementation;
   std::unique_ptr<Implementation> _implementation;
 };
 

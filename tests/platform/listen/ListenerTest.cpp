@@ -197,19 +197,6 @@ TEST_F(ListenerTest, StopWaitsForHandlersUnderWay) {
   EXPECT_TRUE(peer.atEnd());
 }
 
-TEST_F(ListenerTest, AHandlerMayStopItsListener) {
-  std::unique_ptr<Listener> listener;
-  Counter stopped;
-  listener = listen([&](OfferedConnection&&) {
-    listener->stop();
-    stopped.add();
-    return false;
-  });
-  Peer peer = connect();
-  EXPECT_TRUE(stopped.waitFor(1));
-  _pool->stop();
-}
-
 TEST_F(ListenerTest, OneUserHasOnlySoManyConnectionsAtATime) {
   LogCapture log;
   auto socket = openServiceSocket(_directory.path(), kService);
