@@ -14,7 +14,7 @@ const void* LoadedBundle::symbol(const char* name) const {
 }
 
 const LoadedBundle* BundleLoader::load(const std::string& bundleDirectory) {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   auto& slot = _loaded[bundleDirectory];
   if (slot) return slot.get();
 

@@ -2,8 +2,9 @@
 
 #include <map>
 #include <memory>
-#include <mutex>
 #include <string>
+
+#include "platform/core/Mutex.h"
 
 namespace orvanta::platform {
 
@@ -27,8 +28,8 @@ class BundleLoader {
   const LoadedBundle* load(const std::string& bundleDirectory);
 
  private:
-  std::mutex _mutex;
-  std::map<std::string, std::unique_ptr<LoadedBundle>> _loaded;  // by directory; guarded by _mutex
+  Mutex _mutex;
+  std::map<std::string, std::unique_ptr<LoadedBundle>> _loaded GUARDED_BY(_mutex);  // by directory
 };
 
 }  // namespace orvanta::platform

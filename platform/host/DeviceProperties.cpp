@@ -5,7 +5,6 @@
 #include <cmath>
 #include <ctime>
 #include <initializer_list>
-#include <mutex>
 #include <string_view>
 #include <vector>
 
@@ -14,6 +13,7 @@
 #include "platform/codec/PropertyList.h"
 #include "platform/core/FileStamp.h"
 #include "platform/core/Log.h"
+#include "platform/core/Mutex.h"
 #include "platform/core/NearestWord.h"
 #include "platform/host/SystemFacts.h"
 
@@ -78,14 +78,14 @@ struct LinuxDeviceProperties::State {
   const std::optional<std::string> country;
 
  private:
-  const Dictionary& current();  // under _mutex
-  void reject(const FileStamp& stamp, const std::string& problem);
+  const Dictionary& current() REQUIRES(_mutex);
+  void reject(const FileStamp& stamp, const std::string& problem) REQUIRES(_mutex);
 
-  std::mutex _mutex;
-  Dictionary _content;                // guarded by _mutex
-  FileStamp _stamp;                   // guarded by _mutex: of the file that _content came from
-  std::string _problem;               // guarded by _mutex: the last one logged, until the file reads well again
-  std::vector<std::string> _remarks;  // guarded by _mutex: on what the file last held, logged
+  Mutex _mutex;
+  Dictionary _content GUARDED_BY(_mutex);
+  FileStamp _stamp GUARDED_BY(_mutex);                   // of the file that _content came from
+  std::string _problem GUARDED_BY(_mutex);               // the last one logged, until the file reads well again
+  std::vector<std::string> _remarks GUARDED_BY(_mutex);  // on what the file last held, logged
 };
 
 const Dictionary& LinuxDeviceProperties::State::current() {
@@ -125,13 +125,13 @@ void LinuxDeviceProperties::State::reject(const FileStamp& stamp, const std::str
 }
 
 std::optional<std::string> LinuxDeviceProperties::State::text(std::string_view key) {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   if (const std::string* text = current().text(key)) return *text;
   return std::nullopt;
 }
 
 std::optional<bool> LinuxDeviceProperties::State::boolean(std::string_view key) {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   const Value* value = current().find(key);
   if (value == nullptr) return std::nullopt;
   return value->boolValue();

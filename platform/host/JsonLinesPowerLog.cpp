@@ -45,7 +45,7 @@ JsonLinesPowerLog::JsonLinesPowerLog(std::string path, const Clock& clock, std::
 
 void JsonLinesPowerLog::registeredEvent(std::int32_t event, std::string_view sender, const Dictionary& record) {
   const std::string line = formatLine(event, sender, _clock.wallSeconds(), record);
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   const bool written = append(line);
   if (!written && !_failing) {
     PLATFORM_LOG(warning, "registeredEvent: cannot write to {}: {}", _path, errnoText(errno));

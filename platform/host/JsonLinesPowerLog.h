@@ -3,11 +3,11 @@
 #include <sys/types.h>
 
 #include <cstdint>
-#include <mutex>
 #include <string>
 #include <string_view>
 
 #include "platform/core/Clock.h"
+#include "platform/core/Mutex.h"
 #include "platform/core/UniqueFd.h"
 #include "platform/host/PowerLog.h"
 
@@ -28,20 +28,20 @@ class JsonLinesPowerLog final : public PowerLog {
   void registeredEvent(std::int32_t event, std::string_view sender, const Dictionary& record) override;
 
  private:
-  // Both under _mutex. False, with errno set, when there is no file to write to.
-  bool openFile();
-  bool append(std::string_view line);
+  // Both return false, with errno set, when there is no file to write to.
+  bool openFile() REQUIRES(_mutex);
+  bool append(std::string_view line) REQUIRES(_mutex);
 
   const Clock& _clock;
   const std::string _path;
   const std::string _olderPath;
   const std::size_t _generationBytes;
-  std::mutex _mutex;
-  UniqueFd _file;         // guarded by _mutex: kept open between records
-  dev_t _device = 0;      // guarded by _mutex: which file that is
-  ino_t _inode = 0;       // guarded by _mutex
-  std::size_t _size = 0;  // guarded by _mutex: of the open file
-  bool _failing = false;  // guarded by _mutex: the last record was lost
+  Mutex _mutex;
+  UniqueFd _file GUARDED_BY(_mutex);     // kept open between records
+  dev_t _device GUARDED_BY(_mutex) = 0;  // which file that is
+  ino_t _inode GUARDED_BY(_mutex) = 0;
+  std::size_t _size GUARDED_BY(_mutex) = 0;  // of the open file
+  bool _failing GUARDED_BY(_mutex) = false;  // the last record was lost
 };
 
 }  // namespace orvanta::platform

@@ -4,27 +4,48 @@
 
 #include <algorithm>
 #include <cstdlib>
-#include <mutex>
 #include <string>
+#include <utility>
+
+#include "platform/core/Mutex.h"
 
 namespace orvanta::platform {
 
 namespace {
 
-// What the service manager was told last. There is one service manager, however many KeepAlives there are.
-struct Told {
-  std::mutex mutex;
-  // Guarded by mutex.
-  std::uint64_t busy = 0;  // transactions under way
-  std::string text;
-
-  void tell(const char* before = "") {
-    ::sd_notify(0, (before + ("STATUS=" + std::string(busy > 0 ? "busy" : "idle") + text)).c_str());
+// What the service manager was told last. There is one service manager, however many KeepAlives there are. Thread-safe.
+class Told {
+ public:
+  void begin() {
+    const MutexLock lock(_mutex);
+    if (++_busy == 1) change();
   }
-  void change() {
-    text.clear();
+  void end() {
+    const MutexLock lock(_mutex);
+    if (_busy > 0 && --_busy == 0) change();
+  }
+  void ready() {
+    const MutexLock lock(_mutex);
+    tell("READY=1\n");
+  }
+  void setText(std::string text) {
+    const MutexLock lock(_mutex);
+    _text = std::move(text);
     tell();
   }
+
+ private:
+  void tell(const char* before = "") REQUIRES(_mutex) {
+    ::sd_notify(0, (before + ("STATUS=" + std::string(_busy > 0 ? "busy" : "idle") + _text)).c_str());
+  }
+  void change() REQUIRES(_mutex) {
+    _text.clear();
+    tell();
+  }
+
+  Mutex _mutex;
+  std::uint64_t _busy GUARDED_BY(_mutex) = 0;  // transactions under way
+  std::string _text GUARDED_BY(_mutex);
 };
 
 Told& told() {
@@ -36,30 +57,26 @@ Told& told() {
 
 void KeepAlive::begin() {
   ++_begun;
-  const std::lock_guard lock(told().mutex);
-  if (++told().busy == 1) told().change();
+  told().begin();
 }
 
 void KeepAlive::end() {
   ++_ended;
-  const std::lock_guard lock(told().mutex);
-  if (told().busy > 0 && --told().busy == 0) told().change();
+  told().end();
 }
 
 void KeepAlive::ready() {
-  const std::lock_guard lock(told().mutex);
-  told().tell("READY=1\n");
+  told().ready();
 }
 
 void KeepAlive::status(std::string_view text) {
-  const std::lock_guard lock(told().mutex);
-  told().text = text.empty() ? std::string() : "; " + std::string(text);
-  std::replace(told().text.begin(), told().text.end(), '\n', ' ');  // a line break would begin another variable
-  told().tell();
+  std::string line = text.empty() ? std::string() : "; " + std::string(text);
+  std::replace(line.begin(), line.end(), '\n', ' ');  // a line break would begin another variable
+  told().setText(std::move(line));
 }
 
 bool KeepAlive::isHeard() {
-  return std::getenv("NOTIFY_SOCKET") != nullptr;  // NOLINT(concurrency-mt-unsafe): nobody sets it
+  return std::getenv("NOTIFY_SOCKET") != nullptr;  // NOLINT(concurrency-mt-unsafe): the process never sets it
 }
 
 void KeepAlive::stopping() {

@@ -24,6 +24,22 @@ namespace {
 constexpr std::size_t kMaximumBytes = 16U << 20U;
 constexpr mode_t kNewFileMode = 0600;  // persistent identifiers are nobody else's business
 
+// Waits for the mutex in a BlockingScope: the thread that holds it may be waiting for a disk or another process.
+class SCOPED_CAPABILITY BlockingLock {
+ public:
+  explicit BlockingLock(Mutex& mutex) ACQUIRE(mutex) : _mutex(mutex) {
+    if (mutex.try_lock()) return;
+    const BlockingScope blocking;
+    mutex.lock();
+  }
+  ~BlockingLock() RELEASE() { _mutex.unlock(); }
+  BlockingLock(const BlockingLock&) = delete;
+  BlockingLock& operator=(const BlockingLock&) = delete;
+
+ private:
+  Mutex& _mutex;
+};
+
 bool writeAll(int fd, std::string_view bytes) {
   while (!bytes.empty()) {
     const ssize_t count = ::write(fd, bytes.data(), bytes.size());
@@ -60,23 +76,15 @@ class UserDefaults::DirectoryLock {
 UserDefaults::UserDefaults(std::string directory, std::string domain)
     : _directory(std::move(directory)), _fileName(std::move(domain) + ".plist"), _path(_directory + "/" + _fileName) {}
 
-std::unique_lock<std::mutex> UserDefaults::guard() {
-  std::unique_lock lock(_mutex, std::try_to_lock);
-  if (lock.owns_lock()) return lock;
-  const BlockingScope blocking;
-  lock.lock();
-  return lock;
-}
-
 std::optional<Value> UserDefaults::value(std::string_view key) {
-  const auto locked = guard();
+  const BlockingLock locked(_mutex);
   const Value* found = current().find(key);
   if (found == nullptr) return std::nullopt;
   return *found;
 }
 
 std::optional<std::string> UserDefaults::text(std::string_view key) {
-  const auto locked = guard();
+  const BlockingLock locked(_mutex);
   const Value* found = current().find(key);
   if (found == nullptr) return std::nullopt;
   if (const std::string* text = found->string()) return *text;
@@ -84,13 +92,13 @@ std::optional<std::string> UserDefaults::text(std::string_view key) {
 }
 
 Dictionary UserDefaults::all() {
-  const auto locked = guard();
+  const BlockingLock locked(_mutex);
   return current();
 }
 
 Result<bool> UserDefaults::set(std::string_view key, Value value) {
   const BlockingScope blocking;
-  const auto locked = guard();
+  const BlockingLock locked(_mutex);
   const auto lock = DirectoryLock::take(_directory);
   if (!lock) return Failure{lock.error()};
   if (const auto loaded = load(&*lock); !loaded) return Failure{loaded.error()};
@@ -99,7 +107,7 @@ Result<bool> UserDefaults::set(std::string_view key, Value value) {
 
 Value UserDefaults::storeIfAbsent(std::string_view key, Value fresh) {
   const BlockingScope blocking;
-  const auto locked = guard();
+  const BlockingLock locked(_mutex);
   std::string problem;
   if (const auto lock = DirectoryLock::take(_directory); !lock) {
     problem = lock.error();

@@ -1,12 +1,12 @@
 #pragma once
 
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
 #include <utility>
 
 #include "platform/core/FileStamp.h"
+#include "platform/core/Mutex.h"
 #include "platform/core/Result.h"
 #include "platform/core/Value.h"
 
@@ -42,26 +42,26 @@ class UserDefaults {
  private:
   class DirectoryLock;
 
-  // Waits in a BlockingScope: who has the lock may be waiting for a disk or another process.
-  std::unique_lock<std::mutex> guard();
   Value storeIfAbsent(std::string_view key, Value fresh);
-  // These are called under _mutex.
-  const Dictionary& current();
-  Result<void> load(const DirectoryLock* lock);
-  Result<void> keepAside(const FileStamp& stamp, const std::string& why);
-  Result<void> leaveInPlace(const FileStamp& stamp, const std::string& why, const std::string& obstacle);
-  Result<bool> change(const DirectoryLock& lock, std::string_view key, Value value);
-  Result<void> replaceFile(const DirectoryLock& lock, const Dictionary& content);
-  void logOnce(const std::string& problem);
+  const Dictionary& current() REQUIRES(_mutex);
+  Result<void> load(const DirectoryLock* lock) REQUIRES(_mutex);
+  Result<void> keepAside(const FileStamp& stamp, const std::string& why) REQUIRES(_mutex);
+  Result<void> leaveInPlace(const FileStamp& stamp, const std::string& why, const std::string& obstacle)
+      REQUIRES(_mutex);
+  Result<bool> change(const DirectoryLock& lock, std::string_view key, Value value) REQUIRES(_mutex);
+  Result<void> replaceFile(const DirectoryLock& lock, const Dictionary& content) REQUIRES(_mutex);
+  void logOnce(const std::string& problem) REQUIRES(_mutex);
 
+  // Constant after construction.
   const std::string _directory;
   const std::string _fileName;
   const std::string _path;
-  std::mutex _mutex;
-  Dictionary _cached;    // guarded by _mutex
-  FileStamp _stamp;      // guarded by _mutex: of the file that _cached came from
-  bool _loaded = false;  // guarded by _mutex
-  std::string _problem;  // guarded by _mutex: the last one logged, until the file reads well again
+
+  Mutex _mutex;
+  Dictionary _cached GUARDED_BY(_mutex);
+  FileStamp _stamp GUARDED_BY(_mutex);  // of the file that _cached came from
+  bool _loaded GUARDED_BY(_mutex) = false;
+  std::string _problem GUARDED_BY(_mutex);  // the last one logged, until the file reads well again
 };
 
 }  // namespace orvanta::platform

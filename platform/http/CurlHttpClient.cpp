@@ -6,7 +6,6 @@
 
 #include <algorithm>
 #include <chrono>
-#include <condition_variable>
 #include <system_error>
 #include <utility>
 
@@ -19,6 +18,13 @@ namespace orvanta::platform {
 namespace {
 
 constexpr std::chrono::milliseconds kLongestTimeout = std::chrono::hours(24 * 365);  // far from the clock's end
+
+// Where a thread in perform() waits for its answer.
+struct Awaited {
+  Mutex mutex;
+  Condition arrived;
+  std::optional<HttpResult> result GUARDED_BY(mutex);
+};
 
 Result<void> checkSendable(const HttpRequest& request) {
   if (request.method != "GET" && request.method != "POST") return Failure{"Unsupported method " + request.method};
@@ -55,23 +61,21 @@ void CurlHttpClient::start(const std::shared_ptr<HttpLane>& lane, HttpRequest re
 }
 
 HttpResult CurlHttpClient::perform(const std::shared_ptr<HttpLane>& lane, HttpRequest request) {
-  std::mutex mutex;
-  std::condition_variable arrived;
-  std::optional<HttpResult> result;  // guarded by mutex
+  Awaited awaited;
   auto pending = std::make_unique<PendingHttpRequest>();
   pending->request = std::move(request);
   pending->lane = std::static_pointer_cast<HttpLaneQueue>(lane);
   pending->blocking = true;
-  pending->completion = [&](HttpResult outcome) {
-    const std::lock_guard guard(mutex);
-    result = std::move(outcome);
-    arrived.notify_one();  // under the lock: once this thread goes on, none of this is there any more
+  pending->completion = [&awaited](HttpResult outcome) {
+    const MutexLock lock(awaited.mutex);
+    awaited.result = std::move(outcome);
+    awaited.arrived.notifyOne();  // under the lock: once this thread goes on, none of this is there any more
   };
   submit(std::move(pending));
   const BlockingScope scope;
-  std::unique_lock lock(mutex);
-  arrived.wait(lock, [&] { return result.has_value(); });
-  return std::move(*result);
+  MutexLock lock(awaited.mutex);
+  while (!awaited.result) awaited.arrived.wait(lock);
+  return std::move(*awaited.result);
 }
 
 void CurlHttpClient::submit(std::unique_ptr<PendingHttpRequest> pending) {
@@ -96,7 +100,7 @@ Result<void> CurlHttpClient::accept(std::unique_ptr<PendingHttpRequest>& pending
 
 Result<void> CurlHttpClient::ensureRunning() {
   if (_running.load(std::memory_order_acquire) != nullptr) return {};
-  const std::lock_guard guard(_threadMutex);
+  const MutexLock lock(_threadMutex);
   if (_loop || _shutDown) return {};  // after the shutdown the intake has the word
   // Takes milliseconds and megabytes, which a daemon without traffic does not need. Safe from several threads.
   if (curl_global_init(CURL_GLOBAL_DEFAULT) != CURLE_OK) return Failure{"The HTTP client cannot start"};
@@ -130,7 +134,7 @@ void CurlHttpClient::shutdown(std::chrono::milliseconds patience) {
   const BlockingScope scope;
   _intake.waitUntilEmpty(std::min(patience, kLongestTimeout));
   _intake.stop();
-  const std::lock_guard guard(_threadMutex);
+  const MutexLock lock(_threadMutex);
   _shutDown = true;
   if (!_thread.joinable()) return;
   _loop->wake();  // only here: before, a thread that was just starting could have gone to sleep unwoken

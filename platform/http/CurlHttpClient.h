@@ -2,9 +2,9 @@
 
 #include <atomic>
 #include <memory>
-#include <mutex>
 #include <thread>
 
+#include "platform/core/Mutex.h"
 #include "platform/core/Result.h"
 #include "platform/http/HttpClient.h"
 #include "platform/http/HttpIntake.h"
@@ -40,11 +40,11 @@ class CurlHttpClient final : public HttpClient {
   const HttpClientOptions _options;
 
   HttpIntake _intake;
-  std::mutex _threadMutex;                  // guards starting and joining the thread
-  std::unique_ptr<HttpTransferLoop> _loop;  // made under _threadMutex, kept until destruction
-  std::thread _thread;                      // guarded by _threadMutex
-  bool _shutDown = false;                   // guarded by _threadMutex
-  std::atomic<HttpTransferLoop*> _running{nullptr};
+  Mutex _threadMutex;                                                // for starting and joining the thread
+  std::unique_ptr<HttpTransferLoop> _loop GUARDED_BY(_threadMutex);  // once made, kept until destruction
+  std::thread _thread GUARDED_BY(_threadMutex);
+  bool _shutDown GUARDED_BY(_threadMutex) = false;
+  std::atomic<HttpTransferLoop*> _running{nullptr};  // _loop, for callers that hold no lock
 };
 
 }  // namespace orvanta::platform

@@ -21,7 +21,7 @@ bool fits(std::size_t charge, std::size_t used, std::size_t limit) {
 Result<bool> HttpIntake::submit(std::unique_ptr<PendingHttpRequest>& request) {
   HttpLaneQueue& lane = *request->lane;
   const std::size_t charge = lane.isLimited() ? request->request.body.size() + kChargePerRequest : 0;
-  const std::lock_guard guard(_mutex);
+  const MutexLock lock(_mutex);
   if (_closed) return Failure{"The HTTP client has been shut down"};
   if (_abortBlocking && request->blocking) return Failure{"Aborted: the process is ending"};
   if (lane.isLimited() && !fits(charge, lane.charged, _limits.laneBytes)) {
@@ -43,46 +43,49 @@ Result<bool> HttpIntake::submit(std::unique_ptr<PendingHttpRequest>& request) {
 }
 
 HttpIntake::Orders HttpIntake::take() {
-  const std::lock_guard guard(_mutex);
+  const MutexLock lock(_mutex);
   _asleep = false;
   return {std::exchange(_submitted, {}), _abortBlocking, _stop};
 }
 
 bool HttpIntake::mayFallAsleep() {
-  const std::lock_guard guard(_mutex);
+  const MutexLock lock(_mutex);
   _asleep = _submitted.empty();
   return _asleep;
 }
 
 void HttpIntake::release(const PendingHttpRequest& request) {
-  const std::lock_guard guard(_mutex);
+  const MutexLock lock(_mutex);
   request.lane->charged -= request.charge;
   --request.lane->unfinished;
   _charged -= request.charge;
 }
 
 void HttpIntake::ended() {
-  const std::lock_guard guard(_mutex);
-  if (--_unfinished == 0) _empty.notify_all();
+  const MutexLock lock(_mutex);
+  if (--_unfinished == 0) _empty.notifyAll();
 }
 
 void HttpIntake::abortBlocking() {
-  const std::lock_guard guard(_mutex);
+  const MutexLock lock(_mutex);
   _abortBlocking = true;
 }
 
 void HttpIntake::close() {
-  const std::lock_guard guard(_mutex);
+  const MutexLock lock(_mutex);
   _closed = true;
 }
 
-bool HttpIntake::waitUntilEmpty(std::chrono::milliseconds patience) {
-  std::unique_lock lock(_mutex);
-  return _empty.wait_for(lock, patience, [&] { return _unfinished == 0; });
+bool HttpIntake::waitUntilEmpty(std::chrono::milliseconds timeout) {
+  const auto deadline = std::chrono::steady_clock::now() + timeout;
+  MutexLock lock(_mutex);
+  while (_unfinished > 0 && _empty.waitUntil(lock, deadline)) {
+  }
+  return _unfinished == 0;
 }
 
 void HttpIntake::stop() {
-  const std::lock_guard guard(_mutex);
+  const MutexLock lock(_mutex);
   _closed = true;
   _stop = true;
 }

@@ -1,12 +1,11 @@
 #pragma once
 
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <memory>
-#include <mutex>
 #include <vector>
 
+#include "platform/core/Mutex.h"
 #include "platform/core/Result.h"
 #include "platform/http/HttpClient.h"
 #include "platform/http/PendingHttpRequest.h"
@@ -42,22 +41,21 @@ class HttpIntake {
   // Takes nothing more in.
   void close();
   // Whether all that was taken in ended in time.
-  bool waitUntilEmpty(std::chrono::milliseconds patience);
+  bool waitUntilEmpty(std::chrono::milliseconds timeout);
   void stop();
 
  private:
   const HttpLimits& _limits;
 
-  std::mutex _mutex;
-  std::condition_variable _empty;
-  // Guarded by _mutex.
-  std::vector<std::unique_ptr<PendingHttpRequest>> _submitted;
-  std::size_t _charged = 0;     // of all limited lanes
-  std::size_t _unfinished = 0;  // taken in and not ended
-  bool _abortBlocking = false;
-  bool _closed = false;
-  bool _asleep = false;
-  bool _stop = false;
+  Mutex _mutex;
+  Condition _empty;
+  std::vector<std::unique_ptr<PendingHttpRequest>> _submitted GUARDED_BY(_mutex);
+  std::size_t _charged GUARDED_BY(_mutex) = 0;     // of all limited lanes
+  std::size_t _unfinished GUARDED_BY(_mutex) = 0;  // taken in and not ended
+  bool _abortBlocking GUARDED_BY(_mutex) = false;
+  bool _closed GUARDED_BY(_mutex) = false;
+  bool _asleep GUARDED_BY(_mutex) = false;
+  bool _stop GUARDED_BY(_mutex) = false;
 };
 
 }  // namespace orvanta::platform

@@ -39,7 +39,7 @@ bool SocketOutbox::append(std::span<const std::uint8_t> message, Urgency urgency
   std::shared_ptr<Observer> tell;
   bool taken = true;
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     if (_state != State::open) return false;
     if (urgency == Urgency::droppable && waitingBytes() + message.size() > _maximumDroppable) return false;
 
@@ -70,7 +70,7 @@ bool SocketOutbox::append(std::span<const std::uint8_t> message, Urgency urgency
 }
 
 void SocketOutbox::beginGathering() {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   _gatherer = std::this_thread::get_id();
   if (_bytes.capacity() == 0) _bytes.swap(tSpare);
 }
@@ -78,7 +78,7 @@ void SocketOutbox::beginGathering() {
 void SocketOutbox::endGathering() {
   std::shared_ptr<Observer> tell;
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     const Sent::Kind last = mayWrite() ? writeWaiting() : Sent::Kind::some;
     if (_bytes.empty() && _bytes.capacity() <= 2 * kGatherAtMost) _bytes.swap(tSpare);
     _gatherer = {};
@@ -90,7 +90,7 @@ void SocketOutbox::endGathering() {
 void SocketOutbox::writeGathered() {
   std::shared_ptr<Observer> tell;
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     if (!mayWrite()) return;
     tell = settle(writeWaiting());
   }
@@ -98,17 +98,17 @@ void SocketOutbox::writeGathered() {
 }
 
 bool SocketOutbox::isClosed() const {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   return _state != State::open;
 }
 
 bool SocketOutbox::broken() const {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   return _state == State::broken;
 }
 
 bool SocketOutbox::awaitAtMost(std::size_t limit) {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   if (!isUsable() || waitingBytes() <= limit) return true;
   _awaited = limit;
   return false;
@@ -117,7 +117,7 @@ bool SocketOutbox::awaitAtMost(std::size_t limit) {
 void SocketOutbox::finish() {
   std::shared_ptr<Observer> tell;
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     if (_state != State::open) return;
     _state = State::finishing;
     tell = settle(mayWrite() ? writeWaiting() : Sent::Kind::some);
@@ -126,7 +126,7 @@ void SocketOutbox::finish() {
 }
 
 void SocketOutbox::close() {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   becomeUseless(State::closed);
   _awaited.reset();
   _pending.store(0, std::memory_order_relaxed);
@@ -208,7 +208,7 @@ void SocketOutbox::startWaiting() {
 
 void SocketOutbox::waitUntilWritable(const std::shared_ptr<void>& owner) {
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     if (!isUsable()) return;
     if (!_writer.socket) _writer.socket.reset(::fcntl(_socket, F_DUPFD_CLOEXEC, 0));
   }
@@ -231,7 +231,7 @@ void SocketOutbox::writeOn(const std::shared_ptr<void>& owner) {
   Sent::Kind last = Sent::Kind::some;
   bool more = false;
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     if (isUsable()) last = writeWaiting();
     more = isUsable() && last != Sent::Kind::broken && waitingBytes() > 0;
     _waiting = more;

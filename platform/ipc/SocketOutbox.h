@@ -4,12 +4,12 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <span>
 #include <thread>
 #include <vector>
 
+#include "platform/core/Mutex.h"
 #include "platform/core/UniqueFd.h"
 #include "platform/ipc/Connection.h"
 #include "platform/ipc/SocketIo.h"
@@ -66,21 +66,21 @@ class SocketOutbox final : public Outbox, public std::enable_shared_from_this<So
     UniqueFd descriptor;
   };
   bool append(std::span<const std::uint8_t> message, Urgency urgency, UniqueFd descriptor);
-  // All below with _mutex held. Writing is whose turn it is: the waiter's while somebody waits, else everybody's.
-  bool mayWrite() const { return isUsable() && !_waiting; }
-  bool isUsable() const { return _state == State::open || _state == State::finishing; }
-  bool isGathering() const { return _gatherer == std::this_thread::get_id(); }
-  std::size_t waitingBytes() const { return _bytes.size() - _start; }
+  // While a job waits for the socket to become writable, only that job writes; otherwise every caller does.
+  bool mayWrite() const REQUIRES(_mutex) { return isUsable() && !_waiting; }
+  bool isUsable() const REQUIRES(_mutex) { return _state == State::open || _state == State::finishing; }
+  bool isGathering() const REQUIRES(_mutex) { return _gatherer == std::this_thread::get_id(); }
+  std::size_t waitingBytes() const REQUIRES(_mutex) { return _bytes.size() - _start; }
   // Until nothing waits or the socket takes no more for now, which the result tells.
-  Sent::Kind writeWaiting();
-  Sent writeSome();
-  void keep(std::span<const std::uint8_t> rest);
-  void dropFront(std::size_t count);
-  void becomeUseless(State state);
+  Sent::Kind writeWaiting() REQUIRES(_mutex);
+  Sent writeSome() REQUIRES(_mutex);
+  void keep(std::span<const std::uint8_t> rest) REQUIRES(_mutex);
+  void dropFront(std::size_t count) REQUIRES(_mutex);
+  void becomeUseless(State state) REQUIRES(_mutex);
   // Ends every operation: what follows from how the last write went. Whom it returns is to be told once the lock is
   // released.
-  [[nodiscard]] std::shared_ptr<Observer> settle(Sent::Kind last);
-  void startWaiting();
+  [[nodiscard]] std::shared_ptr<Observer> settle(Sent::Kind last) REQUIRES(_mutex);
+  void startWaiting() REQUIRES(_mutex);
 
   // On _writerQueue.
   void waitUntilWritable(const std::shared_ptr<void>& owner);
@@ -95,18 +95,19 @@ class SocketOutbox final : public Outbox, public std::enable_shared_from_this<So
 
   std::atomic<std::size_t> _pending{0};  // written under _mutex
 
-  mutable std::mutex _mutex;
-  // Guarded by _mutex.
-  State _state = State::open;
-  int _socket;                       // the connection's; -1 once closed
-  std::vector<std::uint8_t> _bytes;  // from _start on: not yet taken by the socket
-  std::size_t _start = 0;
-  std::uint64_t _sent = 0;               // bytes that the socket has taken since the beginning
-  std::vector<Attachment> _attachments;  // in order
-  std::thread::id _gatherer;             // the thread whose messages are gathered
-  std::optional<std::size_t> _awaited;
-  bool _waiting = false;                    // somebody waits for the socket to become writable
-  std::shared_ptr<WorkQueue> _writerQueue;  // made when first needed
+  mutable Mutex _mutex;
+  State _state GUARDED_BY(_mutex) = State::open;
+  int _socket GUARDED_BY(_mutex);                       // the connection's; -1 once closed
+  std::vector<std::uint8_t> _bytes GUARDED_BY(_mutex);  // from _start on: not yet taken by the socket
+  std::size_t _start GUARDED_BY(_mutex) = 0;
+  std::uint64_t _sent GUARDED_BY(_mutex) = 0;               // bytes that the socket has taken since the beginning
+  std::vector<Attachment> _attachments GUARDED_BY(_mutex);  // in order
+  std::thread::id _gatherer GUARDED_BY(_mutex);             // the thread whose messages are gathered
+  std::optional<std::size_t> _awaited GUARDED_BY(_mutex);
+  bool _waiting GUARDED_BY(_mutex) = false;  // a job waits for the socket to become writable
+
+  // Made under _mutex when first needed, and never changed afterwards: its own jobs read it without the lock.
+  std::shared_ptr<WorkQueue> _writerQueue;
 
   // Owned by _writerQueue. The watch has a descriptor of its own: once watched for writing, a descriptor reports
   // whenever its peer reads, and the connection's should not; it lives only while something waits.

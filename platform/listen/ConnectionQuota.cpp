@@ -1,16 +1,17 @@
 #include "platform/listen/ConnectionQuota.h"
 
-#include <mutex>
 #include <unordered_map>
+
+#include "platform/core/Mutex.h"
 
 namespace orvanta::platform {
 
 struct ConnectionQuota::Counts {
-  std::mutex mutex;
-  std::unordered_map<uid_t, std::size_t> perUser;  // guarded by mutex; no zeros
+  Mutex mutex;
+  std::unordered_map<uid_t, std::size_t> perUser GUARDED_BY(mutex);  // no zeros
 
   void release(uid_t user) {
-    const std::lock_guard lock(mutex);
+    const MutexLock lock(mutex);
     const auto place = perUser.find(user);
     if (--place->second == 0) perUser.erase(place);
   }
@@ -21,7 +22,7 @@ ConnectionQuota::ConnectionQuota(std::size_t maximumPerUser)
 
 std::shared_ptr<void> ConnectionQuota::take(uid_t user) {
   {
-    const std::lock_guard lock(_counts->mutex);
+    const MutexLock lock(_counts->mutex);
     std::size_t& count = _counts->perUser[user];
     if (count >= _maximum) return nullptr;
     ++count;

@@ -162,7 +162,7 @@ bool Entitlements::isGranted(const PeerIdentity* peer, std::string_view entitlem
 // Anybody may connect as often as he likes: that must not fill the log.
 void Entitlements::tell(const std::string& path, const std::string& problem) {
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     std::string& told = _problems[path];
     if (told == problem) return;
     told = problem;

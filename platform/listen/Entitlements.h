@@ -1,10 +1,10 @@
 #pragma once
 
 #include <map>
-#include <mutex>
 #include <string>
 #include <string_view>
 
+#include "platform/core/Mutex.h"
 #include "platform/core/Value.h"
 #include "platform/listen/PeerIdentity.h"
 
@@ -30,8 +30,8 @@ class Entitlements {
   void tell(const std::string& path, const std::string& problem);
 
   const std::string _directory;
-  std::mutex _mutex;
-  std::map<std::string, std::string> _problems;  // guarded by _mutex: by file, what was logged last
+  Mutex _mutex;
+  std::map<std::string, std::string> _problems GUARDED_BY(_mutex);  // by file: the last one logged
 };
 
 }  // namespace orvanta::platform

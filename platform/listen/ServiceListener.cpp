@@ -99,7 +99,7 @@ void Acceptor::admit(UniqueFd socket) {
 
 void Acceptor::offer(UniqueFd socket, PeerIdentity peer, std::shared_ptr<void> place) {
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     if (_stopped) return;
     ++_offering;
   }
@@ -109,29 +109,33 @@ void Acceptor::offer(UniqueFd socket, PeerIdentity peer, std::shared_ptr<void> p
   connection->hold(std::move(place));
   if (!_handler({connection, std::move(peer)})) connection->cancel(std::chrono::milliseconds(0));
 
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   --_offering;
-  _idle.notify_all();
+  _idle.notifyAll();
 }
 
 bool Acceptor::stop(std::optional<std::chrono::seconds> limit) {
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     if (!_stopped) {
       _stopped = true;
       _socket.removeFile();
       _queue->post([self = shared_from_this()] { self->close(); });
     }
   }
-  std::unique_lock lock(_mutex);
-  const auto ended = [&] { return _offering == 0; };
-  if (ended()) return true;
+  MutexLock lock(_mutex);
+  if (_offering == 0) return true;
   lock.unlock();
   const BlockingScope blocking;
   lock.lock();
-  if (limit) return _idle.wait_for(lock, *limit, ended);
-  _idle.wait(lock, ended);
-  return true;
+  if (!limit) {
+    while (_offering > 0) _idle.wait(lock);
+    return true;
+  }
+  const auto deadline = std::chrono::steady_clock::now() + *limit;
+  while (_offering > 0 && _idle.waitUntil(lock, deadline)) {
+  }
+  return _offering == 0;
 }
 
 void Acceptor::close() {

@@ -2,12 +2,11 @@
 
 #include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <memory>
-#include <mutex>
 #include <optional>
 
+#include "platform/core/Mutex.h"
 #include "platform/listen/ConnectionQuota.h"
 #include "platform/listen/Listener.h"
 #include "platform/listen/ServiceSocket.h"
@@ -53,11 +52,10 @@ class Acceptor final : public std::enable_shared_from_this<Acceptor> {
   std::optional<Instant> _pauseLogged;
   std::optional<Instant> _refusalLogged;
 
-  std::mutex _mutex;
-  std::condition_variable _idle;
-  // Guarded by _mutex.
-  bool _stopped = false;
-  std::size_t _offering = 0;  // handlers under way
+  Mutex _mutex;
+  Condition _idle;
+  bool _stopped GUARDED_BY(_mutex) = false;
+  std::size_t _offering GUARDED_BY(_mutex) = 0;  // handlers under way
 };
 
 // The Listener on a service socket.

@@ -14,7 +14,7 @@ ComputeThreads::ComputeThreads(JobCount& count, std::size_t threads, std::size_t
 
 void ComputeThreads::start() {
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     _started = true;
     if (_line.empty()) return;
   }
@@ -30,14 +30,14 @@ void ComputeThreads::serve() {
 void ComputeThreads::stop() {
   _threads.closeDown();
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     _stopped = true;
   }
-  _changed.notify_all();
+  _changed.notifyAll();
   _threads.join();
   std::vector<std::deque<Job>> dropped;  // destroyed without the lock, since what they own may post
   std::deque<std::shared_ptr<ComputeQueue>> line;
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   line.swap(_line);
   dropped.reserve(line.size());
   for (const auto& queue : line) dropped.push_back(std::exchange(queue->_jobs, {}));
@@ -45,13 +45,13 @@ void ComputeThreads::stop() {
 
 void ComputeThreads::post(ComputeQueue& queue, Job job) {
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     if (_stopped) return;  // the parameter goes after the lock
     _count.posted();
     queue._jobs.push_back(std::move(job));
     if (!std::exchange(queue._inLine, true)) {
       _line.push_back(queue.shared_from_this());
-      _changed.notify_one();
+      _changed.notifyOne();
     }
     if (!_started) return;
   }
@@ -59,33 +59,35 @@ void ComputeThreads::post(ComputeQueue& queue, Job job) {
 }
 
 void ComputeThreads::runUntilStopped() {
-  std::unique_lock lock(_mutex);
+  MutexLock lock(_mutex);
   for (;;) {
-    _changed.wait(lock, [this] { return _stopped || !_line.empty(); });
+    while (!_stopped && _line.empty()) _changed.wait(lock);
     if (_stopped) return;
-    serveFirst(lock);
+    serveFirst();
   }
 }
 
-bool ComputeThreads::runOne(std::chrono::milliseconds patience) {
-  std::unique_lock lock(_mutex);
-  _changed.wait_for(lock, patience, [this] { return _stopped || !_line.empty(); });
+bool ComputeThreads::runOne(std::chrono::milliseconds timeout) {
+  const auto deadline = std::chrono::steady_clock::now() + timeout;
+  MutexLock lock(_mutex);
+  while (!_stopped && _line.empty() && _changed.waitUntil(lock, deadline)) {
+  }
   if (_stopped || _line.empty()) return false;
-  serveFirst(lock);
+  serveFirst();
   return true;
 }
 
 // One job, so that queues take turns.
-void ComputeThreads::serveFirst(std::unique_lock<std::mutex>& lock) {
+void ComputeThreads::serveFirst() {
   const std::shared_ptr<ComputeQueue> queue = std::move(_line.front());
   _line.pop_front();
   Job job = std::move(queue->_jobs.front());
   queue->_jobs.pop_front();
-  lock.unlock();
+  _mutex.unlock();
   job();
   job.reset();
   _count.ran();
-  lock.lock();
+  _mutex.lock();
   queue->_inLine = !queue->_jobs.empty();
   if (queue->_inLine) _line.push_back(queue);
 }

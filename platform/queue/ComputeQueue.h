@@ -1,12 +1,11 @@
 #pragma once
 
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <deque>
 #include <memory>
-#include <mutex>
 
+#include "platform/core/Mutex.h"
 #include "platform/core/UniqueFunction.h"
 #include "platform/queue/JobCount.h"
 #include "platform/queue/PoolThreads.h"
@@ -35,7 +34,7 @@ class ComputeQueue final : public std::enable_shared_from_this<ComputeQueue> {
 
   const std::shared_ptr<ComputeThreads> _threads;
 
-  // Guarded by the threads' mutex.
+  // Guarded by the threads' mutex, which the annotations cannot name from here; touched by ComputeThreads alone.
   std::deque<Job> _jobs;
   bool _inLine = false;  // in the line, or served by a thread
 };
@@ -57,19 +56,20 @@ class ComputeThreads final : PoolThreads::Loop {
 
   void post(ComputeQueue& queue, Job job);
   void runUntilStopped() override;
-  bool runOne(std::chrono::milliseconds patience) override;
+  bool runOne(std::chrono::milliseconds timeout) override;
   // Starts the threads unless they run. When the system has none to give, the caller's does the work.
   void serve();
-  void serveFirst(std::unique_lock<std::mutex>& lock);
+  // Releases the mutex while the job runs.
+  void serveFirst() REQUIRES(_mutex);
 
   JobCount& _count;
 
-  std::mutex _mutex;
-  std::condition_variable _changed;
-  // Guarded by _mutex.
-  std::deque<std::shared_ptr<ComputeQueue>> _line;  // with jobs and not being served, the longest waiting first
-  bool _started = false;
-  bool _stopped = false;
+  Mutex _mutex;
+  Condition _changed;
+  // Queues with jobs that are not being served, the longest waiting first.
+  std::deque<std::shared_ptr<ComputeQueue>> _line GUARDED_BY(_mutex);
+  bool _started GUARDED_BY(_mutex) = false;
+  bool _stopped GUARDED_BY(_mutex) = false;
 
   PoolThreads _threads;
 };

@@ -2,9 +2,9 @@
 
 #include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
-#include <mutex>
+
+#include "platform/core/Mutex.h"
 
 namespace orvanta::platform {
 
@@ -15,13 +15,16 @@ class JobCount {
   void ran() {
     if (_jobs.fetch_sub(1) != 1) return;
     if (_waiting.load() == 0) return;
-    const std::lock_guard lock(_mutex);
-    _none.notify_all();
+    const MutexLock lock(_mutex);
+    _none.notifyAll();
   }
-  bool waitForNone(std::chrono::milliseconds patience) {
-    std::unique_lock lock(_mutex);
+  // Returns false when jobs were left at the end of `timeout`.
+  bool waitForNone(std::chrono::milliseconds timeout) {
+    const auto deadline = std::chrono::steady_clock::now() + timeout;
+    MutexLock lock(_mutex);
     ++_waiting;
-    const bool none = _none.wait_for(lock, patience, [this] { return _jobs.load() == 0; });
+    bool none = _jobs.load() == 0;
+    for (bool inTime = true; !none && inTime; none = _jobs.load() == 0) inTime = _none.waitUntil(lock, deadline);
     --_waiting;
     return none;
   }
@@ -29,8 +32,8 @@ class JobCount {
  private:
   std::atomic<std::size_t> _jobs{0};
   std::atomic<std::size_t> _waiting{0};
-  std::mutex _mutex;
-  std::condition_variable _none;
+  Mutex _mutex;
+  Condition _none;  // waited for and notified under _mutex, so that no notification is lost
 };
 
 }  // namespace orvanta::platform

@@ -25,7 +25,7 @@ PoolThreads* PoolThreads::current() {
 }
 
 bool PoolThreads::start() {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   if (_started || _closed) return true;
   for (std::size_t i = 0; i < _wanted && launch(false); ++i) _started = true;
   return _started;
@@ -64,12 +64,14 @@ bool PoolThreads::superfluous() const {
 }
 
 bool PoolThreads::stayAside() {
-  std::unique_lock lock(_mutex);
+  MutexLock lock(_mutex);
   if (_closed) return false;  // join() takes it from here
   if (!superfluous()) return true;
   --_running;
   ++_aside;
-  _needed.wait_for(lock, kLinger, [this] { return _closed || _calledBack > 0; });
+  const auto deadline = std::chrono::steady_clock::now() + kLinger;
+  while (!_closed && _calledBack == 0 && _needed.waitUntil(lock, deadline)) {
+  }
   if (_calledBack > 0) {
     --_calledBack;
     return !_closed;
@@ -88,44 +90,44 @@ void PoolThreads::retire() {
 }
 
 void PoolThreads::closeDown() {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   _closed = true;
-  _needed.notify_all();
+  _needed.notifyAll();
 }
 
 void PoolThreads::join() {
   std::list<std::thread> threads;
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     threads.swap(_threads);
     if (_retired.joinable()) threads.push_back(std::move(_retired));
   }
   for (std::thread& thread : threads) thread.join();
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   _running -= std::min(_running, threads.size());
 }
 
 std::size_t PoolThreads::count() const {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   return _running;
 }
 
 void PoolThreads::blockingBegins() {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   ++_blocked;
   if (_closed || _running - _blocked >= _wanted || _running >= _maximum) return;
   if (_aside > 0) {
     --_aside;
     ++_calledBack;
     ++_running;
-    _needed.notify_one();
+    _needed.notifyOne();
     return;
   }
   launch(true);
 }
 
 void PoolThreads::blockingEnds() {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   --_blocked;
 }
 

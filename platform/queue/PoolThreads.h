@@ -1,11 +1,11 @@
 #pragma once
 
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <list>
-#include <mutex>
 #include <thread>
+
+#include "platform/core/Mutex.h"
 
 namespace orvanta::platform {
 
@@ -49,12 +49,13 @@ class PoolThreads {
   static PoolThreads* current();
 
  private:
-  bool launch(bool extra);   // with _mutex held; whether the system had a thread to give
-  bool superfluous() const;  // with _mutex held
+  // Returns false when the system has no thread to give.
+  bool launch(bool extra) REQUIRES(_mutex);
+  bool superfluous() const REQUIRES(_mutex);
   void serveAsExtra();
   // Whether the calling extra thread has to go on; returns when it is needed, or is to end.
   bool stayAside();
-  void retire();  // with _mutex held
+  void retire() REQUIRES(_mutex);
 
   // Constant after construction.
   Loop& _loop;
@@ -62,17 +63,16 @@ class PoolThreads {
   const std::size_t _wanted;
   const std::size_t _maximum;
 
-  mutable std::mutex _mutex;
-  std::condition_variable _needed;
-  // Guarded by _mutex.
-  std::list<std::thread> _threads;
-  std::thread _retired;      // ended or about to, joined by whoever comes next
-  std::size_t _running = 0;  // those called back and not yet awake included
-  std::size_t _blocked = 0;
-  std::size_t _aside = 0;
-  std::size_t _calledBack = 0;
-  bool _started = false;
-  bool _closed = false;
+  mutable Mutex _mutex;
+  Condition _needed;
+  std::list<std::thread> _threads GUARDED_BY(_mutex);
+  std::thread _retired GUARDED_BY(_mutex);      // ended or about to; the next one to retire joins it
+  std::size_t _running GUARDED_BY(_mutex) = 0;  // those called back and not yet awake included
+  std::size_t _blocked GUARDED_BY(_mutex) = 0;
+  std::size_t _aside GUARDED_BY(_mutex) = 0;
+  std::size_t _calledBack GUARDED_BY(_mutex) = 0;
+  bool _started GUARDED_BY(_mutex) = false;
+  bool _closed GUARDED_BY(_mutex) = false;
 };
 
 }  // namespace orvanta::platform

@@ -8,11 +8,11 @@
 #include <asio/steady_timer.hpp>
 #include <asio/strand.hpp>
 #include <cstdint>
-#include <mutex>
 #include <stdexcept>
 #include <utility>
 
 #include "platform/core/Log.h"
+#include "platform/core/Mutex.h"
 #include "platform/queue/JobCount.h"
 #include "platform/queue/PoolThreads.h"
 
@@ -27,9 +27,9 @@ struct WorkPool::Implementation final : PoolThreads::Loop {
   void runUntilStopped() override { io.run(); }
   bool runOne(std::chrono::milliseconds patience) override { return io.run_one_for(patience) > 0; }
 
-  JobCount jobs;         // outlives the jobs that count down here
-  std::mutex stopMutex;  // whoever calls stop() returns only when the threads are gone
-  asio::io_context io;   // goes after `threads`, with the jobs that never ran
+  JobCount jobs;        // outlives the jobs that count down here
+  Mutex stopMutex;      // every caller of stop() returns only when the threads are gone
+  asio::io_context io;  // goes after `threads`, with the jobs that never ran
   asio::executor_work_guard<asio::io_context::executor_type> work;
   PoolThreads threads;
   const std::shared_ptr<ComputeThreads> compute;
@@ -185,7 +185,7 @@ void WorkPool::start() {
 }
 
 void WorkPool::stop() {
-  const std::lock_guard lock(_implementation->stopMutex);
+  const MutexLock lock(_implementation->stopMutex);
   _implementation->threads.closeDown();
   _implementation->io.stop();
   _implementation->threads.join();
