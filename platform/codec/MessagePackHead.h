@@ -17,7 +17,7 @@ struct MessagePackHead {
   enum class Kind : std::uint8_t {
     nil,
     boolean,
-    unsignedInteger,  // not negative, in whichever form
+    unsignedInteger,  // not negative, in any form
     integer,          // negative; `argument` holds the two's complement
     real,             // `argument` holds the bits
     shortReal,        // float32, likewise

@@ -13,11 +13,11 @@
 
 namespace orvanta::platform {
 
-// Reads MessagePack out of one byte range, value by value, within limits. Used on the stack of whoever has the bytes.
+// Reads MessagePack out of one byte range, value by value, within limits. Lives on the stack of the function that has the bytes.
 //
-// Every operation returns whether it could; after a false it is of no more use. Then either the bytes end too early
-// (`failure()` is empty) or they break a rule or limit. What is well formed but no value that we take (an unknown
-// extension, a duplicate key, …) does not stop the reading: the first such thing is noted in `refusal()`.
+// Every operation returns whether it succeeded; after a false the reader is of no more use. Then either the bytes end
+// too early (`failure()` is empty) or they break a rule or limit. A well-formed value that is not accepted (an unknown
+// extension, a duplicate key, …) does not stop the reading: the first one is noted in `refusal()`.
 class MessagePackReader {
  public:
   MessagePackReader(std::span<const std::uint8_t> bytes, const MessagePackLimits& limits)

@@ -33,8 +33,8 @@ Result<std::vector<std::uint8_t>> writeBinaryPropertyList(const Value& value);
 Result<Value> readPropertyListFile(const std::string& path, const PropertyListLimits& limits = {});
 
 std::string encodeBase64(std::span<const std::uint8_t> bytes);
-// Skips characters outside the alphabet, as property lists and storebags ask; null when what is left is no base64
-// (a lone trailing character, or text behind the padding).
+// Skips characters outside the alphabet, as property lists and storebags ask; nullopt when the rest is not
+// base64 (a lone trailing character, or text behind the padding).
 std::optional<std::vector<std::uint8_t>> decodeBase64(std::string_view text);
 
 }  // namespace orvanta::platform

@@ -14,17 +14,17 @@ namespace orvanta::platform {
 struct FileStamp {
   bool exists = false;
   // False when the file had changed so shortly before the stamp was taken that one more change, within the granularity
-  // of the file system's times, could leave the same stamp: such a stamp says nothing later on.
+  // of the file system's times, could leave the same stamp: such a stamp proves nothing later.
   bool settled = false;
   dev_t device = 0;
   ino_t inode = 0;
   off_t size = 0;
   timespec modified{};
-  timespec changed{};  // of the inode; unlike `modified` nobody can set it back
+  timespec changed{};  // of the inode; unlike `modified` it cannot be set back
 
   static FileStamp of(const std::string& path);
   static FileStamp of(int fd);
-  // Whether a file that had this stamp and now has `now` is certain to have the same content.
+  // Returns whether a file that had this stamp, and now has `now`, is certain to have the same content.
   bool stillHolds(const FileStamp& now) const;
 };
 
@@ -33,7 +33,7 @@ struct StampedContent {
   std::string bytes;
 };
 
-// Reads a whole regular file. A missing file is no failure: its stamp says so.
+// Reads a whole regular file. A missing file is not a failure: its stamp says so.
 Result<StampedContent> readStamped(const std::string& path, std::size_t maximumBytes);
 
 }  // namespace orvanta::platform

@@ -6,11 +6,11 @@
 
 namespace orvanta::platform {
 
-// Whether `text` is UTF-8 throughout: no overlong forms, no surrogates, nothing above U+10FFFF.
+// Returns whether `text` is UTF-8 throughout: no overlong forms, no surrogates, nothing above U+10FFFF.
 bool isValidUtf8(std::string_view text);
 
 // The first character of a text that is not empty: its bytes, or how many bytes are malformed together (what a decoder
-// replaces by one U+FFFD).
+// replaces with one U+FFFD).
 struct Utf8Character {
   char32_t codePoint = 0;
   std::size_t length = 1;

@@ -38,7 +38,7 @@ class Dictionary {
 
   Dictionary();
   Dictionary(std::initializer_list<Entry> entries);  // on equal keys the later entry wins
-  // Takes entries in any order. Null, with nothing taken, when a key occurs twice.
+  // Takes entries in any order. Returns nullopt, and takes nothing, when a key occurs twice.
   static std::optional<Dictionary> fromUniqueEntries(std::vector<Entry>&& entries);
   Dictionary(const Dictionary&);
   Dictionary(Dictionary&&) noexcept;
@@ -49,12 +49,12 @@ class Dictionary {
   const Value* find(std::string_view key) const;  // null when absent
   Value* find(std::string_view key);
   bool contains(std::string_view key) const { return find(key) != nullptr; }
-  // The value when it is of that type; null when it is absent or of another.
+  // Null when the value is absent or of another type.
   const std::string* text(std::string_view key) const;
   const Array* array(std::string_view key) const;
   const Dictionary* dictionary(std::string_view key) const;
   void set(std::string_view key, Value value);  // replaces an earlier value
-  bool erase(std::string_view key);             // whether the key was there
+  bool erase(std::string_view key);             // returns whether the key was there
   void merge(const Dictionary& other);          // other's values win on equal keys
 
   std::size_t size() const;
@@ -107,7 +107,7 @@ class Value {
   }
   bool isNumber() const { return isBool() || isInteger() || std::holds_alternative<double>(_storage); }
 
-  // The held alternative, or null when it is another one.
+  // Null when another alternative is held.
   const std::string* string() const { return std::get_if<std::string>(&_storage); }
   const Array* array() const { return std::get_if<Array>(&_storage); }
   const Dictionary* dictionary() const { return std::get_if<Dictionary>(&_storage); }
@@ -124,7 +124,7 @@ class Value {
   double doubleValue() const;
   // True for true, non-zero numbers, "YES", "true" (any case) and texts that begin with a non-zero number.
   bool boolValue() const;
-  // The same, but null for types that have no boolean reading (null, data, date, array, dictionary).
+  // The same, but nullopt for types that have no boolean reading (null, data, date, array, dictionary).
   std::optional<bool> booleanReading() const;
   // A readable form for logs and texts: numbers in decimal (booleans as 1 and 0, doubles as the shortest text that
   // reads back the same), strings as they are, dates as "YYYY-MM-DD hh:mm:ss +0000", data as <hex>, containers in
@@ -142,7 +142,7 @@ class Value {
 
 inline Value::Value() = default;  // here, since decoders make many empty values
 
-// A payload or record that several owners read and nobody changes; null where the description says "none".
+// A payload or record that several owners read and none changes; null where there is none.
 using SharedDictionary = std::shared_ptr<const Dictionary>;
 using SharedArray = std::shared_ptr<const Array>;
 

@@ -18,7 +18,7 @@ class KeepAlive {
   static void ready();
   // Free text behind the busy/idle mark; it goes with the mark's next change.
   static void status(std::string_view text);
-  // Whether there is a service manager that listens.
+  // Returns whether a service manager listens.
   static bool isHeard();
   static void stopping();
 

@@ -15,7 +15,7 @@ class LibraryPowerLog final : public PowerLog {
  public:
   static constexpr const char* kLibrary = "libvoltmark.so.1";
 
-  // Null where there is no such library, or where it lacks the function; the log has the linker's reason.
+  // Returns null when the library, or the function in it, is missing; the log has the linker's reason.
   static std::unique_ptr<LibraryPowerLog> load(const char* library = kLibrary);
 
   void registeredEvent(std::int32_t event, std::string_view sender, const Dictionary& record) override;

@@ -11,8 +11,8 @@
 
 namespace orvanta::platform {
 
-// An IPv4 UDP socket that never blocks. Owned and used by one thread or queue at a time. What the system refuses comes
-// back as its error number; 0 is success.
+// An IPv4 UDP socket that never blocks. Owned and used by one thread or queue at a time. Functions that
+// return an int return the system's error number; 0 is success.
 class UdpSocket {
  public:
   int open();
@@ -20,9 +20,9 @@ class UdpSocket {
   int bindAnyPort();
   // From then on datagrams go to that address only, and only ones from it arrive.
   int connect(const sockaddr_in& server);
-  // Whether the whole datagram went out.
+  // Returns whether the whole datagram went out.
   bool send(std::span<const std::uint8_t> datagram);
-  // The length of one datagram put into `buffer`, which may be 0; none when nothing waits, or on an error.
+  // The length of one datagram put into `buffer`, which may be 0; nullopt when nothing waits, or on an error.
   std::optional<std::size_t> receive(std::span<std::uint8_t> buffer);
   void close() { _fd.reset(); }
 

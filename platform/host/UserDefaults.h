@@ -22,12 +22,12 @@ class UserDefaults {
  public:
   UserDefaults(std::string directory, std::string domain);
 
-  // A copy of the value; none when absent or when the file cannot be read (logged).
+  // A copy of the value; nullopt when absent or when the file cannot be read (logged).
   std::optional<Value> value(std::string_view key);
-  // A text as it is, a number as its decimal text, anything else as its description; none when absent.
+  // A text as it is, a number as its decimal text, anything else as its description; nullopt when absent.
   std::optional<std::string> text(std::string_view key);
   Dictionary all();
-  // Null erases the key. Gives whether the file had to change. A failure says why; the file is then unchanged.
+  // Null erases the key. Returns whether the file had to change. A failure says why; the file is then unchanged.
   Result<bool> set(std::string_view key, Value value);
   // The value under `key`, or the one that `make` gives after storing it: read and write are one step across processes.
   // The new value comes back even when it could not be stored (logged).

@@ -101,7 +101,7 @@ Result<void> CurlHttpClient::accept(std::unique_ptr<PendingHttpRequest>& pending
 Result<void> CurlHttpClient::ensureRunning() {
   if (_running.load(std::memory_order_acquire) != nullptr) return {};
   const MutexLock lock(_threadMutex);
-  if (_loop || _shutDown) return {};  // after the shutdown the intake has the word
+  if (_loop || _shutDown) return {};  // after the shutdown the intake refuses
   // Takes milliseconds and megabytes, which a daemon without traffic does not need. Safe from several threads.
   if (curl_global_init(CURL_GLOBAL_DEFAULT) != CURLE_OK) return Failure{"The HTTP client cannot start"};
   auto loop = HttpTransferLoop::create(_intake, _options);
@@ -129,10 +129,10 @@ void CurlHttpClient::abortBlockingRequests() {
   wake();
 }
 
-void CurlHttpClient::shutdown(std::chrono::milliseconds patience) {
+void CurlHttpClient::shutdown(std::chrono::milliseconds timeout) {
   _intake.close();
   const BlockingScope scope;
-  _intake.waitUntilEmpty(std::min(patience, kLongestTimeout));
+  _intake.waitUntilEmpty(std::min(timeout, kLongestTimeout));
   _intake.stop();
   const MutexLock lock(_threadMutex);
   _shutDown = true;

@@ -24,7 +24,7 @@ class CurlHttpClient final : public HttpClient {
              Completion completion) override;
   HttpResult perform(const std::shared_ptr<HttpLane>& lane, HttpRequest request) override;
   void abortBlockingRequests() override;
-  void shutdown(std::chrono::milliseconds patience) override;
+  void shutdown(std::chrono::milliseconds timeout) override;
 
  private:
   // Hands the request to the HTTP thread, or delivers why that cannot be.

@@ -18,7 +18,7 @@ namespace orvanta::platform {
 // there.
 class CurlTransfer {
  public:
-  // Null when libcurl can make no handle. `options` outlives the transfer.
+  // Null when libcurl cannot make a handle. `options` outlives the transfer.
   static std::unique_ptr<CurlTransfer> create(const HttpClientOptions& options);
   ~CurlTransfer();
   CurlTransfer(const CurlTransfer&) = delete;
@@ -26,25 +26,25 @@ class CurlTransfer {
 
   CURL* handle() const { return _easy; }
 
-  // Makes the handle ready to send `request`, which stays where it is until the end, with these headers of it. False
-  // when there is no memory.
+  // Makes the handle ready to send `request`, which stays where it is until the end, with these headers. Returns
+  // false when memory is short.
   bool begin(const HttpRequest& request, HttpHeaderList headers);
   // The same request once more, to `url`, after a redirect.
   bool beginRedirected(const std::string& url);
-  // Ends the use of the request; what was received is dropped. The handle must be in no multi handle.
+  // Ends the use of the request; what was received is dropped. The handle must not be in a multi handle.
   void reset();
 
   // After libcurl is done with the handle.
   int status() const;
-  // Where an answer sends the request, absolute; empty when nowhere.
+  // The absolute URL that the answer redirects to; empty when it does not.
   std::string redirectTarget() const;
   const std::string& url() const { return _url; }
   int redirects() const { return _redirects; }
   // The answer, taken out.
   HttpResponse takeResponse();
-  // Why it failed, with the TLS library's reason where that was it.
+  // Why it failed, with the TLS library's reason where TLS failed.
   std::string describeFailure(CURLcode code) const;
-  // Whether a request is known to have got a connection, for error texts.
+  // Returns whether the request is known to have got a connection, for error texts.
   bool wasConnected() const;
 
  private:
@@ -64,7 +64,7 @@ class CurlTransfer {
   std::string _url;
   int _redirects = 0;
   HttpResponse _response;
-  bool _headersEnded = false;    // what follows are trailers, which nobody reads
+  bool _headersEnded = false;    // what follows are trailers, which are not kept
   std::size_t _headerBytes = 0;  // of all hops and interim answers
   std::size_t _bodyBytes = 0;    // of all hops
   bool _tooLarge = false;

@@ -34,13 +34,13 @@ class HttpIntake {
   bool mayFallAsleep();
   // A request's bytes no longer wait. Before its completion runs, so that this may submit the next.
   void release(const PendingHttpRequest& request);
-  // A request has ended, its completion is on its way.
+  // A request has ended and its completion is on its way.
   void ended();
 
   void abortBlocking();
   // Takes nothing more in.
   void close();
-  // Whether all that was taken in ended in time.
+  // Returns whether all that was taken in ended in time.
   bool waitUntilEmpty(std::chrono::milliseconds timeout);
   void stop();
 

@@ -10,13 +10,13 @@ struct HttpRedirect {
   std::string_view method;
   std::string_view url;  // that gave the answer
   int status = 0;
-  std::string_view target;  // absolute; empty when the answer names none
+  std::string_view target;  // absolute; empty when the answer does not name one
   int followed = 0;         // redirects of this request so far
   int maximum = 0;
 };
 
 enum class RedirectVerdict {
-  answer,  // nothing to follow: this is what the caller gets
+  answer,  // nothing to follow: the caller gets this answer
   follow,  // the same method and body go to the target
   insecure,
   unsupported,
@@ -24,7 +24,7 @@ enum class RedirectVerdict {
 };
 
 RedirectVerdict judgeRedirect(const HttpRedirect& redirect);
-// What the caller gets to read when a redirect is refused.
+// The error text for a refused redirect.
 std::string describeRefusal(RedirectVerdict verdict, const HttpRedirect& redirect);
 
 bool isHttpUrl(std::string_view url);

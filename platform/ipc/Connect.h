@@ -11,7 +11,7 @@ namespace orvanta::platform {
 // the socket is non-blocking and close-on-exec. Any thread.
 //
 // On failure `*errorNumber`, where given, tells apart what the text only says: ENOENT (no such socket: nothing runs
-// there), ECONNREFUSED (a socket file that nobody listens behind), EACCES, EAGAIN (the service has too many waiting),
+// there), ECONNREFUSED (a socket file without a listener), EACCES, EAGAIN (the service has too many waiting),
 // ENAMETOOLONG. It is 0 on success.
 Result<UniqueFd> connectToService(const std::string& directory, const std::string& service, int* errorNumber = nullptr);
 

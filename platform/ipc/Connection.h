@@ -38,11 +38,11 @@ class Outbox {
   virtual bool sendWithDescriptor(std::span<const std::uint8_t> message, UniqueFd descriptor) = 0;
   // Bytes not yet taken by the socket.
   virtual std::size_t pending() const = 0;
-  // Whether the peer has gone, so that every message is dropped from now on.
+  // Returns whether the peer has gone, so that every message is dropped from now on.
   virtual bool isClosed() const = 0;
 };
 
-// What a connection's owner gets to hear. Every call comes on the connection's queue, one at a time, and none after
+// The events of a connection, for its owner. Every call comes on the connection's queue, one at a time, and none after
 // invalidated().
 class ConnectionDelegate {
  public:
@@ -59,7 +59,7 @@ class ConnectionDelegate {
 // One end of a connected Unix stream socket that carries MessagePack-RPC frames. See docs/protocol.md.
 //
 // Made with create(), inert until resume(). Holds its delegate strongly from resume() to invalidated(), after which it
-// lets go of it. Frames are decoded one at a time as they are carried out, at most `kFramesPerTurn` before other queues
+// releases it. Frames are decoded one at a time as they are carried out, at most `kFramesPerTurn` before other queues
 // get their turn.
 class Connection : public std::enable_shared_from_this<Connection> {
  public:
@@ -76,7 +76,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
 
   virtual const std::shared_ptr<Outbox>& outbox() const = 0;
   virtual const std::shared_ptr<WorkQueue>& queue() const = 0;
-  // The oldest descriptor received and not yet taken; none when there is none. On the queue only.
+  // The oldest descriptor received and not yet taken; empty when there is none. On the queue only.
   virtual UniqueFd takeDescriptor() = 0;
   // For log lines, such as "fd 7 (pid 1234, uid 1000)"; set by the listener before resume().
   virtual const std::string& description() const = 0;
@@ -89,7 +89,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
 void appendRequestHeader(std::vector<std::uint8_t>& out, std::uint32_t messageID, std::string_view method,
                          std::size_t paramCount);
 void appendNotificationHeader(std::vector<std::uint8_t>& out, std::string_view method, std::size_t paramCount);
-// What follows is the error value, then the result value.
+// The caller appends the error value, then the result value.
 void appendResponseHeader(std::vector<std::uint8_t>& out, std::uint32_t messageID);
 // A whole response that carries the transport's own error text.
 void appendErrorResponse(std::vector<std::uint8_t>& out, std::uint32_t messageID, std::string_view text);

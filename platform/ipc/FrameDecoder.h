@@ -20,10 +20,10 @@ struct Frame {
   std::uint32_t messageID = 0;  // requests and responses
   std::string method;           // requests and notifications
   Array params;                 // requests and notifications
-  Value error;                  // responses; null: none
+  Value error;                  // responses; null when there is no error
   Value result;                 // responses
   // Not null: the frame was whole and well formed, but its arguments hold something that refuses the call (a duplicate
-  // key, an unknown extension, a key or text that is not UTF-8, params that are no array). The call is answered with
+  // key, an unknown extension, a key or text that is not UTF-8, params that are not an array). The call is answered with
   // this text and not carried out.
   std::optional<std::string> refusal;
   std::size_t wireSize = 0;  // bytes the frame took on the wire
@@ -38,7 +38,7 @@ struct FrameLimits {
 
 // Turns a byte stream into frames, without any I/O. Used by one thread at a time.
 //
-// Bytes are appended; next() gives whole frames until there is none. A claimed length allocates nothing before its
+// Bytes are appended; next() gives whole frames until none is left. A claimed length allocates nothing before its
 // bytes are there. A protocol error (not MessagePack, not a frame, too deep, too large) is final: frames that ended
 // before the offending byte are still given out first, then every call returns the error.
 class FrameDecoder {
@@ -56,7 +56,7 @@ class FrameDecoder {
 
   // Bytes appended and not yet given out as frames.
   std::size_t pending() const { return _buffer.size() - _start; }
-  // Whether next() may give a frame of more than `bytes` that took several appends.
+  // Returns whether next() may give a frame of more than `bytes` that took several appends.
   bool mayHoldMoreThan(std::size_t bytes) const {
     return _scan.active && _scan.offset > bytes && _scan.offset <= pending();
   }

@@ -235,8 +235,8 @@ void SocketConnection::carryOutRest() {
   }
 }
 
-void SocketConnection::endAfterDrain(std::chrono::milliseconds patience) {
-  if (patience.count() <= 0 || _outbox->awaitAtMost(0)) {
+void SocketConnection::endAfterDrain(std::chrono::milliseconds timeout) {
+  if (timeout.count() <= 0 || _outbox->awaitAtMost(0)) {
     end();
     return;
   }
@@ -244,7 +244,7 @@ void SocketConnection::endAfterDrain(std::chrono::milliseconds patience) {
   _phase = Phase::draining;
   _watch.reset();
   _drainTimer = _queue->makeTimer();
-  _drainTimer->runAfter(patience, [self = self()] { self->end(); });
+  _drainTimer->runAfter(timeout, [self = self()] { self->end(); });
 }
 
 void SocketConnection::end() {

@@ -16,8 +16,8 @@ namespace orvanta::platform {
 // The Connection over a socket.
 //
 // Reads on its queue, in turns: take what has arrived, carry out the frames in it one by one, write what they answered
-// in one piece, wait for more. Bytes are read only when no whole frame is left, so that next to nothing piles up here
-// and the socket's own buffer holds back a hasty peer. While it waits the pending operation owns it.
+// in one piece, wait for more. Bytes are read only when no whole frame is left, so that little piles up here and
+// the socket's own buffer holds back a hasty peer. While it waits, the pending operation owns it.
 class SocketConnection final : public Connection, public SocketOutbox::Observer {
  public:
   static std::shared_ptr<SocketConnection> create(WorkPool& pool, UniqueFd socket, ConnectionLimits limits);
@@ -58,7 +58,7 @@ class SocketConnection final : public Connection, public SocketOutbox::Observer 
   void eased();
   void inputEnded();
   void carryOutRest();
-  void endAfterDrain(std::chrono::milliseconds patience);
+  void endAfterDrain(std::chrono::milliseconds timeout);
   void end();
   void later(void (SocketConnection::*step)());
   std::shared_ptr<SocketConnection> self() { return std::static_pointer_cast<SocketConnection>(shared_from_this()); }

@@ -9,8 +9,8 @@
 
 namespace orvanta::platform {
 
-// The system calls of a connected, non-blocking Unix stream socket, with what their results mean. None blocks or raises
-// SIGPIPE; all repeat themselves after EINTR.
+// The system calls of a connected, non-blocking Unix stream socket, and the meaning of their results. They never block
+// or raise SIGPIPE, and repeat themselves after EINTR.
 
 struct Received {
   enum class Kind {
@@ -39,8 +39,8 @@ struct Sent {
 // With a descriptor (not -1), it goes out if any byte does.
 Sent sendBytes(int socket, std::span<const std::uint8_t> bytes, int descriptor = -1);
 
-// Whether nothing can pass in either direction any more: what a peer's close() does, and its shutdown() of sending does
-// not.
+// Returns whether nothing can pass in either direction any more: so after a peer's close(), but not after its shutdown()
+// of sending.
 bool hasHungUp(int socket);
 
 }  // namespace orvanta::platform

@@ -12,7 +12,7 @@ namespace orvanta::platform {
 
 // Who may do what: property lists in a directory, each granting entitlement values to a "user", a "group" (name or
 // number) or a security "label". Read anew at each question, so that a grant needs no restart. Nothing is granted by
-// default; a file that cannot be read or makes no sense grants nothing and is logged with its reason, once until that
+// default; a file that cannot be read or is invalid grants nothing and is logged with its reason, once until that
 // changes. Thread-safe.
 class Entitlements {
  public:
@@ -20,12 +20,12 @@ class Entitlements {
 
   // True when any grant that matches the peer gives `entitlement` a value that reads as true.
   bool holds(const PeerIdentity& peer, std::string_view entitlement);
-  // True when there is anybody at all for whom that is so. Logs, as a warning, what else is granted: nothing asks for
-  // it.
+  // True when some grant gives it, to any peer at all. Logs, as a warning, other entitlements that are granted: nothing
+  // asks for them.
   bool isHeldByAnybody(std::string_view entitlement);
 
  private:
-  // `peer` null: anybody.
+  // With a null `peer`: by any grant.
   bool isGranted(const PeerIdentity* peer, std::string_view entitlement);
   void tell(const std::string& path, const std::string& problem);
 

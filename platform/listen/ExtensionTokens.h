@@ -22,10 +22,10 @@ class ExtensionHandle {
 
   bool grantsAccess() const { return _descriptor >= 0; }
 
-  // The size of the file in bytes; none when there is no access or the descriptor leads to anything but a regular file.
+  // The size of the file in bytes; nullopt without access, or when the descriptor does not lead to a regular file.
   std::optional<std::uint64_t> regularFileSize() const;
-  // The file's first bytes, up to `size` of them; fewer when the file has shrunk, none when it cannot be read or memory
-  // is short. The client's own position in the file neither matters nor changes. May block on a slow file system.
+  // The file's first bytes, up to `size` of them; fewer when the file has shrunk, nullopt when it cannot be read or
+  // memory is short. The client's own position in the file neither matters nor changes. May block on a slow file system.
   std::optional<std::string> read(std::size_t size) const;
 
   void release() { _descriptor = -1; }

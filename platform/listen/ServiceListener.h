@@ -15,13 +15,13 @@
 namespace orvanta::platform {
 
 // What a ServiceListener does, apart from it so that work under way can outlive it. Accepts on a queue of its own,
-// offers on whatever thread of the pool.
+// offers on any thread of the pool.
 class Acceptor final : public std::enable_shared_from_this<Acceptor> {
  public:
   Acceptor(WorkPool& pool, ServiceSocket socket, Listener::Handler handler, std::size_t maximumPerUser);
 
   void start();
-  // Waits for the handlers under way at most so long; without a limit when there is none. Whether all have ended.
+  // Waits for the handlers under way, at most for `limit` if it is given. Returns whether all have ended.
   bool stop(std::optional<std::chrono::seconds> limit);
 
  private:

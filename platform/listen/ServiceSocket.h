@@ -22,10 +22,10 @@ struct ServiceSocket {
   void removeFile();
 };
 
-// The socket that the service manager passed, if it did, else a new one bound at `directory`/`service`, to which
-// everybody may connect. Fails when another process listens there, and names it. Of two processes that try at once one
-// fails: the name belongs to whoever holds the lock on `service`.lock beside it, which goes with its process and whose
-// file stays. A socket file that nobody listens behind is replaced.
+// The socket that the service manager passed, if it did, else a new one bound at `directory`/`service`, to which every
+// user may connect. Fails when another process listens there, and names it. Of two processes that try at once one
+// fails: the name belongs to the process that holds the lock on `service`.lock beside it; the lock goes with its
+// process, its file stays. A socket file without a listener is replaced.
 Result<ServiceSocket> openServiceSocket(const std::string& directory, const std::string& service);
 
 }  // namespace orvanta::platform

@@ -16,9 +16,9 @@ using Job = UniqueFunction<void()>;
 
 class ComputeThreads;
 
-// A serial queue beside the event loop, for jobs that compute for long, such as compressing: they hold up nobody who
-// waits for the loop. Its jobs run one at a time, in the order in which they were posted, on a thread of their own
-// kind.
+// A serial queue beside the event loop, for jobs that compute for long, such as compressing: jobs of the loop do
+// not wait for them. Its jobs run one at a time, in the order in which they were posted, on threads of their
+// own.
 //
 // Shared: each pending job keeps it alive. Any thread may call it. Jobs must not throw.
 class ComputeQueue final : public std::enable_shared_from_this<ComputeQueue> {
@@ -39,7 +39,7 @@ class ComputeQueue final : public std::enable_shared_from_this<ComputeQueue> {
   bool _inLine = false;  // in the line, or served by a thread
 };
 
-// The threads that serve compute queues. None runs before there is a job. Shared by the pool, which stops them, and the
+// The threads that serve compute queues. They start with the first job. Shared by the pool, which stops them, and the
 // queues, which may outlive it.
 class ComputeThreads final : PoolThreads::Loop {
  public:
@@ -57,7 +57,7 @@ class ComputeThreads final : PoolThreads::Loop {
   void post(ComputeQueue& queue, Job job);
   void runUntilStopped() override;
   bool runOne(std::chrono::milliseconds timeout) override;
-  // Starts the threads unless they run. When the system has none to give, the caller's does the work.
+  // Starts the threads unless they run. When the system has no thread to give, the caller's does the work.
   void serve();
   // Releases the mutex while the job runs.
   void serveFirst() REQUIRES(_mutex);

@@ -23,8 +23,8 @@ class PoolThreads {
    public:
     virtual ~Loop() = default;
     virtual void runUntilStopped() = 0;
-    // Runs one job; false when none came up for so long, or the loop was stopped.
-    virtual bool runOne(std::chrono::milliseconds patience) = 0;
+    // Runs one job; false when none came up within `timeout`, or the loop was stopped.
+    virtual bool runOne(std::chrono::milliseconds timeout) = 0;
   };
 
   // `name` is the threads', a literal.
@@ -33,7 +33,7 @@ class PoolThreads {
   PoolThreads& operator=(const PoolThreads&) = delete;
   ~PoolThreads() = default;  // after join()
 
-  // False when not one thread can be started; it may be tried again.
+  // Returns false when not one thread can be started; may be called again.
   bool start();
   // From now on no thread starts. The loop is to be stopped between this and join().
   void closeDown();
@@ -53,7 +53,7 @@ class PoolThreads {
   bool launch(bool extra) REQUIRES(_mutex);
   bool superfluous() const REQUIRES(_mutex);
   void serveAsExtra();
-  // Whether the calling extra thread has to go on; returns when it is needed, or is to end.
+  // Waits until the calling extra thread is needed or is to end, and returns whether it is needed.
   bool stayAside();
   void retire() REQUIRES(_mutex);
 

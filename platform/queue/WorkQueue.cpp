@@ -25,7 +25,7 @@ struct WorkPool::Implementation final : PoolThreads::Loop {
         compute(std::make_shared<ComputeThreads>(jobs, threadCount, extraThreads)) {}
 
   void runUntilStopped() override { io.run(); }
-  bool runOne(std::chrono::milliseconds patience) override { return io.run_one_for(patience) > 0; }
+  bool runOne(std::chrono::milliseconds timeout) override { return io.run_one_for(timeout) > 0; }
 
   JobCount jobs;        // outlives the jobs that count down here
   Mutex stopMutex;      // every caller of stop() returns only when the threads are gone
@@ -42,7 +42,7 @@ using Strand = asio::strand<Executor>;
 
 // Tells a completion that has been overtaken by a cancel or a newer setting from one that counts. Touched on the queue
 // only; shared with the pending operations, since they end after what they were started from. The handlers live in the
-// operations and not here, so that whoever they keep alive is not kept alive by himself.
+// operations and not here, so that no object that they keep alive keeps itself alive.
 struct Arming {
   std::uint64_t current = 0;
   bool armed = false;
@@ -209,8 +209,8 @@ void WorkPool::post(Job job) {
   });
 }
 
-bool WorkPool::drain(std::chrono::milliseconds patience) {
-  return _implementation->jobs.waitForNone(patience);
+bool WorkPool::drain(std::chrono::milliseconds timeout) {
+  return _implementation->jobs.waitForNone(timeout);
 }
 
 std::size_t WorkPool::threadCount() const {

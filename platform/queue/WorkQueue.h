@@ -13,9 +13,9 @@ class WorkQueue;
 class Timer;
 class DescriptorWatch;
 
-// The threads that carry out everybody's jobs: one event loop served by a small pool, and as many more for compute
-// queues once there is such a job. The fewer serve the loop, the fewer are woken for jobs that take less than waking
-// does.
+// The threads that run the jobs of all queues: one event loop served by a small pool, and as many more for compute
+// queues once there is such a job. The fewer serve the loop, the fewer are woken for jobs that take less than the
+// waking.
 //
 // Owned by main (or by a client library instance, or a test) and outlives every queue, timer and watch made from it.
 // All operations may be called from any thread unless they say otherwise. Jobs must not throw.
@@ -34,8 +34,8 @@ class WorkPool {
   void stop();
 
   // Waits until no posted job, on any queue, waits or runs, jobs posted by jobs included; timers and watches do not
-  // count. False when that takes longer than `patience`. Must not be called from a job.
-  bool drain(std::chrono::milliseconds patience);
+  // count. Returns false when that takes longer than `timeout`. Must not be called from a job.
+  bool drain(std::chrono::milliseconds timeout);
 
   std::shared_ptr<WorkQueue> makeQueue();
   std::shared_ptr<ComputeQueue> makeComputeQueue();
@@ -57,12 +57,12 @@ class WorkQueue : public std::enable_shared_from_this<WorkQueue> {
   virtual ~WorkQueue() = default;
 
   virtual void post(Job job) = 0;
-  // Whether the calling thread is running one of this queue's jobs.
+  // Returns whether the calling thread is running one of this queue's jobs. What belongs to a queue asserts it.
   virtual bool isCurrent() const = 0;
 
   // A timer and a watch whose handlers run on this queue. Not armed yet.
   virtual std::unique_ptr<Timer> makeTimer() = 0;
-  // Watches `fd`, which the caller keeps open until cancel() or the watch's destruction; null if the system cannot.
+  // Watches `fd`, which the caller keeps open until cancel() or the watch's destruction; null if the system refuses.
   virtual std::unique_ptr<DescriptorWatch> makeDescriptorWatch(int fd) = 0;
 };
 

@@ -28,12 +28,12 @@ enum LandlockRight : std::uint64_t {
   kLandlockIoctlDevice = 1U << 15U,  // ABI 5
 };
 
-// The file rights that a kernel of that Landlock ABI controls; all of them are denied but where a rule grants them.
+// The file rights that a kernel of that Landlock ABI controls; all of them are denied except where a rule grants them.
 std::uint64_t landlockRightsOfAbi(int abi);
-// Those among `rights` that a rule for something else than a directory may name.
+// Those among `rights` that a rule for anything but a directory may name.
 std::uint64_t landlockFileRights(std::uint64_t rights);
 
-// A set of rules on its way to becoming the thread's confinement. Used by one thread. What has failed has had no
+// A set of rules on its way to becoming the thread's confinement. Used by one thread. A call that fails has no
 // effect.
 //
 // Beside files it forbids, where the kernel can, to bind TCP ports (ABI 4) and to signal processes outside (ABI 6).

@@ -12,10 +12,10 @@
 namespace orvanta::platform {
 
 // Answers the system calls that the sandbox does not allow, and logs each the first time. A thread of its own does so:
-// the kernel lets a refused call wait for it, whatever the calling thread holds or blocks, which no signal handler
-// could do. It sleeps until there is one, and is itself confined to what it needs.
+// the kernel lets a refused call wait for it, whatever locks the calling thread holds, which no signal handler could
+// do. It sleeps until there is one, and is itself confined to what it needs.
 //
-// Owned by the Sandbox. With its end refused calls fail unlogged. Made and ended on the same thread.
+// Owned by the Sandbox. Once it is destroyed, refused calls fail unlogged. Made and destroyed on the same thread.
 class RefusedCalls {
  public:
   // Starts the watcher, then confines the calling thread and those that it starts later by `calls`.

@@ -12,7 +12,7 @@
 namespace orvanta::platform {
 
 // The process's confinement by a named profile, the property list `directory`/`name`.plist whose format
-// docs/sandbox.md describes. Owned by main, on whose thread everything here is called. Its end takes nothing back.
+// docs/sandbox.md describes. Owned by main, on whose thread everything here is called. Destroying it takes nothing back.
 class Sandbox {
  public:
   // Confines the process, which must have one thread: what is entered holds for that thread and all that it starts
@@ -25,7 +25,7 @@ class Sandbox {
 
   // For the log: what was entered, and the kernel's Landlock ABI.
   const std::string& description() const { return _description; }
-  // The process has made what only its start makes, and has still no threads of its own: takes back what the profile
+  // To be called when start-up has made its last special calls and no other thread runs yet: takes back what the profile
   // allows only until then.
   Result<void> started();
 
