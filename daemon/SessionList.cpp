@@ -8,7 +8,7 @@
 #include "daemon/SessionConnection.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/host/KeepAlive.h"
-#include "platform/host/MemoryUse.h"
+#include "platform/host/Process.h"
 
 namespace orvanta {
 

@@ -8,7 +8,6 @@
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/host/KeepAlive.h"
-#include "platform/host/MemoryUse.h"
 #include "platform/host/Process.h"
 #include "platform/listen/Listener.h"
 #include "platform/listen/ServiceSocket.h"

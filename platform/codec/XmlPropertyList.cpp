@@ -9,7 +9,6 @@
 #include <pugixml.hpp>
 
 #include "platform/codec/PropertyList.h"
-#include "platform/codec/XmlCharacters.h"
 #include "platform/core/PropertyListDate.h"
 #include "platform/core/Text.h"
 #include "platform/core/Utf8.h"

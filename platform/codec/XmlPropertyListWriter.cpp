@@ -4,8 +4,8 @@
 #include <fmt/format.h>
 
 #include "platform/codec/PropertyList.h"
-#include "platform/codec/XmlCharacters.h"
 #include "platform/core/PropertyListDate.h"
+#include "platform/core/Utf8.h"
 
 namespace orvanta::platform {
 

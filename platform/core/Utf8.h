@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstddef>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -20,5 +21,10 @@ Utf8Character firstUtf8Character(std::string_view text);
 
 // `codePoint` is a Unicode scalar value.
 void appendUtf8(std::string& out, char32_t codePoint);
+
+// Returns whether XML has a way to carry this character at all, be it as a reference.
+bool isXmlCharacter(char32_t codePoint);
+// Offset of the first thing in `text` that is not UTF-8 or not an XML character; nullopt when there is none.
+std::optional<std::size_t> findNonXmlCharacter(std::string_view text);
 
 }  // namespace orvanta::platform

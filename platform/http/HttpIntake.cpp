@@ -4,8 +4,6 @@
 
 #include <utility>
 
-#include "platform/http/HttpLaneQueue.h"
-
 namespace orvanta::platform {
 
 namespace {

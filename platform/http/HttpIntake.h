@@ -8,7 +8,7 @@
 #include "platform/core/Mutex.h"
 #include "platform/core/Result.h"
 #include "platform/http/HttpClient.h"
-#include "platform/http/PendingHttpRequest.h"
+#include "platform/http/HttpLaneQueue.h"
 
 namespace orvanta::platform {
 

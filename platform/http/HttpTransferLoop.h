@@ -13,7 +13,6 @@
 #include "platform/http/HttpClient.h"
 #include "platform/http/HttpIntake.h"
 #include "platform/http/HttpLaneQueue.h"
-#include "platform/http/PendingHttpRequest.h"
 
 namespace orvanta::platform {
 

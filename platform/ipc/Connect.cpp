@@ -5,7 +5,6 @@
 #include <cerrno>
 
 #include "platform/core/Text.h"
-#include "platform/ipc/UnixAddress.h"
 
 namespace orvanta::platform {
 

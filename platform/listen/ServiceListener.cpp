@@ -4,6 +4,7 @@
 #include <sys/socket.h>
 
 #include <cerrno>
+#include <unordered_map>
 #include <utility>
 
 #include "platform/core/Log.h"
@@ -27,6 +28,41 @@ bool isDue(std::optional<std::chrono::steady_clock::time_point>& logged) {
 }
 
 }  // namespace
+
+Result<std::unique_ptr<Listener>> Listener::create(WorkPool& pool, const std::string& directory,
+                                                   const std::string& service, Handler handler) {
+  auto socket = openServiceSocket(directory, service);
+  if (!socket) return Failure{socket.error()};
+  return create(pool, std::move(*socket), std::move(handler));
+}
+
+std::unique_ptr<Listener> Listener::create(WorkPool& pool, ServiceSocket socket, Handler handler) {
+  return std::make_unique<ServiceListener>(pool, std::move(socket), std::move(handler), kMaximumConnectionsPerUser);
+}
+
+struct ConnectionQuota::Counts {
+  Mutex mutex;
+  std::unordered_map<uid_t, std::size_t> perUser GUARDED_BY(mutex);  // no zeros
+
+  void release(uid_t user) {
+    const MutexLock lock(mutex);
+    const auto place = perUser.find(user);
+    if (--place->second == 0) perUser.erase(place);
+  }
+};
+
+ConnectionQuota::ConnectionQuota(std::size_t maximumPerUser)
+    : _maximum(maximumPerUser), _counts(std::make_shared<Counts>()) {}
+
+std::shared_ptr<void> ConnectionQuota::take(uid_t user) {
+  {
+    const MutexLock lock(_counts->mutex);
+    std::size_t& count = _counts->perUser[user];
+    if (count >= _maximum) return nullptr;
+    ++count;
+  }
+  return {_counts.get(), [counts = _counts, user](void*) { counts->release(user); }};
+}
 
 Acceptor::Acceptor(WorkPool& pool, ServiceSocket socket, Listener::Handler handler, std::size_t maximumPerUser)
     : _pool(pool),

@@ -1,18 +1,31 @@
 #pragma once
 
-#include <atomic>
+#include <sys/types.h>
+
 #include <chrono>
 #include <cstddef>
 #include <memory>
 #include <optional>
 
 #include "platform/core/Mutex.h"
-#include "platform/listen/ConnectionQuota.h"
 #include "platform/listen/Listener.h"
 #include "platform/listen/ServiceSocket.h"
 #include "platform/queue/WorkQueue.h"
 
 namespace orvanta::platform {
+
+// How many connections each user has. Thread-safe; places may outlive it.
+class ConnectionQuota {
+ public:
+  explicit ConnectionQuota(std::size_t maximumPerUser);
+  // A place for one connection, given back when the last copy goes; null when the user has no place left.
+  std::shared_ptr<void> take(uid_t user);
+
+ private:
+  struct Counts;
+  const std::size_t _maximum;
+  const std::shared_ptr<Counts> _counts;
+};
 
 // What a ServiceListener does, apart from it so that work under way can outlive it. Accepts on a queue of its own,
 // offers on any thread of the pool.

@@ -13,7 +13,6 @@
 #include "platform/core/Log.h"
 #include "platform/core/Text.h"
 #include "platform/ipc/Connect.h"
-#include "platform/ipc/UnixAddress.h"
 #include "platform/listen/PeerIdentity.h"
 
 namespace orvanta::platform {

@@ -8,12 +8,17 @@
 
 #include "platform/core/Log.h"
 #include "platform/core/SignalMask.h"
+#include "platform/queue/WorkQueue.h"
 
 namespace orvanta::platform {
 
 namespace {
 
 thread_local PoolThreads* tCurrent = nullptr;
+
+// Of BlockingScope.
+thread_local BlockingScope::HookSetting tHook;
+thread_local bool tInsideScope = false;
 
 }  // namespace
 
@@ -129,6 +134,25 @@ void PoolThreads::blockingBegins() {
 void PoolThreads::blockingEnds() {
   const MutexLock lock(_mutex);
   --_blocked;
+}
+
+BlockingScope::BlockingScope() {
+  if (tHook.hook != nullptr) tHook.hook(tHook.context);
+  PoolThreads* const threads = PoolThreads::current();
+  if (threads == nullptr || tInsideScope) return;  // a thread blocks once, however deep the scopes
+  tInsideScope = true;
+  _pool = threads;
+  threads->blockingBegins();
+}
+
+BlockingScope::~BlockingScope() {
+  if (_pool == nullptr) return;
+  static_cast<PoolThreads*>(_pool)->blockingEnds();
+  tInsideScope = false;
+}
+
+BlockingScope::HookSetting BlockingScope::setBeforeBlocking(HookSetting setting) {
+  return std::exchange(tHook, setting);
 }
 
 }  // namespace orvanta::platform

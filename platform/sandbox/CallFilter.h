@@ -3,7 +3,7 @@
 #include <cstddef>
 
 #include "platform/core/Result.h"
-#include "platform/sandbox/SandboxCalls.h"
+#include "platform/sandbox/SandboxProfile.h"
 
 namespace orvanta::platform {
 

@@ -7,7 +7,7 @@
 
 #include "platform/core/Result.h"
 #include "platform/core/UniqueFd.h"
-#include "platform/sandbox/SandboxCalls.h"
+#include "platform/sandbox/SandboxProfile.h"
 
 namespace orvanta::platform {
 

@@ -16,7 +16,6 @@
 #include "platform/core/Text.h"
 #include "platform/sandbox/CallFilter.h"
 #include "platform/sandbox/Landlock.h"
-#include "platform/sandbox/SandboxProfile.h"
 
 namespace orvanta::platform {
 

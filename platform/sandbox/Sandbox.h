@@ -7,12 +7,13 @@
 
 #include "platform/core/Result.h"
 #include "platform/sandbox/RefusedCalls.h"
-#include "platform/sandbox/SandboxCalls.h"
+#include "platform/sandbox/SandboxProfile.h"
 
 namespace orvanta::platform {
 
 // The process's confinement by a named profile, the property list `directory`/`name`.plist whose format
-// docs/sandbox.md describes. Owned by main, on whose thread everything here is called. Destroying it takes nothing back.
+// docs/sandbox.md describes. Owned by main, on whose thread everything here is called. Destroying it takes nothing
+// back.
 class Sandbox {
  public:
   // Confines the process, which must have one thread: what is entered holds for that thread and all that it starts
@@ -25,8 +26,8 @@ class Sandbox {
 
   // For the log: what was entered, and the kernel's Landlock ABI.
   const std::string& description() const { return _description; }
-  // To be called when start-up has made its last special calls and no other thread runs yet: takes back what the profile
-  // allows only until then.
+  // To be called when start-up has made its last special calls and no other thread runs yet: takes back what the
+  // profile allows only until then.
   Result<void> started();
 
  private:

@@ -1,4 +1,4 @@
-#include "platform/sandbox/SandboxCalls.h"
+#include "platform/sandbox/SandboxProfile.h"
 
 #include <fcntl.h>
 #include <fmt/format.h>

@@ -16,7 +16,7 @@
 #include <string>
 
 #include "platform/core/UniqueFd.h"
-#include "platform/ipc/UnixAddress.h"
+#include "platform/ipc/Connect.h"
 
 namespace orvanta::test {
 

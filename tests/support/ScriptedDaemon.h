@@ -9,7 +9,7 @@
 
 #include "interface/OrvantaConstants.h"
 #include "interface/Values.h"
-#include "platform/ipc/UnixAddress.h"
+#include "platform/ipc/Connect.h"
 #include "tests/support/Peer.h"
 #include "tests/support/TemporaryDirectory.h"
 

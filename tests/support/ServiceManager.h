@@ -9,7 +9,7 @@
 #include <vector>
 
 #include "platform/core/UniqueFd.h"
-#include "platform/ipc/UnixAddress.h"
+#include "platform/ipc/Connect.h"
 #include "tests/support/TemporaryDirectory.h"
 
 namespace orvanta::test {

@@ -17,7 +17,6 @@
 #include <vector>
 
 #include "platform/ipc/Connect.h"
-#include "platform/ipc/UnixAddress.h"
 #include "platform/listen/ServiceListener.h"
 #include "platform/listen/ServiceSocket.h"
 #include "tests/platform/ipc/ConnectionFixture.h"
