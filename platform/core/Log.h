@@ -7,6 +7,8 @@
 #include "platform/core/LogSink.h"
 
 // Logs one line. The arguments are neither evaluated nor formatted when the level is off.
+//
+// The wording of existing lines is fixed, odd spellings too: people and tools search for it.
 #define PLATFORM_LOG(LEVEL, ...)                                                            \
   do {                                                                                      \
     if (::orvanta::platform::logEnabled(::orvanta::platform::LogLevel::LEVEL))              \

@@ -3,8 +3,8 @@
 #include <fmt/format.h>
 
 #include <algorithm>
+#include <cassert>
 #include <limits>
-#include <thread>
 #include <utility>
 
 #include "platform/core/Log.h"
@@ -37,10 +37,11 @@ HttpTransferLoop::~HttpTransferLoop() {
 }
 
 void HttpTransferLoop::run() {
+  _thread = std::this_thread::get_id();
   for (;;) {
     HttpIntake::Orders orders = _intake.take();
     for (auto& request : orders.requests) enqueue(std::move(request));
-    if (orders.stop) return fail(Whom::everybody, "Aborted: the HTTP client is shutting down");
+    if (orders.stop) return fail(Whom::all, "Aborted: the HTTP client is shutting down");
     if (orders.abortBlocking && !_blockingAborted) {
       _blockingAborted = true;  // the intake lets no more of them in
       fail(Whom::blocking, "Aborted: the process is ending");
@@ -57,6 +58,7 @@ void HttpTransferLoop::run() {
 }
 
 void HttpTransferLoop::enqueue(std::unique_ptr<PendingHttpRequest> request) {
+  assert(isOnItsThread());
   const std::shared_ptr<HttpLaneQueue> lane = request->lane;
   if (request->deadline) request->deadlineEntry = _deadlines.emplace(*request->deadline, request.get());
   _busy.emplace(lane.get(), lane);
@@ -65,6 +67,7 @@ void HttpTransferLoop::enqueue(std::unique_ptr<PendingHttpRequest> request) {
 }
 
 void HttpTransferLoop::settle(const std::shared_ptr<HttpLaneQueue>& lane) {
+  assert(isOnItsThread());
   if (lane->current) return;
   if (lane->waiting.empty()) {
     _busy.erase(lane.get());
@@ -79,6 +82,7 @@ void HttpTransferLoop::settle(const std::shared_ptr<HttpLaneQueue>& lane) {
 }
 
 void HttpTransferLoop::startReady() {
+  assert(isOnItsThread());
   while (!_ready.empty() && (!_ready.front()->isLimited() || _limitedInFlight < kMaximumInFlight)) {
     const std::shared_ptr<HttpLaneQueue> lane = std::move(_ready.front());
     _ready.pop_front();
@@ -127,6 +131,7 @@ bool HttpTransferLoop::harvest() {
 }
 
 void HttpTransferLoop::transferDone(PendingHttpRequest& request, CURLcode code) {
+  assert(isOnItsThread());
   CurlTransfer& transfer = *request.transfer;
   HttpLaneQueue& lane = *request.lane;
   if (code != CURLE_OK) return finishCurrent(lane, failure(transfer.describeFailure(code)));
@@ -142,6 +147,7 @@ void HttpTransferLoop::transferDone(PendingHttpRequest& request, CURLcode code) 
 }
 
 void HttpTransferLoop::expire() {
+  assert(isOnItsThread());
   const Clock::time_point now = Clock::now();
   while (!_deadlines.empty() && _deadlines.begin()->first <= now) {
     PendingHttpRequest& request = *_deadlines.begin()->second;
@@ -176,6 +182,7 @@ void HttpTransferLoop::recoverFrom(CURLMcode code) {
 }
 
 void HttpTransferLoop::fail(Whom whom, const std::string& why) {
+  assert(isOnItsThread());
   std::vector<std::shared_ptr<HttpLaneQueue>> lanes;  // _busy changes on the way
   lanes.reserve(_busy.size());
   for (const auto& [key, lane] : _busy) lanes.push_back(lane);
@@ -209,6 +216,7 @@ void HttpTransferLoop::finishCurrent(HttpLaneQueue& lane, HttpResult result) {
 }
 
 void HttpTransferLoop::end(std::unique_ptr<PendingHttpRequest> request, HttpResult result) {
+  assert(isOnItsThread());
   if (request->deadline) _deadlines.erase(request->deadlineEntry);
   _intake.release(*request);
   deliver(std::move(request), std::move(result));

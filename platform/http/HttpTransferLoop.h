@@ -6,6 +6,7 @@
 #include <deque>
 #include <memory>
 #include <string>
+#include <thread>
 #include <unordered_map>
 #include <vector>
 
@@ -16,12 +17,23 @@
 
 namespace orvanta::platform {
 
-// What the HTTP thread does: takes requests from the intake, keeps one of each lane in flight, watches deadlines,
-// follows redirects and hands results over. Asleep, without any wake-up, while nothing is in flight. Owned by the
-// client, which runs it on its one thread; only wake() may be called from another.
+// The work of the HTTP thread: takes requests from the intake, keeps one of each lane in flight, watches deadlines,
+// follows redirects and delivers results. Asleep, without any wake-up, while nothing is in flight. Owned by the client,
+// which runs it on its one thread; only wake() may be called from another.
+//
+// A request's states, and the step of run() that moves it:
+//
+//     submitted ---> waiting ---> current ---> ended
+//       enqueue()      startNext()  |  ^         finishCurrent(), finishWaiting()
+//                                   +--+ a redirect: send() again
+//
+// It waits in its lane until no other one of the lane is current; lanes take turns through `_ready`, and at most
+// kMaximumInFlight requests of limited lanes are current at once, so that many lanes cannot open connections without
+// bound. It ends by its answer, its deadline (expire()), an abort or a failure of libcurl (fail()), from either state.
+// settle() is what keeps the lists true: after each change it lists the lane as ready, or forgets it.
 class HttpTransferLoop {
  public:
-  // Null when libcurl can make no multi handle. Intake and options outlive the loop.
+  // Null when libcurl cannot make a multi handle. Intake and options outlive the loop.
   static std::unique_ptr<HttpTransferLoop> create(HttpIntake& intake, const HttpClientOptions& options);
   ~HttpTransferLoop();
   HttpTransferLoop(const HttpTransferLoop&) = delete;
@@ -44,17 +56,18 @@ class HttpTransferLoop {
   HttpTransferLoop(CURLM* multi, HttpIntake& intake, const HttpClientOptions& options)
       : _multi(multi), _intake(intake), _options(options) {}
 
+  bool isOnItsThread() const { return std::this_thread::get_id() == _thread; }
   void enqueue(std::unique_ptr<PendingHttpRequest> request);
   void startReady();
   void startNext(HttpLaneQueue& lane);
-  // Whether any transfer ended.
+  // Returns whether any transfer ended.
   bool harvest();
   void transferDone(PendingHttpRequest& request, CURLcode code);
   void send(PendingHttpRequest& request);
   void expire();
   void sleep();
   void recoverFrom(CURLMcode code);
-  enum class Whom { blocking, inFlight, everybody };
+  enum class Whom { blocking, inFlight, all };
   void fail(Whom whom, const std::string& why);
   void finishWaiting(HttpLaneQueue& lane, const PendingHttpRequest& request, HttpResult result);
   void finishCurrent(HttpLaneQueue& lane, HttpResult result);
@@ -68,6 +81,7 @@ class HttpTransferLoop {
   const HttpClientOptions& _options;
 
   // The HTTP thread's.
+  std::thread::id _thread;                                                   // the one in run()
   std::unordered_map<HttpLaneQueue*, std::shared_ptr<HttpLaneQueue>> _busy;  // lanes with requests
   // Lanes with waiting requests and none in flight: unrefused ones first, then the longest ready. May name some whose
   // requests have ended meanwhile.

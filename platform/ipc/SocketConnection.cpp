@@ -1,6 +1,7 @@
 #include "platform/ipc/SocketConnection.h"
 
 #include <array>
+#include <cassert>
 #include <utility>
 #include <variant>
 
@@ -81,6 +82,7 @@ void SocketConnection::resume(std::shared_ptr<ConnectionDelegate> delegate) {
 }
 
 void SocketConnection::begin(std::shared_ptr<ConnectionDelegate> delegate) {
+  assert(_queue->isCurrent());
   if (_phase == Phase::ended) {  // cancelled before
     delegate->invalidated(std::nullopt);
     return;
@@ -93,6 +95,7 @@ void SocketConnection::begin(std::shared_ptr<ConnectionDelegate> delegate) {
 }
 
 void SocketConnection::takeTurn() {
+  assert(_queue->isCurrent());
   if (_phase != Phase::open) return;
   Pause pause;
   {
@@ -181,6 +184,7 @@ void SocketConnection::readOnce() {
 }
 
 UniqueFd SocketConnection::takeDescriptor() {
+  assert(_queue->isCurrent());
   if (_descriptors.empty()) return {};
   UniqueFd oldest = std::move(_descriptors.front());
   _descriptors.erase(_descriptors.begin());
@@ -192,6 +196,7 @@ void SocketConnection::outboxEased() {
 }
 
 void SocketConnection::eased() {
+  assert(_queue->isCurrent());
   switch (_phase) {
     case Phase::open:
       if (std::exchange(_waitsForReplies, false)) takeTurn();
@@ -209,6 +214,7 @@ void SocketConnection::eased() {
 }
 
 void SocketConnection::inputEnded() {
+  assert(_queue->isCurrent());
   if (hasHungUp(_socket.get()) || _outbox->broken()) {
     end();
     return;
@@ -227,6 +233,7 @@ void SocketConnection::cancel(std::chrono::milliseconds drainReplies) {
 
 // What has been read is carried out in spite of the end: its sender may take it for delivered.
 void SocketConnection::carryOutRest() {
+  assert(_queue->isCurrent());
   const Gathering gathering(*_outbox);
   for (;;) {
     FrameDecoder::Outcome outcome = _decoder.next();
@@ -236,6 +243,7 @@ void SocketConnection::carryOutRest() {
 }
 
 void SocketConnection::endAfterDrain(std::chrono::milliseconds timeout) {
+  assert(_queue->isCurrent());
   if (timeout.count() <= 0 || _outbox->awaitAtMost(0)) {
     end();
     return;
@@ -248,6 +256,7 @@ void SocketConnection::endAfterDrain(std::chrono::milliseconds timeout) {
 }
 
 void SocketConnection::end() {
+  assert(_queue->isCurrent());
   if (_phase == Phase::ended) return;
   _phase = Phase::ended;
   _watch.reset();

@@ -4,6 +4,7 @@
 #include <sys/socket.h>
 
 #include <algorithm>
+#include <cassert>
 #include <chrono>
 #include <limits>
 #include <utility>
@@ -207,6 +208,7 @@ void SocketOutbox::startWaiting() {
 }
 
 void SocketOutbox::waitUntilWritable(const std::shared_ptr<void>& owner) {
+  assert(_writerQueue->isCurrent());
   {
     const MutexLock lock(_mutex);
     if (!isUsable()) return;
@@ -222,11 +224,13 @@ void SocketOutbox::waitUntilWritable(const std::shared_ptr<void>& owner) {
 }
 
 void SocketOutbox::retryLater(const std::shared_ptr<void>& owner) {
+  assert(_writerQueue->isCurrent());
   if (!_writer.retry) _writer.retry = _writerQueue->makeTimer();
   _writer.retry->runAfter(kRetryWhenStarved, [self = shared_from_this(), owner] { self->writeOn(owner); });
 }
 
 void SocketOutbox::writeOn(const std::shared_ptr<void>& owner) {
+  assert(_writerQueue->isCurrent());
   std::shared_ptr<Observer> tell;
   Sent::Kind last = Sent::Kind::some;
   bool more = false;
@@ -248,6 +252,7 @@ void SocketOutbox::writeOn(const std::shared_ptr<void>& owner) {
 }
 
 void SocketOutbox::stopWaiting() {
+  assert(_writerQueue->isCurrent());
   _writer.watch.reset();  // before its descriptor, whose number may then come to mean another
   _writer.retry.reset();
   _writer.socket.reset();

@@ -20,8 +20,22 @@ namespace orvanta::platform {
 // The outbox of a SocketConnection, which makes it, keeps the socket open until close(), and hears of its progress.
 //
 // send() may be called on any thread. What the socket does not take at once waits here, and is written when the socket
-// becomes writable: on a queue of its own, since the connection's may be busy for long. After a failed write everything
-// is dropped, what waits and what comes.
+// becomes writable: on a queue of its own, since the connection's may be busy for long.
+//
+// Its states, and what moves it:
+//
+//     open ---finish()---> finishing ---all written---> finished
+//       |                      |
+//       +---- a write fails ---+----> broken                   any state ---close()---> closed
+//
+// Only an open outbox takes messages. Finishing writes what waits and then shuts the sending side down. Once a write
+// has failed the peer may have half a message, so that everything is dropped, waiting or new. Closed differs in that
+// the descriptor is not touched any more: its number may soon belong to another socket.
+//
+// Beside that, one writer at a time: as a rule the sender writes at once, under the lock. When the socket takes no
+// more, a job on _writerQueue waits for it (_waiting) and is the only one to write until nothing waits; senders then
+// append only, which keeps messages in order. While a thread gathers (_gatherer), what it sends is appended, too, and
+// written at the end of its batch.
 class SocketOutbox final : public Outbox, public std::enable_shared_from_this<SocketOutbox> {
  public:
   // Above this, gathered messages are written before their batch ends.
@@ -30,7 +44,7 @@ class SocketOutbox final : public Outbox, public std::enable_shared_from_this<So
   class Observer {
    public:
     virtual ~Observer() = default;
-    // What awaitAtMost() waited for has come, or a write has failed. On any thread, without locks held.
+    // No more than awaitAtMost()'s limit waits now, or a write has failed. On any thread, without locks held.
     virtual void outboxEased() = 0;
   };
 
@@ -49,7 +63,8 @@ class SocketOutbox final : public Outbox, public std::enable_shared_from_this<So
   void writeGathered();
 
   bool broken() const;
-  // True when no more than `limit` bytes wait or a write has failed; otherwise the observer hears it once that is so.
+  // Returns true when no more than `limit` bytes wait or a write has failed; otherwise the observer is told once that
+  // is so.
   bool awaitAtMost(std::size_t limit);
   // Takes nothing more, and shuts down the sending side once all is written.
   void finish();
@@ -71,18 +86,18 @@ class SocketOutbox final : public Outbox, public std::enable_shared_from_this<So
   bool isUsable() const REQUIRES(_mutex) { return _state == State::open || _state == State::finishing; }
   bool isGathering() const REQUIRES(_mutex) { return _gatherer == std::this_thread::get_id(); }
   std::size_t waitingBytes() const REQUIRES(_mutex) { return _bytes.size() - _start; }
-  // Until nothing waits or the socket takes no more for now, which the result tells.
+  // Writes until nothing waits or the socket takes no more for now, as the result says.
   Sent::Kind writeWaiting() REQUIRES(_mutex);
   Sent writeSome() REQUIRES(_mutex);
   void keep(std::span<const std::uint8_t> rest) REQUIRES(_mutex);
   void dropFront(std::size_t count) REQUIRES(_mutex);
   void becomeUseless(State state) REQUIRES(_mutex);
-  // Ends every operation: what follows from how the last write went. Whom it returns is to be told once the lock is
-  // released.
+  // Ends every operation: draws the consequences of the last write. The caller tells the returned observer, if any,
+  // once it has released the lock.
   [[nodiscard]] std::shared_ptr<Observer> settle(Sent::Kind last) REQUIRES(_mutex);
   void startWaiting() REQUIRES(_mutex);
 
-  // On _writerQueue.
+  // On _writerQueue only.
   void waitUntilWritable(const std::shared_ptr<void>& owner);
   void writeOn(const std::shared_ptr<void>& owner);
   void retryLater(const std::shared_ptr<void>& owner);

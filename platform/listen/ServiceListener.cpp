@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 #include <sys/socket.h>
 
+#include <cassert>
 #include <cerrno>
 #include <unordered_map>
 #include <utility>
@@ -77,6 +78,7 @@ void Acceptor::start() {
 }
 
 void Acceptor::acceptSome() {
+  assert(_queue->isCurrent());
   if (_closed) return;
   if (!_watch) _watch = _queue->makeDescriptorWatch(_socket.socket.get());
   if (!_watch) return pause(ENOSPC);  // the limit of watched descriptors
@@ -175,6 +177,7 @@ bool Acceptor::stop(std::optional<std::chrono::seconds> limit) {
 }
 
 void Acceptor::close() {
+  assert(_queue->isCurrent());
   _closed = true;
   _watch.reset();
   _timer.reset();

@@ -3,6 +3,7 @@
 #include <pthread.h>
 
 #include <algorithm>
+#include <cassert>
 #include <system_error>
 #include <utility>
 
@@ -118,6 +119,7 @@ std::size_t PoolThreads::count() const {
 }
 
 void PoolThreads::blockingBegins() {
+  assert(current() == this);
   const MutexLock lock(_mutex);
   ++_blocked;
   if (_closed || _running - _blocked >= _wanted || _running >= _maximum) return;
@@ -132,6 +134,7 @@ void PoolThreads::blockingBegins() {
 }
 
 void PoolThreads::blockingEnds() {
+  assert(current() == this);
   const MutexLock lock(_mutex);
   --_blocked;
 }

@@ -11,9 +11,16 @@ namespace orvanta::platform {
 
 // The threads of a WorkPool: a fixed number, and extra ones that stand in for threads that block.
 //
-// Owned by its pool. An extra thread steps in when fewer than the fixed number would be left to run jobs. It steps
-// aside with the first job, or after kLinger, that finds it superfluous, since threads that share a loop wake each
-// other, and ends when it has not been needed for as long again. All operations may be called from any thread.
+// Owned by its pool. The fixed threads run jobs until the loop stops. An extra thread goes through these states:
+//
+//     blockingBegins() ---> running ---superfluous after a job or kLinger---> aside ---kLinger---> retired
+//                              ^                                                |
+//                              +------------called back (_calledBack)----------+
+//
+// It steps in when blocked threads would leave fewer than the fixed number to run jobs (_running - _blocked < _wanted),
+// and steps aside because threads that share a loop wake each other. Aside it can be called back for less than a new
+// thread costs. A retired thread has left _threads; the next one to retire, or join(), joins it. After closeDown() no
+// state changes but to the end. All operations may be called from any thread.
 class PoolThreads {
  public:
   static constexpr std::chrono::milliseconds kLinger{1000};

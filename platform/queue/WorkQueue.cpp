@@ -7,6 +7,7 @@
 #include <asio/post.hpp>
 #include <asio/steady_timer.hpp>
 #include <asio/strand.hpp>
+#include <cassert>
 #include <cstdint>
 #include <stdexcept>
 #include <utility>
@@ -100,10 +101,12 @@ class SteadyTimer final : public Timer {
     runAt(std::chrono::steady_clock::now() + delay, std::move(handler));
   }
   void runAt(std::chrono::steady_clock::time_point when, Job handler) override {
+    assert(_queue->isCurrent());
     _timer.expires_at(when);
     _timer.async_wait(_queue->completion(_arming, std::move(handler)));
   }
   void cancel() override {
+    assert(_queue->isCurrent());
     _arming->disarm();
     _timer.cancel();
   }
@@ -137,6 +140,7 @@ class StrandWatch final : public DescriptorWatch {
   }
   void whenHungUp(Job handler) override { wait(asio::posix::descriptor_base::wait_error, _hungUp, std::move(handler)); }
   void cancel() override {
+    assert(_queue->isCurrent());
     disarm();
     asio::error_code ignored;
     _descriptor.cancel(ignored);
@@ -146,6 +150,7 @@ class StrandWatch final : public DescriptorWatch {
   using SharedArming = std::shared_ptr<Arming>;
 
   void wait(asio::posix::descriptor_base::wait_type what, SharedArming& arming, Job handler) {
+    assert(_queue->isCurrent());
     if (!arming) arming = std::make_shared<Arming>();
     _descriptor.async_wait(what, _queue->completion(arming, std::move(handler)));
   }

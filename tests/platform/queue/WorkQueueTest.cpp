@@ -296,5 +296,15 @@ TEST_F(WatchTest, LeavesTheDescriptorOpenAndNeedsAnOpenOne) {
   onQueue([&] { EXPECT_EQ(_queue->makeDescriptorWatch(closed), nullptr) << "that cannot be watched"; });
 }
 
+// In debug builds. The pool has not started, so that the process has one thread when it forks.
+TEST(WorkQueueDeathTest, TimersAndWatchesAreUsedOnTheirQueueOnly) {
+  WorkPool pool(1);
+  const auto queue = pool.makeQueue();
+  EXPECT_FALSE(queue->isCurrent());
+  const auto timer = queue->makeTimer();
+  EXPECT_DEBUG_DEATH(timer->cancel(), "isCurrent");
+  EXPECT_DEBUG_DEATH(timer->runAfter(1h, [] {}), "isCurrent");
+}
+
 }  // namespace
 }  // namespace orvanta::platform
