@@ -89,7 +89,7 @@ class BinaryReader {
     return false;
   }
 
-  // Whether `count` things of `size` bytes lie between `offset` and the offset table.
+  // Returns whether `count` things of `size` bytes lie between `offset` and the offset table.
   bool fits(std::size_t offset, std::uint64_t count, std::size_t size) const {
     return offset <= _tableOffset && count <= (_tableOffset - offset) / size;
   }

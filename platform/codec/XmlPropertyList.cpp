@@ -30,7 +30,7 @@ std::string_view trimmed(std::string_view text) {
   return text.substr(first, text.find_last_not_of(kWhiteSpace) - first + 1);
 }
 
-// What stands between "&" and ";". None for what is not predefined: a document's own entities are never looked up.
+// The text between "&" and ";". Nullopt unless it is predefined: a document's own entities are never looked up.
 std::optional<char32_t> entity(std::string_view name) {
   if (name == "lt") return U'<';
   if (name == "gt") return U'>';
@@ -146,7 +146,7 @@ class XmlReader {
     return node.type() == pugi::node_pcdata && isBlank(node.value());
   }
 
-  // The element at or behind `node` on its level; nothing when there is none or (an error) text comes first.
+  // The element at or behind `node` on its level; null when there is none or (an error) text comes first.
   pugi::xml_node nextElement(pugi::xml_node node) {
     while (node && isIgnorable(node)) node = node.next_sibling();
     if (!node || node.type() == pugi::node_element) return node;

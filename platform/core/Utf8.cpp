@@ -16,7 +16,7 @@ Word load(const char* text) {
   return word;
 }
 
-// Whether all of a text is ASCII. Overlapping words at the end spare a loop over single bytes.
+// Returns whether all of a text is ASCII. Overlapping words at the end spare a loop over single bytes.
 bool isAscii(const char* text, std::size_t size) {
   if (size < sizeof(std::uint64_t)) {
     if (size >= sizeof(std::uint32_t)) {

@@ -19,7 +19,7 @@ bool isDigit(char c) {
   return c >= '0' && c <= '9';
 }
 
-// What follows leading white space and at most one sign.
+// The text after leading white space and at most one sign.
 struct SignedText {
   bool negative = false;
   std::string_view rest;
@@ -244,7 +244,7 @@ bool Value::boolValue() const {
 std::optional<bool> Value::booleanReading() const {
   if (const auto* v = std::get_if<bool>(&_storage)) return *v;
   if (isInteger()) return integerValue() != 0;
-  // What is no number is no consent either.
+  // A value that is not a number is not a consent either.
   if (const auto* v = std::get_if<double>(&_storage)) return *v != 0 && !std::isnan(*v);
   if (const std::string* v = string()) return textIsTrue(*v);
   return std::nullopt;

@@ -35,7 +35,7 @@ bool contains(const std::array<std::string_view, Count>& keys, std::string_view 
   return std::find(keys.begin(), keys.end(), key) != keys.end();
 }
 
-// What of a device.plist makes sense, with remarks on the rest: a misspelt key or a wrong type would else look like a
+// The valid part of a device.plist, with remarks on the rest: a misspelt key or a wrong type would else look like a
 // setting that has no effect.
 Dictionary understood(const Dictionary& content, const std::string& path, std::vector<std::string>& remarks) {
   Dictionary result;
@@ -66,7 +66,8 @@ struct LinuxDeviceProperties::State {
   std::optional<std::string> text(std::string_view key);
   std::optional<bool> boolean(std::string_view key);
 
-  // A file of the system; none when it is not there or not for us (serial numbers often are for root only).
+  // A file of the system; nullopt when it does not exist or we may not read it (serial numbers are often for root
+  // only).
   std::optional<std::string> systemFile(const char* name) const;
   std::optional<std::string> osRelease(std::string_view key) const;
   // The first of these files that holds something of use.

@@ -85,7 +85,7 @@ class OpenSslRsaPublicKey final : public RsaPublicKey {
   const Key _key;  // constant after construction
 };
 
-// Whether anything can be concluded from the key's signatures: with an exponent of 1, for one, anybody could make them.
+// Returns whether the key's signatures prove anything: with an exponent of 1, for one, anyone could make them.
 bool isUsable(EVP_PKEY* key) {
   if (EVP_PKEY_is_a(key, "RSA") != 1) return false;
   const KeyContext context(EVP_PKEY_CTX_new_from_pkey(nullptr, key, nullptr));

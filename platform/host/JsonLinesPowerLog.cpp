@@ -55,7 +55,7 @@ void JsonLinesPowerLog::registeredEvent(std::int32_t event, std::string_view sen
 
 bool JsonLinesPowerLog::openFile() {
   struct stat status {};
-  // A file that somebody removed, renamed or replaced would take lines that nobody reads.
+  // Lines in a file that has been removed, renamed or replaced would never be read.
   if (_file && ::lstat(_path.c_str(), &status) == 0 && status.st_dev == _device && status.st_ino == _inode) return true;
   _file.reset(::open(_path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, kFileMode));
   if (!_file || ::fstat(_file.get(), &status) != 0) return false;
@@ -86,7 +86,7 @@ bool JsonLinesPowerLog::append(std::string_view line) {
     _size += line.size();
     return true;
   }
-  // Half a line would spoil the next one. What cannot be cut off is counted when the file is opened again.
+  // Half a line would spoil the next one. A part that cannot be cut off is counted when the file is opened again.
   if (written >= 0) {
     if (::ftruncate(_file.get(), static_cast<off_t>(_size)) != 0) _file.reset();
     errno = ENOSPC;

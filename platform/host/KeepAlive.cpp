@@ -13,7 +13,8 @@ namespace orvanta::platform {
 
 namespace {
 
-// What the service manager was told last. There is one service manager, however many KeepAlives there are. Thread-safe.
+// The last message to the service manager. There is one service manager, however many KeepAlives there are.
+// Thread-safe.
 class Told {
  public:
   void begin() {

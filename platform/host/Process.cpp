@@ -48,7 +48,7 @@ sigset_t terminationSignals() {
 
 void secureStandardDescriptors() {
   for (const int standard : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
-    // What is opened gets the lowest free number, which is this one, as those below it are open by now.
+    // open() takes the lowest free number, which is this one, as those below it are open by now.
     if (::fcntl(standard, F_GETFD) < 0 && errno == EBADF) ::open("/dev/null", O_RDWR);
   }
 }

@@ -22,7 +22,7 @@ namespace orvanta::platform {
 namespace {
 
 constexpr std::size_t kMaximumBytes = 16U << 20U;
-constexpr mode_t kNewFileMode = 0600;  // persistent identifiers are nobody else's business
+constexpr mode_t kNewFileMode = 0600;  // persistent identifiers are for this account alone
 
 // Waits for the mutex in a BlockingScope: the thread that holds it may be waiting for a disk or another process.
 class SCOPED_CAPABILITY BlockingLock {
@@ -58,7 +58,7 @@ class UserDefaults::DirectoryLock {
  public:
   static Result<DirectoryLock> take(const std::string& directory) {
     std::error_code ignored;
-    std::filesystem::create_directories(directory, ignored);  // what failed shows when the directory is opened
+    std::filesystem::create_directories(directory, ignored);  // a failure shows when the directory is opened
     UniqueFd fd(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     if (!fd) return Failure{fmt::format("cannot open {}: {}", directory, errnoText(errno))};
     while (::flock(fd.get(), LOCK_EX) != 0) {
@@ -166,7 +166,7 @@ Result<void> UserDefaults::keepAside(const FileStamp& stamp, const std::string& 
   return {};
 }
 
-// Remembers a file that makes no sense and cannot be moved, so that it is not read and logged again at every question.
+// Remembers a file that is invalid and cannot be moved, so that it is not read and logged again at every question.
 Result<void> UserDefaults::leaveInPlace(const FileStamp& stamp, const std::string& why, const std::string& obstacle) {
   _stamp = stamp;
   _loaded = true;
@@ -194,7 +194,7 @@ Result<void> UserDefaults::replaceFile(const DirectoryLock& lock, const Dictiona
   const auto text = writeXmlPropertyList(Value(content));
   if (!text) return Failure{text.error()};
   const int directory = lock.directory();
-  // One name suffices, as writers take turns; a file left by a killed one is in nobody's use.
+  // One name suffices, as writers take turns; a file left by a killed one is not in use.
   const std::string temporary = _fileName + ".new";
   ::unlinkat(directory, temporary.c_str(), 0);
   const UniqueFd fd(::openat(directory, temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, kNewFileMode));

@@ -69,7 +69,7 @@ HttpResult CurlHttpClient::perform(const std::shared_ptr<HttpLane>& lane, HttpRe
   pending->completion = [&awaited](HttpResult outcome) {
     const MutexLock lock(awaited.mutex);
     awaited.result = std::move(outcome);
-    awaited.arrived.notifyOne();  // under the lock: once this thread goes on, none of this is there any more
+    awaited.arrived.notifyOne();  // under the lock: once this thread goes on, none of this exists any more
   };
   submit(std::move(pending));
   const BlockingScope scope;

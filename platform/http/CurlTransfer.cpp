@@ -53,10 +53,10 @@ void CurlTransfer::applyConstantOptions() {
     curl_easy_setopt(_easy, CURLOPT_CAPATH, nullptr);  // the system's must not count beside it
   }
 
-  const auto patience = static_cast<long>(_options.limits.noProgress.count());
-  curl_easy_setopt(_easy, CURLOPT_CONNECTTIMEOUT, patience);
+  const auto timeout = static_cast<long>(_options.limits.noProgress.count());
+  curl_easy_setopt(_easy, CURLOPT_CONNECTTIMEOUT, timeout);
   curl_easy_setopt(_easy, CURLOPT_LOW_SPEED_LIMIT, 1L);
-  curl_easy_setopt(_easy, CURLOPT_LOW_SPEED_TIME, patience);
+  curl_easy_setopt(_easy, CURLOPT_LOW_SPEED_TIME, timeout);
   // A resolver that hangs must not be waited for when the transfer is given up.
   curl_easy_setopt(_easy, CURLOPT_QUICK_EXIT, 1L);
 

@@ -36,7 +36,7 @@ const char* whyLeftOut(const HttpHeader& header) {
   return nullptr;
 }
 
-// libcurl writes "Name;" as a header with an empty value, and takes one of blanks only for none at all.
+// libcurl writes "Name;" as a header with an empty value, and takes one of blanks only for no header at all.
 std::string lineOf(std::string_view name, std::string_view value) {
   std::string line(name);
   if (value.find_first_not_of(' ') == std::string_view::npos) return line += ';';

@@ -125,7 +125,7 @@ FrameDecoder::Outcome FrameDecoder::decode(std::span<const std::uint8_t> window)
   frame.wireSize = reader.offset();
   frame.charge = sizeof(Frame) + reader.charge();
   if (frame.refusal) {
-    // What could be read of the params stays: it tells whether a descriptor came with the call.
+    // The params that could be read stay: they tell whether a descriptor came with the call.
     frame.error = Value();
     frame.result = Value();
   }

@@ -173,7 +173,7 @@ void SocketConnection::readOnce() {
     case Received::Kind::bytes:
       break;
   }
-  // One read ends where descriptors came along, whatever lies behind.
+  // One read ends where descriptors came along, even if more bytes lie behind.
   _socketEmpty = received.size < buffer.size() && _descriptors.size() == descriptors;
   _decoder.append(buffer.first(received.size));
   if (received.descriptorsLost) {
@@ -231,7 +231,7 @@ void SocketConnection::cancel(std::chrono::milliseconds drainReplies) {
   });
 }
 
-// What has been read is carried out in spite of the end: its sender may take it for delivered.
+// Frames that have been read are carried out in spite of the end: their sender may take them for delivered.
 void SocketConnection::carryOutRest() {
   assert(_queue->isCurrent());
   const Gathering gathering(*_outbox);

@@ -15,8 +15,8 @@ namespace {
 
 constexpr std::chrono::milliseconds kRetryWhenStarved{50};
 
-// Where a thread gathers: lent to the outbox of the connection whose calls it carries out, so that none keeps one for
-// itself.
+// Where a thread gathers: lent to the outbox of the connection whose calls it carries out, so that connections need no
+// buffer of their own.
 thread_local std::vector<std::uint8_t> tSpare;
 
 void giveBack(std::vector<std::uint8_t>& bytes) {

@@ -56,7 +56,7 @@ Result<std::uint32_t> groupNumber(const std::string& name) {
   return (*found)->gr_gid;
 }
 
-// A number, or a text that is a number or a name. The largest number means "nobody" to the kernel and is no identity.
+// A number, or a text that is a number or a name. The largest number stands for no user to the kernel.
 Result<std::uint32_t> identityNumber(const Value& value, Result<std::uint32_t> (*byName)(const std::string&)) {
   constexpr std::uint32_t kNone = std::numeric_limits<std::uint32_t>::max();
   if (const auto* const number = std::get_if<std::int64_t>(&value.storage())) {
@@ -73,7 +73,7 @@ Result<std::uint32_t> identityNumber(const Value& value, Result<std::uint32_t> (
 }
 
 struct Grant {
-  bool matches = false;  // the peer in question, or anybody
+  bool matches = false;  // the peer in question, or any
   const Dictionary* entitlements = nullptr;
 };
 
@@ -159,7 +159,7 @@ bool Entitlements::isGranted(const PeerIdentity* peer, std::string_view entitlem
   return held;
 }
 
-// Anybody may connect as often as he likes: that must not fill the log.
+// Any process may connect as often as it likes: that must not fill the log.
 void Entitlements::tell(const std::string& path, const std::string& problem) {
   {
     const MutexLock lock(_mutex);

@@ -10,9 +10,9 @@ namespace orvanta::platform {
 
 namespace {
 
-constexpr uid_t kNobodyAtAll = static_cast<uid_t>(-1);  // what a socket without a peer reports
+constexpr uid_t kNoUser = static_cast<uid_t>(-1);  // reported by a socket without a peer
 
-// A socket option whose size only the kernel knows; empty when the kernel has none.
+// A socket option whose size only the kernel knows; empty when the kernel has no value.
 template <class Container>
 Container optionOf(int socket, int option, std::size_t expected) {
   using Element = typename Container::value_type;
@@ -35,7 +35,7 @@ Result<PeerIdentity> peerIdentityOf(int socket) {
   if (::getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &credentials, &size) != 0) {
     return Failure{"The socket has no peer credentials: " + errnoText(errno)};
   }
-  if (credentials.uid == kNobodyAtAll)
+  if (credentials.uid == kNoUser)
     return Failure{"The socket has no peer credentials: It is not connected to a process"};
 
   PeerIdentity peer;

@@ -20,7 +20,7 @@ constexpr int kAcceptsPerTurn = 16;
 constexpr std::chrono::milliseconds kPause{100};
 constexpr std::chrono::minutes kLogInterval{1};
 
-// Whether a line that could come at any rate is due again.
+// Returns whether a line that could come at any rate is due again.
 bool isDue(std::optional<std::chrono::steady_clock::time_point>& logged) {
   const auto now = std::chrono::steady_clock::now();
   if (logged && now - *logged < kLogInterval) return false;
@@ -88,7 +88,7 @@ void Acceptor::acceptSome() {
   start();  // others first
 }
 
-// False when there is nothing more to accept for now; then what comes next has been seen to.
+// Returns false when there is nothing more to accept for now; the next attempt has then been arranged.
 bool Acceptor::acceptOne() {
   UniqueFd socket(::accept4(_socket.socket.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
   if (socket) {

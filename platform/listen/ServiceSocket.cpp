@@ -74,7 +74,7 @@ Result<UniqueFd> takeLock(const std::string& directory, const std::string& servi
   return lock;
 }
 
-// Removes a socket file that nobody listens behind; otherwise says what stands in the way.
+// Removes a socket file without a listener; otherwise says what stands in the way.
 Result<void> removeStale(const std::string& directory, const std::string& service) {
   const std::string path = directory + "/" + service;
   int error = 0;
@@ -117,7 +117,7 @@ Result<ServiceSocket> openServiceSocket(const std::string& directory, const std:
     if (const auto removed = removeStale(directory, service); !removed) return Failure{removed.error()};
     if (!bind()) return failure("Cannot bind " + result.path, errno);
   }
-  // Before listening, so that nobody meets other permissions. Who is admitted is decided by entitlement.
+  // Before listening, so that no client meets other permissions. Entitlements decide which peers are admitted.
   struct stat status {};
   if (::chmod(result.path.c_str(), 0666) != 0 || ::stat(result.path.c_str(), &status) != 0) {
     return failure("Cannot open " + result.path + " to everybody", errno);

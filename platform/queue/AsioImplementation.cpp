@@ -1,2 +1,2 @@
-// Asio's own code, compiled once for everybody.
+// Asio's own code, compiled once for all sources.
 #include <asio/impl/src.hpp>

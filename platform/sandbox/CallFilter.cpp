@@ -53,7 +53,7 @@ int add(const Filter& filter, std::span<const SandboxCalls::Limit> limits) {
   return 0;
 }
 
-// The profile's rules; those that say what `others` says anyhow are left out.
+// The profile's rules, without those that `others` implies.
 int addRules(const Filter& filter, const SandboxCalls& calls, std::uint32_t others) {
   constexpr std::uint32_t kRefuse = SCMP_ACT_ERRNO(ENOSYS);
   int error = add(filter, SCMP_ACT_ALLOW, calls.allow);
@@ -67,8 +67,8 @@ int addRules(const Filter& filter, const SandboxCalls& calls, std::uint32_t othe
 }  // namespace
 
 Result<int> filterCalls(const SandboxCalls& calls) {
-  // Where somebody else watches already, as some containers do, the kernel does not take a second watcher. The library
-  // does not tell that from other failures, which the second attempt meets again.
+  // Where another process watches already, as in some containers, the kernel does not take a second watcher. The
+  // library does not tell that from other failures, which the second attempt meets again.
   int error = 0;
   for (const std::uint32_t others : {SCMP_ACT_NOTIFY, SCMP_ACT_ERRNO(ENOSYS)}) {
     const Filter filter = makeFilter(others);

@@ -18,8 +18,8 @@ namespace orvanta::platform {
 
 namespace {
 
-// What a ruleset controls, as the newest kernels take it; installed headers may be older. Older kernels take the
-// beginning.
+// The things that a ruleset controls, as the newest kernels take it; installed headers may be older. Older kernels take
+// the beginning.
 struct RulesetAttributes {
   std::uint64_t files;
   std::uint64_t network;  // ABI 4

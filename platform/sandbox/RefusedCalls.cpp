@@ -35,13 +35,13 @@ struct RefusedCalls::Watch {
   std::set<int> limited;  // allowed with other arguments; constant after construction
   UniqueFd stop{::eventfd(0, EFD_CLOEXEC)};
   std::promise<Result<void>> ready;  // the watcher is confined
-  std::promise<int> notifications;   // the descriptor to watch; -1: none
+  std::promise<int> notifications;   // the descriptor to watch; -1 for no watching
 
   void run();
 
  private:
   Result<void> prepare();
-  // False when the descriptor is of no use any more.
+  // Returns false when the descriptor is of no more use.
   bool answer(int fd);
 
   // Owned by the watcher. Of the kernel's sizes, which may be larger than those that we were built with.
@@ -86,7 +86,7 @@ bool RefusedCalls::Watch::answer(int fd) {
   std::fill(_request.begin(), _request.end(), 0);  // the kernel insists
   seccomp_notif request{};
   if (::ioctl(fd, SECCOMP_IOCTL_NOTIF_RECV, _request.data()) != 0) {
-    return errno == ENOENT || errno == EINTR;  // who waited has ended
+    return errno == ENOENT || errno == EINTR;  // the waiting thread has ended
   }
   std::memcpy(&request, _request.data(), sizeof request);
   const int call = request.data.nr;

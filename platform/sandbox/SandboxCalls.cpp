@@ -28,7 +28,7 @@ constexpr std::string_view kLimitsKey = "allowWith";
 
 constexpr int kHighestCall = 1023;  // beyond what any kernel numbers its calls with
 
-// Without these no program comes to its end, and a sandbox that lacks one would hang instead of saying so.
+// Without these no program can end, and a process in a sandbox without one would hang instead of saying so.
 constexpr const char* kIndispensable[] = {"brk",      "exit",   "exit_group", "futex",        "madvise", "mmap",
                                           "mprotect", "munmap", "read",       "rt_sigreturn", "write"};
 
@@ -90,7 +90,7 @@ class Reader {
   }
 
  private:
-  // None: a call that this machine does not have.
+  // Nullopt: a call that this machine does not have.
   Result<std::optional<int>> resolve(const Value& item, const std::string& place, const char* key) {
     if (item.string() == nullptr) {
       return Failure{fmt::format("{} holds {}, which is no name", place, item.description())};

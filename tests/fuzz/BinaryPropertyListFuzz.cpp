@@ -1,7 +1,7 @@
 #include "platform/codec/PropertyList.h"
 #include "tests/fuzz/Require.h"
 
-// What can be read and written is the same when it is read and written again.
+// A value that can be read and written is the same when it is read and written again.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
   using namespace orvanta::platform;
   const PropertyListLimits limits{64, 10'000, 1U << 20U};

@@ -26,7 +26,7 @@ void takeApart(Bytes datagram) {
   for (const auto& [key, value] : pairs) length += key.size() + 1 + value.size();
   REQUIRE(length <= 2 * packet->text.size());  // without a space before it a key is the end of a value, too
 
-  // What was read, written again, is a datagram of the same meaning.
+  // A datagram that was read and written again means the same.
   Dictionary payload;
   for (const auto& [key, value] : pairs) {
     if (platform::isValidUtf8(key) && platform::isValidUtf8(value)) payload.set(key, value);
@@ -79,7 +79,7 @@ void deliver(Bytes script) {
       REQUIRE(packet.numberOfRetransmits >= 0 && packet.numberOfRetransmits <= 4);
     }
   }
-  // Whatever came before, a silent server ends it in bounded time.
+  // A silent server always ends it in bounded time.
   for (int tick = 0; tick < 100; ++tick) delivery.tick([](Bytes) { return true; });
   REQUIRE(delivery.empty());
 }

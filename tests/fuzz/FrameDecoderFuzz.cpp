@@ -11,7 +11,7 @@ using namespace orvanta::platform;
 
 constexpr FrameLimits kLimits{4096, 64U << 10U, 16};
 
-// What came out, in a form that can be compared (NaN is not equal to itself).
+// The decoder's output, in a form that can be compared (NaN is not equal to itself).
 std::string describe(const Frame& frame) {
   std::vector<std::uint8_t> values;
   MessagePackWriter writer(values);
@@ -49,7 +49,7 @@ std::vector<std::string> decode(std::span<const std::uint8_t> stream, std::size_
 
 }  // namespace
 
-// The first byte cuts the stream; whatever the cut, the same comes out as from the whole.
+// The first byte cuts the stream; any cut gives the same as the whole.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
   if (size == 0) return 0;
   const std::span<const std::uint8_t> stream(bytes + 1, size - 1);

@@ -1,7 +1,7 @@
 #include "platform/codec/Json.h"
 #include "tests/fuzz/Require.h"
 
-// What can be read is the same when it is written, in either way, and read again; any bytes make a JSON text.
+// A value that can be read is the same when it is written, in either way, and read again; any bytes make a JSON text.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
   using namespace orvanta::platform;
   const std::string_view text(reinterpret_cast<const char*>(bytes), size);

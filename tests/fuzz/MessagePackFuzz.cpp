@@ -1,7 +1,7 @@
 #include "platform/codec/MessagePack.h"
 #include "tests/fuzz/Require.h"
 
-// What can be read is the same when it is written and read again, and takes no more bytes.
+// A value that can be read is the same when it is written and read again, and takes no more bytes.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
   using namespace orvanta::platform;
   const Result<Value> parsed = decodeMessagePack({bytes, size}, {64, 1U << 20U});

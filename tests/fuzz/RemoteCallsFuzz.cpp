@@ -50,7 +50,7 @@ void takeAsClient(Frame frame) {
   if (const auto token = decodeRemoveFile(frame)) REQUIRE(frame.method == "removeFile");
   auto event = decodeSendMessageToClient(frame);
   if (!event) return;
-  // What it means survives being sent on.
+  // Its meaning survives being sent on.
   FrameDecoder decoder;
   decoder.append(
       encodeSendMessageToClient(event->sessionInfo, event->timestamp, event->category, event->type, event->payload));
@@ -64,7 +64,7 @@ void takeAsClient(Frame frame) {
 }  // namespace
 
 // A peer's bytes as calls on a session, and as answers and notices to a client. The first byte says whether the session
-// answers or drops its replies; either way each request has one answer and a notification none.
+// answers or drops its replies; either way each request has one answer and a notification no answer.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
   if (size == 0) return 0;
   test::NotedSession session;

@@ -52,8 +52,8 @@ void evaluate(Platform& platform, const Value& profile) {
 
 }  // namespace
 
-// What a configuration server sends: the whole document when the first byte is even, else a bag that is signed as the
-// server would. A bag that comes through is evaluated for a client, profile by profile.
+// The answer of a configuration server: the whole document when the first byte is even, else a bag that is signed as
+// the server would. A bag that comes through is evaluated for a client, profile by profile.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
   static World& world = *new World;
   if (size == 0) return 0;
@@ -63,7 +63,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t siz
   StorebagFetch fetch;
   const auto section = fetchStorebagForEnvironmentAndClientType(world.device, 5, fetch);
   if (!section) return 0;
-  REQUIRE(isSigned);  // nobody can guess a signature
+  REQUIRE(isSigned);  // a signature cannot be guessed
   for (const auto& [name, profile] : *section) evaluate(world.device, profile);
   return 0;
 }

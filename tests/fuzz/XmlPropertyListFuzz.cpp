@@ -1,7 +1,7 @@
 #include "platform/codec/PropertyList.h"
 #include "tests/fuzz/Require.h"
 
-// What can be read is the same when it is written and read again.
+// A value that can be read is the same when it is written and read again.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
   using namespace orvanta::platform;
   const Result<Value> parsed = parseXmlPropertyList({bytes, size}, {64, 10'000, 1U << 20U});

@@ -38,8 +38,8 @@ class ChildProcess {
     bool holdInput = false;                          // no end of file before closeInput()
     bool keepOutput = false;
   };
-  // What waiting may take before the test counts as hung; nothing should come near it.
-  static constexpr std::chrono::seconds kPatience{60};
+  // Waiting longer means that the test hangs; nothing should come near it.
+  static constexpr std::chrono::seconds kTimeout{60};
 
   explicit ChildProcess(Options options) {
     Pipe input, output, error;
@@ -86,8 +86,8 @@ class ChildProcess {
   ChildProcess& operator=(const ChildProcess&) = delete;
 
   pid_t pid() const { return _pid; }
-  // Whether a line that holds `text` has come, now or within the patience; false at once when the program ended without
-  // it.
+  // Returns whether a line that holds `text` has come, now or within kTimeout; false at once when the program ended
+  // without it.
   bool waitForLine(const std::string& text, std::size_t wanted = 1) {
     std::unique_lock lock(_mutex);
     std::size_t scanned = 0, found = 0;
@@ -97,7 +97,7 @@ class ChildProcess {
       }
       return found >= wanted;
     };
-    _changed.wait_for(lock, kPatience, [&] { return enough() || _errorEnded; });
+    _changed.wait_for(lock, kTimeout, [&] { return enough() || _errorEnded; });
     return enough();
   }
   // These hold everything that the program had written when they were called.

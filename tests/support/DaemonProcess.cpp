@@ -106,7 +106,7 @@ double DaemonProcess::cpuSeconds() const {
 }
 
 bool DaemonProcess::settles(const std::function<std::size_t()>& counter, std::size_t limit) const {
-  const auto deadline = std::chrono::steady_clock::now() + ChildProcess::kPatience;
+  const auto deadline = std::chrono::steady_clock::now() + ChildProcess::kTimeout;
   while (counter() > limit) {
     if (std::chrono::steady_clock::now() > deadline) return false;
     std::this_thread::yield();

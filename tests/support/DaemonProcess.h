@@ -19,7 +19,7 @@ namespace orvanta::test {
 class DaemonProcess {
  public:
   struct Options {
-    std::string storebagURL;              // the user default; empty: none
+    std::string storebagURL;              // the user default; empty to set none
     std::vector<std::uint8_t> publicKey;  // DER; empty: no key file
     std::string caFile;                   // ORVANTA_CA_FILE
     Dictionary device;                    // device.plist
@@ -29,7 +29,7 @@ class DaemonProcess {
     std::string version = "8.0.0";
     std::string logLevel = "7";
     std::int64_t landlockAbi = 1000;  // the highest that the sandbox makes use of
-    std::string wrapper;              // a program that runs the daemon; empty: none
+    std::string wrapper;              // a program that runs the daemon, if any
     std::map<std::string, std::string> environment;
   };
 
@@ -67,8 +67,9 @@ class DaemonProcess {
   std::size_t residentKiB() const;
   // Counts until `counter` gives at most `limit`; false when it never does.
   bool settles(const std::function<std::size_t()>& counter, std::size_t limit) const;
-  // Whether `work` leaves the resident memory as it was, but for `leewayKiB`. What is kept, such as the buffers of a
-  // thread more, makes it grow once; a leak does each of a few times. Sanitizers keep what is freed: then it is true.
+  // Returns whether `work` leaves the resident memory as it was, but for `leewayKiB`. What is kept, such as the buffers
+  // of a thread more, makes it grow once; a leak does each of a few times. Sanitizers keep what is freed: then it is
+  // true.
   bool keepsItsMemory(std::size_t leewayKiB, const std::function<void()>& work) const;
   // The processor time that the daemon has used so far.
   double cpuSeconds() const;

@@ -20,7 +20,7 @@
 
 namespace orvanta::test {
 
-// What a system call's result comes to: "done" or errno's text.
+// The outcome of a system call: "done" or errno's text.
 inline std::string outcome(bool succeeded) {
   return succeeded ? "done" : std::string(::strerror(errno));
 }
@@ -40,7 +40,7 @@ inline constexpr const char* kDenied = "Permission denied";
 inline constexpr const char* kNotPermitted = "Operation not permitted";
 inline constexpr const char* kNotImplemented = "Function not implemented";
 
-// What nothing in the daemon's process may do once it has started, and how that ends. Shared by the sandbox's own tests
+// Acts forbidden to the daemon's process once it has started, and how they end. Shared by the sandbox's own tests
 // and by the plug-in that tries it inside the real daemon.
 struct ForbiddenAct {
   const char* name;

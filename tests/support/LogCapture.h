@@ -19,7 +19,7 @@ class LogCapture final : public platform::LogSink {
   }
   ~LogCapture() override {
     platform::installLogSink(_before);
-    const std::lock_guard lock(_mutex);  // behind whoever wrote last
+    const std::lock_guard lock(_mutex);  // behind the last writer
   }
   LogCapture(const LogCapture&) = delete;
   LogCapture& operator=(const LogCapture&) = delete;

@@ -45,7 +45,7 @@ inline Bytes request(std::uint32_t id, std::string_view method, const Array& par
   platform::appendRequestHeader(header, id, method, params.size());
   return withValues(std::move(header), params);
 }
-// Error and result are these values, whatever sense they make.
+// Error and result are these values, even if they contradict each other.
 inline Bytes response(std::uint32_t id, const Value& result, const Value& error = nullptr) {
   Bytes header;
   platform::appendResponseHeader(header, id);
@@ -99,7 +99,7 @@ class Peer {
     pollfd entry{_socket.get(), POLLIN, 0};
     return ::poll(&entry, 1, 0) == 1;
   }
-  // None at the end of the stream.
+  // Nullopt at the end of the stream.
   std::optional<platform::Frame> nextFrame() {
     for (;;) {
       auto outcome = _decoder.next();
@@ -113,7 +113,7 @@ class Peer {
       _decoder.append(std::span(buffer).first(size));
     }
   }
-  // The oldest descriptor that has come along; none when there is none.
+  // The oldest descriptor that has come along; empty when there is none.
   platform::UniqueFd takeDescriptor() {
     if (_descriptors.empty()) return {};
     auto oldest = std::move(_descriptors.front());
@@ -133,7 +133,7 @@ class Peer {
   }
 
  private:
-  // How many bytes; none at the end of the stream.
+  // How many bytes; nullopt at the end of the stream.
   std::size_t receive(std::span<std::uint8_t> buffer) {
     for (;;) {
       await(_socket.get(), POLLIN);

@@ -32,11 +32,11 @@ struct GroupOperation {
   // Which of these count follows from the kind.
   std::uint32_t group = 0, level = 0;
   bool aggregates = false, batches = false;
-  std::uint32_t variant = 0;          // of the user info or the storebag; of user info 0 is none
+  std::uint32_t variant = 0;          // of the user info or the storebag; 0 stands for no user info
   std::uint32_t count = 0, flag = 0;  // events
 };
 
-// What the members do, in order: the same for the same seed, whatever the daemon's timing. Used by one thread.
+// The members' operations, in order: the same for the same seed under any timing of the daemon. Used by one thread.
 class GroupOperations {
  public:
   static constexpr std::uint32_t kMembers = 200, kGroups = 20, kLevels = 5, kVariants = 4;
@@ -100,7 +100,7 @@ class RandomGroups {
   struct Daemon {
     std::string socketDirectory;
     std::function<void(std::uint32_t variant)> changeStorebag;
-    // Everybody has left; the first time, what the daemon holds then is the standard for later.
+    // All have left; what the daemon holds the first time is the standard for later.
     std::function<void(bool first)> compareLeftovers;
   };
   RandomGroups(Daemon daemon, std::chrono::seconds duration)
@@ -129,7 +129,7 @@ class RandomGroups {
   RandomGroups(const RandomGroups&) = delete;
   RandomGroups& operator=(const RandomGroups&) = delete;
 
-  // Rounds of operations, at whose end everybody leaves, until the time is up; prints the seed at once and a summary.
+  // Rounds of operations, at whose end all members leave, until the time is up; prints the seed at once and a summary.
   void run() {
     fmt::print("seed {}\n", _seed);
     std::fflush(stdout);
@@ -228,7 +228,7 @@ class RandomGroups {
     SessionInfo info{.sessionID = member.id, .clientType = 5};
     info.requireUserInfo = operation.count % 2 == 1;
     info.batchEvent = operation.batches;
-    // Some belong to nobody.
+    // Some belong to no member.
     if (operation.count != 8)
       info.hierarchyToken = HierarchyToken{fmt::format("group{}", operation.group), operation.level};
     auto& session = member.connection->session();
@@ -323,7 +323,7 @@ class RandomGroups {
   // Constant after construction.
   const Daemon _daemon;
   const std::uint64_t _seed;
-  const std::uint64_t _operationLimit;  // 0: none
+  const std::uint64_t _operationLimit;  // 0 for no limit
   const std::chrono::steady_clock::time_point _end;
   const std::shared_ptr<CallbackThread> _callbackThread;
 

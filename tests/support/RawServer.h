@@ -27,7 +27,7 @@ class RawConnection {
  public:
   RawConnection(int fd, std::function<void(std::string)> remember) : _fd(fd), _remember(std::move(remember)) {}
 
-  // The next whole request, headers and the body of their Content-Length, as it came; none when the client closed
+  // The next whole request, headers and the body of their Content-Length, as it came; nullopt when the client closed
   // before. The server remembers it.
   std::optional<std::string> readRequest() {
     std::size_t end = 0;
@@ -57,7 +57,7 @@ class RawConnection {
     const linger abrupt{1, 0};
     ::setsockopt(_fd, SOL_SOCKET, SO_LINGER, &abrupt, sizeof abrupt);
   }
-  // Until the client closes, or the server stops. What comes meanwhile is thrown away.
+  // Until the client closes, or the server stops. Bytes that come meanwhile are thrown away.
   void waitForClose() {
     while (readMore()) _pending.clear();
   }

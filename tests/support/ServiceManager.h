@@ -14,7 +14,7 @@
 
 namespace orvanta::test {
 
-// What a service manager would hear. Used by one thread.
+// Hears what a service manager would. Used by one thread.
 class ServiceManager {
  public:
   ServiceManager() : _socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0)) {
@@ -28,7 +28,7 @@ class ServiceManager {
   std::string path() const { return _directory / "notify"; }
   // Makes this process tell it.
   void setEnvironment() const { ::setenv("NOTIFY_SOCKET", path().c_str(), 1); }
-  // What has come since the last question.
+  // The messages since the last call.
   std::vector<std::string> heard() const {
     std::vector<std::string> messages;
     std::array<char, 1024> buffer{};

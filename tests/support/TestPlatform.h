@@ -44,7 +44,7 @@ struct TestDevice final : platform::DeviceProperties {
 // run on the calling thread. Thread-safe.
 class ScriptedHttpClient : public platform::HttpClient {
  public:
-  // The answer to requests that nobody holds; default 200 with an empty body. May be called on several threads at once.
+  // The answer to requests that are not held; default 200 with an empty body. May be called on several threads at once.
   std::function<platform::HttpResult(const platform::HttpRequest&)> answer;
   // While true, started requests wait in `held` for finishHeld().
   bool hold = false;

@@ -30,7 +30,7 @@ class UdpServer {
 
   std::uint16_t port() const { return _port; }
 
-  // The next datagram, whose sender send() answers from then on; none when nothing comes in time.
+  // The next datagram, whose sender send() answers from then on; nullopt when nothing comes in time.
   std::optional<std::vector<std::uint8_t>> receive(int timeoutMilliseconds = 30'000) {
     pollfd waiting{_fd.get(), POLLIN, 0};
     if (::poll(&waiting, 1, timeoutMilliseconds) != 1) return std::nullopt;

@@ -94,7 +94,7 @@ TEST(MessagePack, BoundsDepthAndMemory) {
   for (const Value& large : {Value(Array(300)), Value(Array(20, Array(20))), Value(std::string(10'000, 'x'))}) {
     EXPECT_FALSE(decodeMessagePack(encode(large), small).ok());
   }
-  // Claims that would take terabytes cost nothing while their bytes are missing, whatever the limit.
+  // Claims that would take terabytes cost nothing while their bytes are missing, under any limit.
   const MessagePackLimits unlimited{64, std::numeric_limits<std::size_t>::max() / 2};
   for (const char* hex :
        {"dd ff ff ff ff", "df ff ff ff ff", "91 dd 7f ff ff ff 00", "dd 00 00 00 02 dd ff ff ff ff 00"}) {

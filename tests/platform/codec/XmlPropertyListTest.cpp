@@ -64,7 +64,7 @@ TEST(XmlPropertyList, RefusesWithThePlace) {
       {"second root element at byte 23", {plist("<true/>") + "<plist/>"}},
       {"at byte",
        {"<plist><true/>", "<plist><array></dict></plist>", "<plist><array", plist("<string>") + std::string(1, '\0')}},
-      // So none is expanded, once or thousandfold.
+      // So no entity is expanded, once or a thousandfold.
       {"not predefined",
        {"<!DOCTYPE plist [<!ENTITY e \"x\">]>" + plist("<string>&e;</string>"),
         "<!DOCTYPE plist [<!ENTITY a \"x\"><!ENTITY e \"&a;&a;\">]>" + plist("<string>&e;</string>"),

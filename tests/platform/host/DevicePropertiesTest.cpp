@@ -28,7 +28,7 @@ std::string plist(const std::string& entries) {
   return "<plist><dict>" + entries + "</dict></plist>";
 }
 
-// What is read from each of these; nothing from the last ones.
+// The text read from each of these; nothing from the last ones.
 using Texts = std::vector<std::pair<std::string, Text>>;
 
 TEST(SystemFacts, OsRelease) {
@@ -51,11 +51,12 @@ TEST(SystemFacts, DerivedIdentifiers) {
   const Text first = deriveDeviceIdentifier(kMachineId, "app.one");
   ASSERT_TRUE(first);
   EXPECT_THAT(*first, testing::MatchesRegex("[0-9a-f]{40}"));
-  EXPECT_EQ(first, deriveDeviceIdentifier("0123456789abcdef0123456789abcdef", "app.one")) << "the line end is no part";
+  EXPECT_EQ(first, deriveDeviceIdentifier("0123456789abcdef0123456789abcdef", "app.one"))
+      << "the line end does not count";
   EXPECT_NE(first, deriveDeviceIdentifier(kMachineId, "app.two"));
   EXPECT_EQ(first->find("0123456789abcdef"), std::string::npos);
-  for (const char* none : {"", "\n", "uninitialized\n", "00000000000000000000000000000000\n", "0123", "zz"}) {
-    EXPECT_EQ(deriveDeviceIdentifier(none, "app.one"), std::nullopt) << none;
+  for (const char* unusable : {"", "\n", "uninitialized\n", "00000000000000000000000000000000\n", "0123", "zz"}) {
+    EXPECT_EQ(deriveDeviceIdentifier(unusable, "app.one"), std::nullopt) << unusable;
   }
 }
 
@@ -78,7 +79,7 @@ TEST_F(DevicePropertiesTest, FactsAreConfiguredOrStandInTheSystemsFilesOrAreUnkn
       {&LinuxDeviceProperties::productVersion, "ProductVersion", "11", "12"},
       {&LinuxDeviceProperties::buildVersion, "BuildVersion", "7", "b9"},
       {&LinuxDeviceProperties::hardwareModel, "HardwareModel", "Maker Board Rev 2", "Machine 9"},
-      {&LinuxDeviceProperties::serialNumber, "SerialNumber", "SN77", "SN77"},  // a filler is no answer
+      {&LinuxDeviceProperties::serialNumber, "SerialNumber", "SN77", "SN77"},  // a filler is not an answer
       {&LinuxDeviceProperties::productType, "ProductType", "maker,board", "Machine 9"},
       {&LinuxDeviceProperties::deviceName, "DeviceName", {}, "Machines"},
       {&LinuxDeviceProperties::releaseType, "ReleaseType", {}, {}},

@@ -113,7 +113,7 @@ TEST_F(RsaTest, RefusesForgedPaddingAndForeignDigests) {
   Bytes zeroPadding(size, 0);
   zeroPadding[1] = 1;
   std::copy(good.begin(), good.end(), zeroPadding.end() - static_cast<std::ptrdiff_t>(good.size()));
-  // What a verifier that stops reading behind the digest takes: few padding bytes, the digest, then free space.
+  // A verifier that stops reading behind the digest accepts this: few padding bytes, the digest, then free space.
   Bytes garbageBehind = joined({fromHex("0001ffffffffffffffff00"), good});
   garbageBehind.resize(size, 0x5a);
   const struct {
@@ -174,7 +174,7 @@ TEST_F(RsaTest, RefusesWhatIsNoUsableKey) {
       {"cut off", Bytes(good.begin(), good.end() - 1)},
       {"bytes behind it", joined({good, Bytes{0}})},
       {"an elliptic-curve key", ellipticDer},
-      {"an exponent that lets anybody sign", keyWithExponentOne()},
+      {"an exponent that lets anyone sign", keyWithExponentOne()},
   };
   for (const auto& row : rows) EXPECT_EQ(RsaPublicKey::fromDer(row.der), nullptr) << row.what;
 }

@@ -60,7 +60,7 @@ TEST_F(JsonLinesPowerLogTest, keepsTwoGenerations) {
   EXPECT_EQ(eventsAfter(1, 2), " 12 ");
   EXPECT_EQ(eventsAfter(3, 5), "34 5 ");
   EXPECT_EQ(eventsAfter(6, 7), "56 7 ");
-  // Somebody takes the file away while it is written: the next record makes a new one.
+  // The file is taken away while it is written: the next record makes a new one.
   JsonLinesPowerLog log(path, clock, 1000);
   log.registeredEvent(8, "s", {});
   std::filesystem::rename(path, directory / "moved");

@@ -142,7 +142,7 @@ TEST_F(HttpAnswerTest, TimeoutsEndWhatTakesTooLong) {
     request.discardResponseBody = true;
     expectError(perform(std::move(request)), "Timed out after 200 ms, waiting for the answer");
   }
-  for (const int none : {-1, 0}) expectError(perform(within(milliseconds(none), get(silent.url()))), "Timed out");
+  for (const int timeout : {-1, 0}) expectError(perform(within(milliseconds(timeout), get(silent.url()))), "Timed out");
 }
 
 }  // namespace

@@ -59,7 +59,7 @@ TEST_F(HttpLaneTest, ALaneKeepsItsOrderToTheLastCompletion) {
       ended.add();
     });
   }
-  lanes.clear();  // nobody holds them any more
+  lanes.clear();  // the client alone holds them now
   ended.waitFor(kLanes * kRequests);
   for (const std::string& path : paths(server)) arrived[path[1]].push_back(path);
   EXPECT_EQ(arrived, expected);

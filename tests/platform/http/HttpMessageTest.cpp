@@ -7,7 +7,7 @@ namespace {
 
 class HttpMessageTest : public HttpFixture {
  protected:
-  // What went over the wire for `request`, and the log lines about it.
+  // The bytes on the wire for `request`, and the log lines about it.
   std::string sent(HttpRequest request) {
     const std::size_t before = _server.requests().size();
     const HttpResult result = perform(std::move(request));
@@ -57,7 +57,7 @@ TEST_F(HttpMessageTest, HeadersThatWouldBreakTheMessageAreLeftOutWithAWarning) {
   }
 }
 
-TEST_F(HttpMessageTest, ContentLengthIsTrueWhateverTheCallerSays) {
+TEST_F(HttpMessageTest, ContentLengthIsTrueEvenIfTheCallerSaysOtherwise) {
   const struct {
     Headers headers;
     std::string expected;

@@ -57,7 +57,7 @@ TEST_F(HttpShutdownTest, TheRestFailsAndCompletes) {
   EXPECT_EQ(perform(get(server.url())).error, "The HTTP client has been shut down");
 }
 
-TEST_F(HttpShutdownTest, AHangingResolverHoldsNobody) {
+TEST_F(HttpShutdownTest, AHangingResolverHoldsUpNoCaller) {
   const std::string url = std::string("http://") + kHangingName + "/";
   const int before = gEnded.value();
   ++gRound;
@@ -94,10 +94,10 @@ TEST_F(HttpShutdownTest, AbortingEndsBlockedCallersOnly) {
   expectError(perform(get(slow.url())), "Aborted");
   EXPECT_EQ(silent.requests().size(), 1U);
   gate.add();
-  EXPECT_EQ(statusOf(await(other)), 200) << "nobody waits for this one";
+  EXPECT_EQ(statusOf(await(other)), 200) << "no thread waits for this one";
 }
 
-// Every request ends once, whoever hands in, aborts and shuts down at the same time.
+// Every request ends once, though others are submitted, aborted and shut down at the same time.
 TEST_F(HttpShutdownTest, EveryRequestEndsExactlyOnce) {
   RawServer server(answering("200 OK"));
   for (int round = 0; round < 10; ++round) {

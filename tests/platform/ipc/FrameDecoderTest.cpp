@@ -160,7 +160,7 @@ TEST(FrameDecoder, ChargesValuesAtTheirSizeInMemory) {
   const auto within = [&](std::size_t charge) { return decodeBothWays(bytes, {64U << 20U, charge, 64}).front(); };
   EXPECT_EQ(within(1000 * sizeof(Value) + 1000).find("error"), std::string::npos);
   EXPECT_NE(within(1000 * sizeof(Value) - 1).find("in memory"), std::string::npos);
-  // What the default limits are there for: a frame of nils as large as a frame may be.
+  // The default limits are for this: a frame of nils as large as a frame may be.
   bytes.clear();
   appendNotificationHeader(bytes, "f", (64U << 20U) - 20);
   EXPECT_NE(decode(bytes, bytes.size(), {}).front().find("in memory"), std::string::npos);

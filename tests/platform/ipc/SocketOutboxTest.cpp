@@ -123,7 +123,7 @@ TEST_F(OutboxTest, DescriptorsTravelWithTheirMessages) {
   ASSERT_TRUE(senderDelegate->waitForInvalidation());
 }
 
-TEST_F(OutboxTest, ADescriptorWaitsForItsFrameToCompleteAndIsClosedIfNobodyTakesIt) {
+TEST_F(OutboxTest, ADescriptorWaitsForItsFrameToCompleteAndIsClosedIfItIsNotTaken) {
   int ends[2] = {-1, -1};
   ASSERT_EQ(::pipe(ends), 0);
   const UniqueFd reading(ends[0]);
@@ -144,7 +144,7 @@ TEST_F(OutboxTest, ADescriptorWaitsForItsFrameToCompleteAndIsClosedIfNobodyTakes
   ASSERT_TRUE(made.delegate->waitForInvalidation());
   EXPECT_EQ(taken, (std::vector<bool>{false, true}));
   char byte = 0;
-  EXPECT_EQ(::read(reading.get(), &byte, 1), 0);  // nobody holds the other end any more
+  EXPECT_EQ(::read(reading.get(), &byte, 1), 0);  // the other end is closed everywhere
 }
 
 TEST_F(OutboxTest, TooManyWaitingDescriptorsEndTheConnection) {

@@ -15,7 +15,7 @@ using platform::PeerIdentity;
 
 const std::string kGranted = "com.example.may";
 
-PeerIdentity somebody() {
+PeerIdentity samplePeer() {
   PeerIdentity peer;
   peer.pid = 1234;
   peer.uid = 4711;
@@ -45,19 +45,19 @@ const std::string kUser = number("user", "4711");
 TEST(EntitlementsTest, ReadsOneFile) {
   const struct {
     bool granted;
-    const char* logged;  // part of the one line; null: none
+    const char* logged;  // part of the one line; null when nothing is logged
     std::vector<std::string> contents;
   } rows[] = {
       {true,
        nullptr,
        {grant(kUser), grant(text("user", "4711")), grant(number("group", "4712")), grant(text("group", "4713")),
         grant(text("group", "daemon")), grant(text("label", "trusted_t")), grant(kUser, "<string>YES</string>")}},
-      // What matches nobody here, or says no.
+      // Grants to other peers, or with a value of no.
       {false,
        nullptr,
        {grant(number("user", "4712")), grant(number("group", "4711")), grant(text("user", "root")),
         grant(text("label", "trusted")), grant(kUser, "<false/>"), grant(kUser, "<array><true/></array>")}},
-      // What makes no sense.
+      // Invalid grants.
       {false, "<4>", {"user: 4711"}},
       {false, "no dictionary", {"<plist><array/></plist>"}},
       {false, "exactly one of", {grant(""), grant(kUser + number("group", "4712"))}},
@@ -82,8 +82,8 @@ TEST(EntitlementsTest, ReadsOneFile) {
       directory.write("grant.plist", content);
       LogCapture log;
       Entitlements entitlements(directory.path());
-      EXPECT_EQ(entitlements.holds(somebody(), kGranted), row.granted);
-      EXPECT_FALSE(entitlements.holds(somebody(), "com.example.mayNot"));
+      EXPECT_EQ(entitlements.holds(samplePeer(), kGranted), row.granted);
+      EXPECT_FALSE(entitlements.holds(samplePeer(), "com.example.mayNot"));
       EXPECT_EQ(log.lines().size(), row.logged == nullptr ? 0U : 1U) << "once, however often it is read";
       if (row.logged == nullptr) continue;
       EXPECT_EQ(log.count("<4>"), 1U);
@@ -96,19 +96,19 @@ TEST(EntitlementsTest, ReadsOneFile) {
 TEST(EntitlementsTest, AnyMatchingGrantThatReadsAsTrueCounts) {
   const TemporaryDirectory directory;
   Entitlements entitlements(directory.path());
-  EXPECT_FALSE(entitlements.holds(somebody(), kGranted)) << "nothing is granted by default";
+  EXPECT_FALSE(entitlements.holds(samplePeer(), kGranted)) << "nothing is granted by default";
   directory.write("10-no.plist", grant(number("user", "4711"), "<false/>"));
   directory.write("20-broken.plist", "<plist>");
   directory.write("30-note.txt", grant(number("user", "4711")));
   directory.write(".40-half-written.plist", grant(number("user", "4711")));
-  EXPECT_FALSE(entitlements.holds(somebody(), kGranted));
+  EXPECT_FALSE(entitlements.holds(samplePeer(), kGranted));
   EXPECT_FALSE(entitlements.isHeldByAnybody(kGranted));
   directory.write("45-another.plist", grant(number("user", "4712")));
   EXPECT_TRUE(entitlements.isHeldByAnybody(kGranted));
   EXPECT_FALSE(entitlements.isHeldByAnybody("com.example.mayNot"));
-  EXPECT_FALSE(entitlements.holds(somebody(), kGranted));
+  EXPECT_FALSE(entitlements.holds(samplePeer(), kGranted));
   directory.write("50-yes.plist", grant(number("group", "4712")));
-  EXPECT_TRUE(entitlements.holds(somebody(), kGranted)) << "read anew each time";
+  EXPECT_TRUE(entitlements.holds(samplePeer(), kGranted)) << "read anew each time";
 }
 
 // Without a security module every label is empty: that must not match anything.
@@ -116,7 +116,7 @@ TEST(EntitlementsTest, APeerWithoutALabelMatchesNoLabel) {
   const TemporaryDirectory directory;
   directory.write("empty.plist", grant(text("label", "")));
   directory.write("other.plist", grant(text("label", "trusted_t")));
-  PeerIdentity peer = somebody();
+  PeerIdentity peer = samplePeer();
   peer.label.clear();
   EXPECT_FALSE(Entitlements(directory.path()).holds(peer, kGranted));
 }

@@ -32,7 +32,7 @@ const std::string kService = "test.service";
 
 class ListenerTest : public ConnectionFixture {
  protected:
-  // Admits everybody.
+  // Admits every connection.
   Listener::Handler admitting() {
     return [this](OfferedConnection&& offered) {
       offered.connection->resume(std::make_shared<RecordingDelegate>());
@@ -92,10 +92,10 @@ TEST_F(ListenerTest, OffersAConnectionWithItsPeer) {
   listener->stop();
   const UniqueFd unconnected(::socket(AF_UNIX, SOCK_STREAM, 0));
   const UniqueFd internet(::socket(AF_INET, SOCK_STREAM, 0));
-  for (const int nobody : {unconnected.get(), internet.get(), -1}) EXPECT_FALSE(peerIdentityOf(nobody).ok());
+  for (const int peerless : {unconnected.get(), internet.get(), -1}) EXPECT_FALSE(peerIdentityOf(peerless).ok());
 }
 
-TEST_F(ListenerTest, EverybodyMayConnectWhateverTheMaskButNobodyIsAcceptedBeforeResume) {
+TEST_F(ListenerTest, EveryUserMayConnectUnderAnyMaskButNoneIsAcceptedBeforeResume) {
   const mode_t before = ::umask(0077);
   auto listener = create(admitting());
   ::umask(before);
@@ -290,7 +290,7 @@ TEST_F(ListenerTest, TakesTheSocketOfTheServiceManager) {
   if (child == 0) {
     ::setenv("LISTEN_FDS", "1", 1);
     ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
-    ::dup2(::dup(listening.get()), 3);  // not closed when the program starts, whatever number it had
+    ::dup2(::dup(listening.get()), 3);  // the duplicate is not closed when the program starts
     ::execl("/proc/self/exe", "test", "--gtest_filter=ListenerTest.TakesTheSocketOfTheServiceManager", nullptr);
     ::_exit(127);
   }

@@ -74,7 +74,7 @@ TEST(WorkPoolTest, DrainWaitsForTheJobsOfEveryQueueToEnd) {
   }
 }
 
-// What jobs own may post when it goes, and holds queues of both kinds.
+// Objects that jobs own may post when they are destroyed, and hold queues of both kinds.
 TEST(ComputeQueueTest, DropsWhatHasNotBegunWhenThePoolStops) {
   std::atomic<int> dropped = 0;
   std::shared_ptr<ComputeQueue> survivor;
@@ -141,7 +141,7 @@ TEST(BlockingScopeTest, AStandInStepsAsideAtOnceAndIsCalledBack) {
     ASSERT_TRUE(done.waitFor(1));
     EXPECT_TRUE(turn == 0 || helper == standIn) << "another thread was started";
     standIn = helper;
-    // Whichever of the two waits for the next job: after one each, one thread serves the loop.
+    // Either of the two may wait for the next job: after one each, one thread serves the loop.
     ASSERT_TRUE(eventually([&] {
       other->post([] {});
       return pool.threadCount() == 1;

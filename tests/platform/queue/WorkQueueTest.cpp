@@ -244,7 +244,7 @@ TEST_F(WatchTest, FiresOnceForEachWait) {
   EXPECT_EQ(::write(_theirs.get(), "c", 1), 1);
   onQueue([] {});
   EXPECT_EQ(readable.value(), 1);
-  // What is still unread counts at once.
+  // Bytes that are still unread count at once.
   onQueue([&] { _watch->whenReadable([&] { readable.add(); }); });
   EXPECT_TRUE(readable.waitFor(2));
 }

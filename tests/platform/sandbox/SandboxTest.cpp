@@ -300,7 +300,7 @@ TEST_F(ShippedSandboxTest, aRefusedCallIsLoggedOnceByItsName) {
 }
 
 // As in some containers: the kernel takes one watcher only, and calls are then refused without a line.
-TEST_F(ShippedSandboxTest, whereSomebodyElseWatchesAlreadyCallsAreRefusedAllTheSame) {
+TEST_F(ShippedSandboxTest, callsAreRefusedAllTheSameWhereAnotherProcessWatchesAlready) {
   const std::string result = inChild([&] {
     sock_filter allow = BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW);
     const sock_fprog program{1, &allow};
