@@ -13,7 +13,8 @@
 
 namespace orvanta::platform {
 
-// Reads MessagePack out of one byte range, value by value, within limits. Lives on the stack of the function that has the bytes.
+// Reads MessagePack out of one byte range, value by value, within limits. Lives on the stack of the function that has
+// the bytes.
 //
 // Every operation returns whether it succeeded; after a false the reader is of no more use. Then either the bytes end
 // too early (`failure()` is empty) or they break a rule or limit. A well-formed value that is not accepted (an unknown

@@ -32,8 +32,8 @@ class DeviceProperties {
 
 // `configurationDirectory`/device.plist first, read again when it changes; then os-release, DMI or the device tree,
 // machine-id and the environment's locale as it was at construction. `application` goes into the unique identifier,
-// which is derived from machine-id and never equals it. A device.plist that cannot be read or parsed is logged and counts
-// as empty, and so does each key of the wrong type. Thread-safe.
+// which is derived from machine-id and never equals it. A device.plist that cannot be read or parsed is logged and
+// counts as empty, and so does each key of the wrong type. Thread-safe.
 class LinuxDeviceProperties final : public DeviceProperties {
  public:
   // `systemRoot` stands before the paths of the system's own files, for tests.

@@ -23,8 +23,8 @@ struct Frame {
   Value error;                  // responses; null when there is no error
   Value result;                 // responses
   // Not null: the frame was whole and well formed, but its arguments hold something that refuses the call (a duplicate
-  // key, an unknown extension, a key or text that is not UTF-8, params that are not an array). The call is answered with
-  // this text and not carried out.
+  // key, an unknown extension, a key or text that is not UTF-8, params that are not an array). The call is answered
+  // with this text and not carried out.
   std::optional<std::string> refusal;
   std::size_t wireSize = 0;  // bytes the frame took on the wire
   std::size_t charge = 0;    // what its values take in memory, about

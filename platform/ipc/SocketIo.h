@@ -39,8 +39,8 @@ struct Sent {
 // With a descriptor (not -1), it goes out if any byte does.
 Sent sendBytes(int socket, std::span<const std::uint8_t> bytes, int descriptor = -1);
 
-// Returns whether nothing can pass in either direction any more: so after a peer's close(), but not after its shutdown()
-// of sending.
+// Returns whether nothing can pass in either direction any more: so after a peer's close(), but not after its
+// shutdown() of sending.
 bool hasHungUp(int socket);
 
 }  // namespace orvanta::platform

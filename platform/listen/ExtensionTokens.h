@@ -25,7 +25,8 @@ class ExtensionHandle {
   // The size of the file in bytes; nullopt without access, or when the descriptor does not lead to a regular file.
   std::optional<std::uint64_t> regularFileSize() const;
   // The file's first bytes, up to `size` of them; fewer when the file has shrunk, nullopt when it cannot be read or
-  // memory is short. The client's own position in the file neither matters nor changes. May block on a slow file system.
+  // memory is short. The client's own position in the file neither matters nor changes. May block on a slow file
+  // system.
   std::optional<std::string> read(std::size_t size) const;
 
   void release() { _descriptor = -1; }
