@@ -85,13 +85,4 @@ class Connection : public std::enable_shared_from_this<Connection> {
   static constexpr int kFramesPerTurn = 256;
 };
 
-// Encoders of whole messages, appended to `out`.
-void appendRequestHeader(std::vector<std::uint8_t>& out, std::uint32_t messageID, std::string_view method,
-                         std::size_t paramCount);
-void appendNotificationHeader(std::vector<std::uint8_t>& out, std::string_view method, std::size_t paramCount);
-// The caller appends the error value, then the result value.
-void appendResponseHeader(std::vector<std::uint8_t>& out, std::uint32_t messageID);
-// A whole response that carries the transport's own error text.
-void appendErrorResponse(std::vector<std::uint8_t>& out, std::uint32_t messageID, std::string_view text);
-
 }  // namespace orvanta::platform

@@ -5,6 +5,7 @@
 #include <optional>
 #include <span>
 #include <string>
+#include <string_view>
 #include <variant>
 #include <vector>
 
@@ -87,5 +88,14 @@ class FrameDecoder {
   Scan _scan;
   std::optional<std::string> _failed;
 };
+
+// Encoders of whole messages, appended to `out`.
+void appendRequestHeader(std::vector<std::uint8_t>& out, std::uint32_t messageID, std::string_view method,
+                         std::size_t paramCount);
+void appendNotificationHeader(std::vector<std::uint8_t>& out, std::string_view method, std::size_t paramCount);
+// The caller appends the error value, then the result value.
+void appendResponseHeader(std::vector<std::uint8_t>& out, std::uint32_t messageID);
+// A whole response that carries the transport's own error text.
+void appendErrorResponse(std::vector<std::uint8_t>& out, std::uint32_t messageID, std::string_view text);
 
 }  // namespace orvanta::platform

@@ -1,4 +1,4 @@
-#include "platform/sandbox/CallFilter.h"
+#include "platform/sandbox/RefusedCalls.h"
 
 #include <fmt/format.h>
 #include <seccomp.h>

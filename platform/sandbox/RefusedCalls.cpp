@@ -22,7 +22,6 @@
 #include "platform/core/Log.h"
 #include "platform/core/SignalMask.h"
 #include "platform/core/Text.h"
-#include "platform/sandbox/CallFilter.h"
 
 namespace orvanta::platform {
 

@@ -14,7 +14,6 @@
 
 #include "platform/codec/PropertyList.h"
 #include "platform/core/Text.h"
-#include "platform/sandbox/CallFilter.h"
 #include "platform/sandbox/Landlock.h"
 
 namespace orvanta::platform {
