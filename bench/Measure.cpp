@@ -41,10 +41,10 @@ void printFigure(const std::string& name, const Figure& figure) {
   fmt::print("  {:<58} {:>12.0f} /s {:>10.3f} us CPU each\n", name, figure.perSecond, figure.cpuPerEvent);
 }
 
-void printRatio(const std::string& name, double value, double rawLimit, double goal, const char* unit) {
+void printRatio(const std::string& name, double value, double rawLimit, double goal) {
   const double ratio = rawLimit > 0 ? value / rawLimit : 0;
-  fmt::print("  {:<58} {:>9.3f} {} / {:.3f} {} = {:.2f} x (goal {:.2f} x){}\n", name, value, unit, rawLimit, unit,
-             ratio, goal, ratio <= goal ? "" : "  OVER");
+  fmt::print("  {:<58} {:>9.3f} us / {:.3f} us = {:.2f} x (goal {:.2f} x){}\n", name, value, rawLimit, ratio, goal,
+             ratio <= goal ? "" : "  OVER");
 }
 
 }  // namespace orvanta::bench

@@ -40,7 +40,7 @@ double percentile(std::vector<double> values, double share);
 // One line of the table: the figure, the raw limit measured in the same run, their ratio and the goal.
 void printHeading(const std::string& title);
 void printFigure(const std::string& name, const Figure& figure);
-void printRatio(const std::string& name, double value, double rawLimit, double goal, const char* unit = "us");
+void printRatio(const std::string& name, double value, double rawLimit, double goal);
 
 // Runs `once` until at least `seconds` have passed; how often it ran is in the result's events.
 template <class Once>

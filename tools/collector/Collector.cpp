@@ -39,10 +39,8 @@ class WholeCollector final : public Collector {
   }
   void clearBehaviours() override { _behaviours.clearAll(); }
   void setAcknowledgements(const AcknowledgementSettings& settings) override { _dashboard->setSettings(settings); }
-  void setStorebagSettings(const StorebagSettings& settings) override { _storebags->setSettings(settings); }
   using Collector::setBag;
   void setBag(const std::string& name, Value inner) override { _storebags->setBag(name, std::move(inner)); }
-  std::string storebagDocument(const std::string& name) override { return _storebags->answer(name, nullptr).body; }
   Inbox& inbox() override { return *_inbox; }
 
  private:

@@ -50,15 +50,12 @@ class Collector {
   void setFault(const std::string& path, ConnectionFault fault);
   virtual void clearBehaviours() = 0;
   virtual void setAcknowledgements(const AcknowledgementSettings& settings) = 0;
-  virtual void setStorebagSettings(const StorebagSettings& settings) = 0;
   // Serves this inner bag from now on: for one storebag name, or for all without one of their own. Texts may hold the
   // placeholders "${http}", "${https}" and "${dashboard_port}".
   virtual void setBag(const std::string& name, Value inner) = 0;
   void setBag(Value inner) { setBag("", std::move(inner)); }
   // A bag whose section of every environment is this one.
   void setSection(Dictionary section);
-  // The signed document as it would be served.
-  virtual std::string storebagDocument(const std::string& name) = 0;
 
   // --- What it has received ---
 

@@ -58,7 +58,6 @@ class StorebagServer {
   std::string publicKeyFile() const { return _directory + "/publicKey.der"; }
   // The same key as a PKCS#1 structure.
   std::string publicKeyPkcs1File() const { return _directory + "/publicKey.pkcs1.der"; }
-  const std::shared_ptr<const SigningKey>& key() const { return _key; }
 
  private:
   struct Source;

@@ -46,8 +46,6 @@ class Database {
   Statement prepare(std::string_view sql);
   void run(const char* sql);
   std::int64_t lastInsertId() const { return sqlite3_last_insert_rowid(_handle.get()); }
-  // What went wrong last.
-  std::string lastError() const { return sqlite3_errmsg(_handle.get()); }
 
  private:
   explicit Database(sqlite3* handle) : _handle(handle, &sqlite3_close) {}

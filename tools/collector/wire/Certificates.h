@@ -23,7 +23,6 @@ class CertificateAuthority {
 
   // What clients have to trust.
   const std::string& certificateFile() const { return _certificateFile; }
-  const std::string& certificatePem() const { return _identity.certificatePem; }
   // A fresh certificate for localhost, 127.0.0.1 and ::1.
   Result<ServerIdentity> issueServerIdentity(CertificateFlaw flaw) const;
 
