@@ -21,8 +21,8 @@ class WholeCollector final : public Collector {
   explicit WholeCollector(CollectorOptions options) : _options(std::move(options)) {}
   ~WholeCollector() override { WholeCollector::stop(); }
 
-  // None, or what could not be made.
-  std::optional<Failure> open();
+  // A failure says what could not be made.
+  Result<void> open();
   void stop() override;
 
   const std::string& directory() const override { return _options.directory; }
@@ -44,7 +44,7 @@ class WholeCollector final : public Collector {
   Inbox& inbox() override { return *_inbox; }
 
  private:
-  std::optional<Failure> openServers();
+  Result<void> openServers();
 
   const CollectorOptions _options;
   Behaviours _behaviours;
@@ -59,7 +59,7 @@ class WholeCollector final : public Collector {
   std::unique_ptr<Relay> _https;
 };
 
-std::optional<Failure> WholeCollector::open() {
+Result<void> WholeCollector::open() {
   if (_options.directory.empty()) return Failure{"the collector needs a directory"};
   std::error_code error;
   std::filesystem::create_directories(_options.directory, error);
@@ -74,7 +74,7 @@ std::optional<Failure> WholeCollector::open() {
   return openServers();
 }
 
-std::optional<Failure> WholeCollector::openServers() {
+Result<void> WholeCollector::openServers() {
   auto authority = CertificateAuthority::readOrMake(_options.directory);
   if (!authority) return Failure{authority.error()};
   const auto identity = authority->issueServerIdentity(_options.certificateFlaw);
@@ -102,7 +102,7 @@ std::optional<Failure> WholeCollector::openServers() {
   _storebags->setPlaceholders({httpURL(), httpsURL(), _dashboard->port()});
   _http->begin();
   _https->begin();
-  return std::nullopt;
+  return {};
 }
 
 void WholeCollector::stop() {
@@ -118,7 +118,7 @@ void WholeCollector::stop() {
 
 Result<std::unique_ptr<Collector>> Collector::start(CollectorOptions options) {
   auto collector = std::make_unique<WholeCollector>(std::move(options));
-  if (auto failure = collector->open()) return std::move(*failure);
+  if (const auto opened = collector->open(); !opened) return Failure{opened.error()};
   return std::unique_ptr<Collector>(std::move(collector));
 }
 

@@ -6,11 +6,11 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
-#include <cstring>
 #include <optional>
 #include <string>
 
 #include "platform/codec/Json.h"
+#include "platform/core/Text.h"
 #include "platform/host/Process.h"
 #include "tools/collector/Collector.h"
 
@@ -32,13 +32,18 @@ void tell(const std::string& line) {
   std::fputs((line + "\n").c_str(), stderr);
 }
 
+// The exit status.
+int fail(const std::string& text) {
+  tell("orvanta-collector: " + text);
+  return 1;
+}
+
 void printRequest(const collector::ReceivedRequest& request) {
   tell(fmt::format("{:.3f} {} {} {} {} {} bytes{}", request.time, request.client, request.method, request.target,
                    request.status, request.rawBody.size(), request.note.empty() ? "" : " (" + request.note + ")"));
 }
 
-// Whether standard output took it.
-bool printReady(const collector::Collector& running) {
+Result<void> printReady(const collector::Collector& running) {
   const Dictionary ready{{"pid", static_cast<std::int64_t>(::getpid())},
                          {"directory", running.directory()},
                          {"http", running.httpURL()},
@@ -53,7 +58,10 @@ bool printReady(const collector::Collector& running) {
                          {"caFile", running.caFile()},
                          {"publicKeyFile", running.publicKeyFile()},
                          {"databaseFile", running.databaseFile()}};
-  return std::fputs((platform::writeJson(ready) + "\n").c_str(), stdout) >= 0 && std::fflush(stdout) == 0;
+  if (std::fputs((platform::writeJson(ready) + "\n").c_str(), stdout) < 0 || std::fflush(stdout) != 0) {
+    return Failure{"cannot write to standard output: " + platform::errnoText(errno)};
+  }
+  return {};
 }
 
 }  // namespace
@@ -98,14 +106,8 @@ int main(int argc, char** argv) {
   ::pthread_sigmask(SIG_BLOCK, &signals, nullptr);
 
   const auto running = collector::Collector::start(std::move(options));
-  if (!running) {
-    tell("orvanta-collector: " + running.error());
-    return 1;
-  }
-  if (!printReady(**running)) {
-    tell(fmt::format("orvanta-collector: cannot write to standard output: {}", std::strerror(errno)));
-    return 1;
-  }
+  if (!running) return fail(running.error());
+  if (const auto printed = printReady(**running); !printed) return fail(printed.error());
   int signal = 0;
   ::sigwait(&signals, &signal);
   (*running)->stop();

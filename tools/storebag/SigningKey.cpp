@@ -44,7 +44,7 @@ class OpenSslSigningKey final : public SigningKey {
  public:
   explicit OpenSslSigningKey(KeyPointer key) : _key(std::move(key)) {}
 
-  std::optional<Failure> write(const std::string& path) const override {
+  Result<void> write(const std::string& path) const override {
     const int fd = ::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
     const FilePointer file(fd < 0 ? nullptr : ::fdopen(fd, "w"), &std::fclose);
     if (!file) return Failure{fmt::format("cannot write {}: {}", path, std::strerror(errno))};
@@ -52,7 +52,7 @@ class OpenSslSigningKey final : public SigningKey {
         std::fflush(file.get()) != 0) {
       return Failure{fmt::format("cannot write {}: {}", path, lastOpenSslError())};
     }
-    return std::nullopt;
+    return {};
   }
 
   std::vector<std::uint8_t> publicKeyDer(PublicKeyLayout layout) const override {
@@ -113,7 +113,7 @@ Result<std::shared_ptr<const SigningKey>> SigningKey::readOrMake(const std::stri
   if (::stat(path.c_str(), &status) == 0 || errno != ENOENT) return read(path);
   auto made = generate();
   if (!made) return made;
-  if (auto failure = made.value()->write(path)) return std::move(*failure);
+  if (const auto written = made.value()->write(path); !written) return Failure{written.error()};
   return made;
 }
 

@@ -2,7 +2,6 @@
 
 #include <cstdint>
 #include <memory>
-#include <optional>
 #include <span>
 #include <string>
 #include <vector>
@@ -24,8 +23,8 @@ class SigningKey {
   static Result<std::shared_ptr<const SigningKey>> readOrMake(const std::string& path);
 
   virtual ~SigningKey() = default;
-  // None, or why the file cannot be written.
-  virtual std::optional<Failure> write(const std::string& path) const = 0;
+  // A PEM file of mode 0600. The failure names the file.
+  virtual Result<void> write(const std::string& path) const = 0;
   virtual std::vector<std::uint8_t> publicKeyDer(PublicKeyLayout layout) const = 0;
   // RSASSA-PKCS1-v1_5 over the SHA-1 of the bytes. Works where the system's policy forbids SHA-1 signatures too.
   virtual Result<std::vector<std::uint8_t>> sign(std::span<const std::uint8_t> bytes) const = 0;

@@ -94,7 +94,7 @@ Result<std::vector<std::uint8_t>> readFile(const std::string& path) {
   return std::vector<std::uint8_t>(bytes->begin(), bytes->end());
 }
 
-std::optional<Failure> writeFile(const std::string& path, std::span<const std::uint8_t> bytes) {
+Result<void> writeFile(const std::string& path, std::span<const std::uint8_t> bytes) {
   const std::string temporary = path + ".new";
   {
     std::ofstream file(temporary, std::ios::binary | std::ios::trunc);
@@ -107,7 +107,7 @@ std::optional<Failure> writeFile(const std::string& path, std::span<const std::u
   std::error_code error;
   std::filesystem::rename(temporary, path, error);
   if (error) return Failure{fmt::format("cannot write {}: {}", path, error.message())};
-  return std::nullopt;
+  return {};
 }
 
 }  // namespace orvanta

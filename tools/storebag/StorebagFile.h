@@ -38,7 +38,7 @@ Result<Value> parseBagSource(std::span<const std::uint8_t> bytes);
 Result<Value> readBagSource(const std::string& path);
 
 Result<std::vector<std::uint8_t>> readFile(const std::string& path);
-// Replaces the file whole: readers see the old content or the new. None, or why it cannot be written.
-std::optional<Failure> writeFile(const std::string& path, std::span<const std::uint8_t> bytes);
+// Replaces the file whole: readers see the old content or the new. The failure names the file.
+Result<void> writeFile(const std::string& path, std::span<const std::uint8_t> bytes);
 
 }  // namespace orvanta

@@ -3,11 +3,11 @@
 #include <CLI/CLI.hpp>
 #include <cerrno>
 #include <cstdio>
-#include <cstring>
 #include <string>
 
 #include "platform/codec/Json.h"
 #include "platform/codec/PropertyList.h"
+#include "platform/core/Text.h"
 #include "platform/host/Digest.h"
 #include "platform/host/Process.h"
 #include "tools/storebag/StorebagFile.h"
@@ -18,44 +18,39 @@ namespace {
 
 using namespace orvanta;
 
-int fail(const std::string& text) {
-  std::fputs(fmt::format("orvanta-storebag: {}\n", text).c_str(), stderr);
-  return 1;
+Result<void> print(const void* bytes, std::size_t size) {
+  if (std::fwrite(bytes, 1, size, stdout) == size && std::fflush(stdout) == 0) return {};
+  return Failure{"cannot write to standard output: " + platform::errnoText(errno)};
 }
-
-// The exit status.
-int print(const void* bytes, std::size_t size) {
-  if (std::fwrite(bytes, 1, size, stdout) == size && std::fflush(stdout) == 0) return 0;
-  return fail(fmt::format("cannot write to standard output: {}", std::strerror(errno)));
-}
-int print(const std::string& text) {
+Result<void> print(const std::string& text) {
   return print(text.data(), text.size());
 }
 
-int printBytes(const std::string& path, const std::vector<std::uint8_t>& bytes) {
-  if (path == "-") return print(bytes.data(), bytes.size());
-  const auto failure = writeFile(path, bytes);
-  return failure ? fail(failure->text) : 0;
+// "-" is standard output.
+Result<void> writeTo(const std::string& path, const std::vector<std::uint8_t>& bytes) {
+  return path == "-" ? print(bytes.data(), bytes.size()) : writeFile(path, bytes);
 }
 
-int makeKey(const std::string& keyPath, const std::string& publicPath, const std::string& layout) {
+// The subcommands.
+
+Result<void> makeKey(const std::string& keyPath, const std::string& publicPath, const std::string& layout) {
   const auto key = SigningKey::readOrMake(keyPath);
-  if (!key) return fail(key.error());
+  if (!key) return Failure{key.error()};
   const auto der =
       (*key)->publicKeyDer(layout == "pkcs1" ? PublicKeyLayout::pkcs1 : PublicKeyLayout::subjectPublicKeyInfo);
-  return printBytes(publicPath, der);
+  return writeTo(publicPath, der);
 }
 
-int sign(const std::string& input, const std::string& keyPath, const std::string& output, const std::string& container,
-         const std::string& bagForm) {
+Result<void> sign(const std::string& input, const std::string& keyPath, const std::string& output,
+                  const std::string& container, const std::string& bagForm) {
   const auto bag = readBagSource(input);
-  if (!bag) return fail(bag.error());
+  if (!bag) return Failure{bag.error()};
   const auto key = SigningKey::read(keyPath);
-  if (!key) return fail(key.error());
+  if (!key) return Failure{key.error()};
   const auto document =
       makeStorebag(*bag, **key, *propertyListFormFromText(container), *propertyListFormFromText(bagForm));
-  if (!document) return fail(fmt::format("{}: {}", input, document.error()));
-  return printBytes(output, *document);
+  if (!document) return Failure{fmt::format("{}: {}", input, document.error())};
+  return writeTo(output, *document);
 }
 
 Result<StorebagContent> openFile(const std::string& path) {
@@ -66,26 +61,26 @@ Result<StorebagContent> openFile(const std::string& path) {
   return content;
 }
 
-int verify(const std::string& path, const std::string& publicPath) {
+Result<void> verify(const std::string& path, const std::string& publicPath) {
   const auto content = openFile(path);
-  if (!content) return fail(content.error());
+  if (!content) return Failure{content.error()};
   const auto der = readFile(publicPath);
-  if (!der) return fail(der.error());
+  if (!der) return Failure{der.error()};
   const auto key = platform::RsaPublicKey::fromDer(*der);
-  if (!key) return fail(publicPath + " is no RSA public key in DER form");
+  if (!key) return Failure{publicPath + " is not an RSA public key in DER form"};
   if (!key->verifySha1(platform::sha1(content->bag), content->signature)) {
-    return fail(path + ": the signature is not that key's over this bag");
+    return Failure{path + ": the signature is not that key's over this bag"};
   }
   const Value* version = content->inner.dictionary() ? content->inner.dictionary()->find("version") : nullptr;
   return print(fmt::format("{}: good signature, version {}\n", path, version ? version->description() : "(none)"));
 }
 
-int show(const std::string& path, bool xml) {
+Result<void> show(const std::string& path, bool xml) {
   const auto content = openFile(path);
-  if (!content) return fail(content.error());
+  if (!content) return Failure{content.error()};
   if (!xml) return print(platform::writeJson(content->inner, true) + "\n");
   const auto text = platform::writeXmlPropertyList(content->inner);
-  if (!text) return fail(fmt::format("{}: {}", path, text.error()));
+  if (!text) return Failure{fmt::format("{}: {}", path, text.error())};
   return print(*text);
 }
 
@@ -126,8 +121,11 @@ int main(int argc, char** argv) {
   showCommand->add_flag("--xml", xml, "as an XML property list instead of JSON");
 
   CLI11_PARSE(app, argc, argv);
-  if (keyCommand->parsed()) return makeKey(key, output, layout);
-  if (signCommand->parsed()) return sign(input, key, output, container, bagForm);
-  if (verifyCommand->parsed()) return verify(input, key);
-  return show(input, xml);
+  const auto done = keyCommand->parsed()      ? makeKey(key, output, layout)
+                    : signCommand->parsed()   ? sign(input, key, output, container, bagForm)
+                    : verifyCommand->parsed() ? verify(input, key)
+                                              : show(input, xml);
+  if (done) return 0;
+  std::fputs(fmt::format("orvanta-storebag: {}\n", done.error()).c_str(), stderr);
+  return 1;
 }

@@ -100,11 +100,11 @@ void RelayConnection::run() {
   }
 }
 
-std::optional<RelayConnection::Refusal> RelayConnection::readBody(const RequestHead& head, ReceivedRequest& request) {
+Result<void, RelayConnection::Refusal> RelayConnection::readBody(const RequestHead& head, ReceivedRequest& request) {
   const auto length = head.contentLength();
   if (!length) return Refusal{400, length.error()};
   const bool hasBody = head.chunked() || length->value_or(0) > 0;
-  if (!hasBody) return std::nullopt;
+  if (!hasBody) return {};
   if (length->value_or(0) > _context.maximumBodyBytes) {
     return Refusal{413, fmt::format("the body is longer than {} bytes", _context.maximumBodyBytes)};
   }
@@ -113,7 +113,7 @@ std::optional<RelayConnection::Refusal> RelayConnection::readBody(const RequestH
       head.chunked() ? _reader.readChunkedBody(_context.maximumBodyBytes) : _reader.readBody(length->value_or(0));
   if (!body) return Refusal{400, body.error()};
   request.rawBody = std::move(body.value());
-  return std::nullopt;
+  return {};
 }
 
 bool RelayConnection::handleOne() {
@@ -135,7 +135,9 @@ bool RelayConnection::handleOne() {
   request.kind = kindOf(request.method, request.path);
   request.headers = std::move(head->headers);
   head->headers = request.headers;
-  if (const auto refusal = readBody(*head, request)) return refuse(request, refusal->status, refusal->reason);
+  if (const auto read = readBody(*head, request); !read) {
+    return refuse(request, read.error().status, read.error().reason);
+  }
   request.time = wallSeconds();
   decodeBody(request, _context.maximumBodyBytes * kInflationAllowance);
   if (request.kind == RequestKind::events) parseEvents(request);

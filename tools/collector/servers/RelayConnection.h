@@ -38,12 +38,13 @@ class RelayConnection {
   bool answer(const std::shared_ptr<ReceivedRequest>& shared, bool keepsAlive);
   bool refuse(ReceivedRequest& request, int status, const std::string& reason);
 
-  // The body as it stood on the wire; a failure says what to answer.
+  // The answer to a request that cannot be read.
   struct Refusal {
     int status = 0;
     std::string reason;
   };
-  std::optional<Refusal> readBody(const RequestHead& head, ReceivedRequest& request);
+  // Takes the body off the wire into `request`.
+  Result<void, Refusal> readBody(const RequestHead& head, ReceivedRequest& request);
   BackendAnswer usualAnswer(const ReceivedRequest& request);
   bool send(const ReceivedRequest& request, const BackendAnswer& answer, ConnectionFault fault, bool keepsAlive);
   void store(ReceivedRequest& request);

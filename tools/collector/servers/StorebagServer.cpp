@@ -83,19 +83,17 @@ Result<std::unique_ptr<StorebagServer>> StorebagServer::make(const std::string& 
   auto key = SigningKey::readOrMake(directory + "/storebag-key.pem");
   if (!key) return Failure{key.error()};
   std::unique_ptr<StorebagServer> server(new StorebagServer(directory, std::move(key.value())));
-  if (auto failed =
-          writeFile(server->publicKeyFile(), server->_key->publicKeyDer(PublicKeyLayout::subjectPublicKeyInfo))) {
-    return std::move(*failed);
-  }
-  if (auto failed = writeFile(server->publicKeyPkcs1File(), server->_key->publicKeyDer(PublicKeyLayout::pkcs1))) {
-    return std::move(*failed);
+  for (const auto& [file, layout] : {std::pair(server->publicKeyFile(), PublicKeyLayout::subjectPublicKeyInfo),
+                                     std::pair(server->publicKeyPkcs1File(), PublicKeyLayout::pkcs1)}) {
+    const auto written = writeFile(file, server->_key->publicKeyDer(layout));
+    if (!written) return Failure{written.error()};
   }
   const std::string common = directory + "/storebag";
   const auto exists = [&](const char* extension) { return modifiedNanoseconds(common + extension).has_value(); };
   if (std::none_of(kExtensions.begin(), kExtensions.end(), exists)) {
     const std::string_view text = defaultStorebagJson();
     const std::span bytes(reinterpret_cast<const std::uint8_t*>(text.data()), text.size());
-    if (auto failed = writeFile(common + ".json", bytes)) return std::move(*failed);
+    if (const auto written = writeFile(common + ".json", bytes); !written) return Failure{written.error()};
   }
   return server;
 }

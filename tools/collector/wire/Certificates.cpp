@@ -14,7 +14,6 @@
 #include <cstdint>
 #include <cstring>
 #include <memory>
-#include <optional>
 #include <utility>
 
 #include "platform/core/UniqueFd.h"
@@ -120,12 +119,12 @@ Result<ServerIdentity> makeAuthority() {
   return identityText(certificate.get(), key.get());
 }
 
-std::optional<Failure> writeText(const std::string& path, const std::string& text, mode_t mode) {
+Result<void> writeText(const std::string& path, const std::string& text, mode_t mode) {
   const platform::UniqueFd file(::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, mode));
   if (!file || ::write(file.get(), text.data(), text.size()) != static_cast<ssize_t>(text.size())) {
     return Failure{fmt::format("cannot write {}: {}", path, std::strerror(errno))};
   }
-  return std::nullopt;
+  return {};
 }
 
 }  // namespace
@@ -142,8 +141,9 @@ Result<CertificateAuthority> CertificateAuthority::readOrMake(const std::string&
   if (usable(kept)) return CertificateAuthority(certificateFile, std::move(kept));
   auto made = makeAuthority();
   if (!made) return Failure{made.error()};
-  if (auto failure = writeText(keyFile, made->keyPem, 0600)) return std::move(*failure);
-  if (auto failure = writeText(certificateFile, made->certificatePem, 0644)) return std::move(*failure);
+  auto written = writeText(keyFile, made->keyPem, 0600);
+  if (written) written = writeText(certificateFile, made->certificatePem, 0644);
+  if (!written) return Failure{written.error()};
   return CertificateAuthority(certificateFile, std::move(made.value()));
 }
 
