@@ -8,8 +8,8 @@
 
 #include "interface/Values.h"
 #include "tools/collector/CollectorOptions.h"
-#include "tools/collector/servers/AcknowledgementSettings.h"
 #include "tools/collector/servers/Behaviours.h"
+#include "tools/collector/servers/DashboardServer.h"
 #include "tools/collector/store/ReceivedRecords.h"
 
 namespace orvanta::collector {

@@ -3,7 +3,7 @@
 
 #include "platform/codec/Json.h"
 #include "tools/collector/api/ApiRoutes.h"
-#include "tools/collector/servers/SettingsReader.h"
+#include "tools/collector/api/ControlSettings.h"
 
 // The URLs that change how the collector answers.
 
@@ -14,47 +14,10 @@ using httplib::Response;
 
 namespace {
 
-constexpr std::int64_t kHighestMaxAge = 1'000'000'000;
-constexpr const char* kMaxAgeOfBag = "refresh_cycle";
-
-PropertyListForm readForm(SettingsReader& reader, const char* key, PropertyListForm otherwise, bool& wrong) {
-  const auto text = reader.text(key);
-  if (!text) return otherwise;
-  const auto form = propertyListFormFromText(*text);
-  wrong = wrong || !form;
-  return form.value_or(otherwise);
-}
-
-Result<StorebagSettings> parseStorebagSettings(const Value& value) {
-  SettingsReader reader(value);
-  StorebagSettings settings;
-  bool wrongForm = false;
-  settings.container = readForm(reader, "container", settings.container, wrongForm);
-  settings.bag = readForm(reader, "bag", settings.bag, wrongForm);
-  settings.lastModified = reader.boolean("lastModified").value_or(settings.lastModified);
-  const Value* maxAge = reader.take("maxAge");
-  settings.maxAgeOfBag = maxAge == nullptr || *maxAge == kMaxAgeOfBag;
-  if (maxAge != nullptr && maxAge->isNull()) {
-    settings.maxAge = std::nullopt;
-  } else if (!settings.maxAgeOfBag) {
-    settings.maxAge = reader.integer("maxAge", -kHighestMaxAge, kHighestMaxAge);
-  }
-  if (auto failure = reader.finish()) return std::move(*failure);
-  if (wrongForm) return Failure{"\"container\" and \"bag\" are \"xml\" or \"binary\""};
-  return settings;
-}
-
-Dictionary describe(const StorebagSettings& settings) {
-  return Dictionary{{"container", std::string(propertyListFormText(settings.container))},
-                    {"bag", std::string(propertyListFormText(settings.bag))},
-                    {"lastModified", settings.lastModified},
-                    {"maxAge", settings.maxAgeOfBag ? Value(kMaxAgeOfBag)
-                               : settings.maxAge    ? Value(*settings.maxAge)
-                                                    : Value()}};
-}
-
 void answerState(Response& response, const ApiContext& context) {
-  answerJson(response, Dictionary{{"paths", context.behaviours.describe()},
+  Dictionary paths;
+  for (const auto& [path, behaviour] : context.behaviours.all()) paths.set(path, describe(behaviour));
+  answerJson(response, Dictionary{{"paths", std::move(paths)},
                                   {"acknowledgements", describe(context.dashboard.settings())},
                                   {"storebag", describe(context.storebags.settings())}});
 }

@@ -8,8 +8,7 @@
 #include <string>
 #include <string_view>
 
-#include "interface/Values.h"
-#include "tools/collector/store/ReceivedRecords.h"
+#include "tools/collector/wire/HttpMessage.h"
 
 namespace orvanta::collector {
 
@@ -23,6 +22,7 @@ enum class ConnectionFault {
   garbage    // bytes that are no HTTP
 };
 std::string_view connectionFaultText(ConnectionFault fault);
+std::optional<ConnectionFault> connectionFaultFromText(std::string_view text);
 
 // How requests to a path are treated instead of the usual.
 struct PathBehaviour {
@@ -40,24 +40,19 @@ struct PathBehaviour {
 // the exact path goes before the longest such beginning. Thread-safe.
 class Behaviours {
  public:
+  using ByPath = std::map<std::string, PathBehaviour, std::less<>>;
+
   void set(const std::string& path, PathBehaviour behaviour);
   // Whether there was one.
   bool clear(const std::string& path);
   void clearAll();
   // The behaviour for one request to the path, which uses up one of its times.
   std::optional<PathBehaviour> take(std::string_view path);
-  Value describe() const;
+  ByPath all() const;
 
  private:
   mutable std::mutex _mutex;
-  std::map<std::string, PathBehaviour, std::less<>> _byPath;  // guarded by _mutex
+  ByPath _byPath;  // guarded by _mutex
 };
-
-// {"path": text, "status", "body", "headers", "delayMs", "fault", "times"}. Unknown keys and wrong types are refused.
-struct PathSetting {
-  std::string path;
-  PathBehaviour behaviour;
-};
-Result<PathSetting> parsePathSetting(const Value& value);
 
 }  // namespace orvanta::collector

@@ -14,10 +14,21 @@
 
 #include "interface/Values.h"
 #include "platform/core/UniqueFd.h"
-#include "tools/collector/servers/AcknowledgementSettings.h"
 #include "tools/collector/store/Inbox.h"
 
 namespace orvanta::collector {
+
+// How the dashboard server acknowledges the datagrams that ask for it. Forged ones are sent besides the right one, lost
+// or not.
+struct AcknowledgementSettings {
+  bool acknowledge = true;
+  unsigned lossPercent = 0;  // of the right ones
+  std::chrono::milliseconds delay{0};
+  unsigned duplicates = 0;      // further copies of each right one
+  unsigned unknownNumbers = 0;  // forged: event numbers that were never sent
+  unsigned tooShort = 0;        // forged: the right bytes, cut before the event number
+  unsigned foreign = 0;         // forged: the right number, from another port
+};
 
 // Receives dashboard datagrams on one UDP port, keeps them in the inbox and acknowledges those that ask for it, on a
 // thread of its own. stop() and the settings may be called on any other thread.
