@@ -7,7 +7,7 @@
 
 #include "tests/support/LogCapture.h"
 #include "tests/support/Threads.h"
-#include "tools/collector/wire/BodyDecoder.h"
+#include "tools/collector/wire/MessageReader.h"
 
 namespace orvanta {
 namespace {

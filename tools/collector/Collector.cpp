@@ -9,7 +9,7 @@
 #include "tools/collector/servers/BackendConnections.h"
 #include "tools/collector/servers/DashboardServer.h"
 #include "tools/collector/servers/Relay.h"
-#include "tools/collector/wire/TlsServer.h"
+#include "tools/collector/wire/Tls.h"
 
 namespace orvanta::collector {
 

@@ -1,18 +1,38 @@
 #pragma once
 
 #include <chrono>
+#include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <string>
 #include <vector>
 
 #include "interface/Values.h"
-#include "tools/collector/CollectorOptions.h"
 #include "tools/collector/servers/Behaviours.h"
 #include "tools/collector/servers/DashboardServer.h"
+#include "tools/collector/servers/StorebagServer.h"
+#include "tools/collector/store/Inbox.h"
 #include "tools/collector/store/ReceivedRecords.h"
+#include "tools/collector/wire/Tls.h"
 
 namespace orvanta::collector {
+
+struct CollectorOptions {
+  // Holds keys, certificates, bags and the database; made when it does not exist.
+  std::string directory;
+  std::string address = "127.0.0.1";
+  // 0 takes any free port.
+  std::uint16_t httpPort = 0;
+  std::uint16_t httpsPort = 0;
+  std::uint16_t dashboardPort = 0;
+  CertificateFlaw certificateFlaw = CertificateFlaw::none;
+  StorebagSettings storebag;
+  InboxLimits inbox;
+  std::size_t maximumBodyBytes = 64U << 20U;  // of one request; longer ones are answered 413
+  // Sees each recorded request, on the collector's threads; may be empty.
+  std::function<void(const ReceivedRequest&)> observer;
+};
 
 // Everything outside a daemon on one machine: storebag server, event server (http and https), upload and log-data
 // server, dashboard server; whatever comes in is recorded. Runs on threads of its own from start() until stop() or

@@ -1,7 +1,7 @@
 #include "tests/backends/https/HTTPSFixture.h"
 
 #include "platform/codec/Json.h"
-#include "tools/collector/wire/BodyDecoder.h"
+#include "tools/collector/wire/MessageReader.h"
 
 namespace orvanta::test {
 

@@ -1,7 +1,7 @@
 #include "tests/platform/http/HttpFixture.h"
 #include "tests/support/TemporaryDirectory.h"
 #include "tools/collector/Collector.h"
-#include "tools/collector/wire/Certificates.h"
+#include "tools/collector/wire/Tls.h"
 
 namespace orvanta::platform {
 namespace {

@@ -6,7 +6,7 @@
 
 #include "platform/core/WholeFile.h"
 #include "tools/collector/api/ApiRoutes.h"
-#include "tools/collector/store/Listings.h"
+#include "tools/collector/store/ReceivedRecords.h"
 
 // The URLs that tell what has been received.
 

@@ -12,7 +12,7 @@
 #include <utility>
 
 #include "backends/dashboard/DashboardDatagram.h"
-#include "tools/collector/wire/Sockets.h"
+#include "tools/collector/wire/Transport.h"
 
 namespace orvanta::collector {
 using platform::UniqueFd;

@@ -1,4 +1,4 @@
-#include "tools/collector/servers/DefaultStorebag.h"
+#include "tools/collector/servers/StorebagServer.h"
 
 namespace orvanta::collector {
 

@@ -12,7 +12,7 @@
 #include <cstring>
 #include <utility>
 
-#include "tools/collector/wire/Sockets.h"
+#include "tools/collector/wire/Transport.h"
 
 namespace orvanta::collector {
 using platform::UniqueFd;

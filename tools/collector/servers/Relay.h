@@ -11,7 +11,7 @@
 #include "interface/Values.h"
 #include "platform/core/UniqueFd.h"
 #include "tools/collector/servers/RelayConnection.h"
-#include "tools/collector/wire/TlsServer.h"
+#include "tools/collector/wire/Tls.h"
 
 namespace orvanta::collector {
 

@@ -9,7 +9,7 @@
 #include <utility>
 
 #include "platform/codec/Json.h"
-#include "tools/collector/wire/BodyDecoder.h"
+#include "tools/collector/wire/MessageReader.h"
 
 namespace orvanta::collector {
 

@@ -8,7 +8,6 @@
 #include <chrono>
 #include <utility>
 
-#include "tools/collector/servers/DefaultStorebag.h"
 #include "tools/collector/wire/HttpMessage.h"
 
 namespace orvanta::collector {

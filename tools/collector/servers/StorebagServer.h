@@ -6,6 +6,7 @@
 #include <mutex>
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include "interface/Values.h"
 #include "tools/collector/store/ReceivedRecords.h"
@@ -23,6 +24,9 @@ struct StorebagSettings {
   bool maxAgeOfBag = true;
   bool lastModified = true;  // whether answers carry Last-Modified
 };
+
+// The bag that a new directory gets, as JSON with placeholders.
+std::string_view defaultStorebagJson();
 
 // What "${http}" and the like in a bag's texts stand for.
 struct BagPlaceholders {

@@ -8,6 +8,7 @@
 #include <mutex>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "interface/Values.h"
@@ -67,7 +68,9 @@ class Inbox {
   void addEvents(const ReceivedRequest& request);
   void prune();
   void changed();
-  std::vector<ReceivedRequest> readRequests(Statement& statement) const;
+  void countRequests();
+  Statement select(std::string_view columns, std::string_view which) const;
+  std::optional<ReceivedRequest> firstRequest(std::string_view where, std::int64_t number) const;
 
   const InboxLimits _limits;
   mutable std::mutex _mutex;

@@ -1,4 +1,4 @@
-#include "tools/collector/wire/Certificates.h"
+#include "tools/collector/wire/Tls.h"
 
 #include <fcntl.h>
 #include <fmt/format.h>

@@ -3,6 +3,7 @@
 #include <cstddef>
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include "interface/Values.h"
 #include "tools/collector/wire/Transport.h"
@@ -33,5 +34,8 @@ class MessageReader {
   Transport& _stream;
   std::string _buffer;  // read and not yet taken
 };
+
+// Inflates a gzip or zlib body whole; a failure when it is damaged, has trailing bytes, or would pass `maximumBytes`.
+Result<std::string> inflateBody(std::string_view compressed, std::size_t maximumBytes);
 
 }  // namespace orvanta::collector

@@ -1,4 +1,4 @@
-#include "tools/collector/wire/TlsServer.h"
+#include "tools/collector/wire/Tls.h"
 
 #include <openssl/bio.h>
 #include <openssl/err.h>

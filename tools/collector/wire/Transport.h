@@ -1,16 +1,35 @@
 #pragma once
 
+#include <netinet/in.h>
+
 #include <chrono>
 #include <cstddef>
+#include <cstdint>
 #include <memory>
 #include <optional>
+#include <string>
 #include <string_view>
+#include <utility>
 
+#include "interface/Values.h"
 #include "platform/core/UniqueFd.h"
 
 namespace orvanta::collector {
 
-class TlsServer;
+struct BoundSocket {
+  platform::UniqueFd socket;
+  std::uint16_t port = 0;
+};
+
+// An IPv4 socket of that type (SOCK_STREAM or SOCK_DGRAM) bound to the address; port 0 takes any free one.
+Result<BoundSocket> bindSocket(int type, const std::string& address, std::uint16_t port);
+
+// "127.0.0.1:4711".
+std::string addressText(const sockaddr_in& address);
+
+// How long a peer may take for one read or write before its connection is given up.
+inline constexpr std::chrono::seconds kStreamTimeout{120};
+void prepareStreamSocket(int descriptor);
 
 // One connected stream, plain or TLS, for a thread that reads and writes in turn. Another thread may call interrupt(),
 // after which everything ends as if the peer had gone.
@@ -47,9 +66,5 @@ class Transport {
  private:
   platform::UniqueFd _socket;
 };
-
-// How long a peer may take for one read or write before its connection is given up.
-inline constexpr std::chrono::seconds kStreamPatience{120};
-void prepareStreamSocket(int descriptor);
 
 }  // namespace orvanta::collector

@@ -1,8 +1,12 @@
 #pragma once
 
+#include <memory>
 #include <string>
+#include <utility>
 
 #include "interface/Values.h"
+#include "platform/core/UniqueFd.h"
+#include "tools/collector/wire/Transport.h"
 
 namespace orvanta::collector {
 
@@ -33,6 +37,16 @@ class CertificateAuthority {
   // Constant after construction.
   std::string _certificateFile;
   ServerIdentity _identity;
+};
+
+// The server side of TLS with one certificate. Immutable; accept() may be called from several threads.
+class TlsServer {
+ public:
+  static Result<std::shared_ptr<TlsServer>> make(const ServerIdentity& identity);
+  virtual ~TlsServer() = default;
+  // Returns at once; the stream shakes hands at its first read, so that the caller can interrupt it meanwhile. If the peer
+  // breaks off, reads end at once.
+  virtual std::unique_ptr<Transport> accept(platform::UniqueFd socket) = 0;
 };
 
 }  // namespace orvanta::collector
