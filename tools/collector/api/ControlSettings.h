@@ -11,8 +11,8 @@ namespace orvanta::collector {
 
 // The settings of the /control URLs as JSON: parsed from what a client posts, described for GET /control. Pure.
 //
-// Parsing refuses unknown keys, wrong types and numbers out of range, so that a misspelt key does not silently leave the
-// default in force; the failure names the key. A key that is absent leaves its field as the struct initializes it.
+// Parsing refuses unknown keys, wrong types and numbers out of range, so that a misspelt key does not silently leave
+// the default in force; the failure names the key. A key that is absent leaves its field as the struct initializes it.
 
 // {"path", "status", "body", "headers", "delayMs", "fault", "times"}
 struct PathSetting {

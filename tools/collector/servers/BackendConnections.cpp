@@ -15,8 +15,8 @@ constexpr std::size_t kMaximumAnswerBytes = 1U << 30U;
 }  // namespace
 
 std::unique_ptr<Transport> BackendConnections::take() {
-  std::unique_lock lock(_mutex);
-  _condition.wait(lock, [&] { return _inUse < kMaximum; });
+  platform::MutexLock lock(_mutex);
+  while (_inUse >= kMaximum) _givenBack.wait(lock);
   ++_inUse;
   while (!_idle.empty()) {
     auto connection = std::move(_idle.back());
@@ -29,14 +29,14 @@ std::unique_ptr<Transport> BackendConnections::take() {
 }
 
 void BackendConnections::giveBack(std::unique_ptr<Transport> connection) {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   --_inUse;
   if (connection && _idle.size() < kKeptIdle) _idle.push_back(std::move(connection));
-  _condition.notify_one();
+  _givenBack.notifyOne();
 }
 
 void BackendConnections::closeIdle() {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   _idle.clear();
 }
 

@@ -1,13 +1,12 @@
 #pragma once
 
-#include <condition_variable>
 #include <cstdint>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <vector>
 
 #include "interface/Values.h"
+#include "platform/core/Mutex.h"
 #include "tools/collector/wire/HttpMessage.h"
 #include "tools/collector/wire/Transport.h"
 
@@ -37,10 +36,10 @@ class BackendConnections {
   static Result<BackendAnswer> exchangeOn(Transport& connection, const std::string& head, bool answerHasBody);
 
   const std::uint16_t _port;
-  std::mutex _mutex;
-  std::condition_variable _condition;
-  std::size_t _inUse = 0;                         // guarded by _mutex
-  std::vector<std::unique_ptr<Transport>> _idle;  // guarded by _mutex
+  platform::Mutex _mutex;
+  platform::Condition _givenBack;
+  std::size_t _inUse GUARDED_BY(_mutex) = 0;
+  std::vector<std::unique_ptr<Transport>> _idle GUARDED_BY(_mutex);
 };
 
 }  // namespace orvanta::collector

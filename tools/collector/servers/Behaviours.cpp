@@ -31,22 +31,22 @@ std::optional<ConnectionFault> connectionFaultFromText(std::string_view text) {
 }
 
 void Behaviours::set(const std::string& path, PathBehaviour behaviour) {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   _byPath.insert_or_assign(path, std::move(behaviour));
 }
 
 bool Behaviours::clear(const std::string& path) {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   return _byPath.erase(path) > 0;
 }
 
 void Behaviours::clearAll() {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   _byPath.clear();
 }
 
 std::optional<PathBehaviour> Behaviours::take(std::string_view path) {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   auto found = _byPath.find(path);
   if (found == _byPath.end()) {
     for (auto it = _byPath.begin(); it != _byPath.end(); ++it) {
@@ -64,7 +64,7 @@ std::optional<PathBehaviour> Behaviours::take(std::string_view path) {
 }
 
 Behaviours::ByPath Behaviours::all() const {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   return _byPath;
 }
 

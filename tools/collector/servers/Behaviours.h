@@ -3,11 +3,11 @@
 #include <chrono>
 #include <cstddef>
 #include <map>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
 
+#include "platform/core/Mutex.h"
 #include "tools/collector/wire/HttpMessage.h"
 
 namespace orvanta::collector {
@@ -51,8 +51,8 @@ class Behaviours {
   ByPath all() const;
 
  private:
-  mutable std::mutex _mutex;
-  ByPath _byPath;  // guarded by _mutex
+  mutable platform::Mutex _mutex;
+  ByPath _byPath GUARDED_BY(_mutex);
 };
 
 }  // namespace orvanta::collector

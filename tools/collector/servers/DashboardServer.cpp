@@ -83,12 +83,12 @@ void DashboardServer::stop() {
 }
 
 void DashboardServer::setSettings(const AcknowledgementSettings& settings) {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   _settings = settings;
 }
 
 AcknowledgementSettings DashboardServer::settings() const {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   return _settings;
 }
 

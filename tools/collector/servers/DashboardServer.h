@@ -6,13 +6,13 @@
 #include <cstdint>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <random>
 #include <string>
 #include <thread>
 #include <vector>
 
 #include "interface/Values.h"
+#include "platform/core/Mutex.h"
 #include "platform/core/UniqueFd.h"
 #include "tools/collector/store/Inbox.h"
 
@@ -76,9 +76,10 @@ class DashboardServer {
   std::multimap<Clock::time_point, Acknowledgement> _delayed;
   std::minstd_rand _dice{1};  // the same losses in every run
 
-  mutable std::mutex _mutex;
-  AcknowledgementSettings _settings;  // guarded by _mutex
-  std::thread _thread;
+  mutable platform::Mutex _mutex;
+  AcknowledgementSettings _settings GUARDED_BY(_mutex);
+
+  std::thread _thread;  // from construction until stop()
 };
 
 }  // namespace orvanta::collector

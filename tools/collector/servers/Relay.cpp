@@ -54,15 +54,16 @@ void Relay::stop() {
   if (_stopping.exchange(true)) return;
   ::shutdown(_listener.get(), SHUT_RDWR);
   if (_acceptor.joinable()) _acceptor.join();
+  std::list<Connection> ending;
   {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     for (const Connection& connection : _connections) {
       if (connection.stream) connection.stream->interrupt();
     }
+    ending.swap(_connections);
   }
-  // No acceptor is left to change the list.
-  for (Connection& connection : _connections) connection.thread.join();
-  _connections.clear();
+  // Without the lock, which each thread takes once more at its end.
+  for (Connection& connection : ending) connection.thread.join();
 }
 
 void Relay::acceptConnections() {
@@ -84,7 +85,7 @@ void Relay::acceptConnections() {
 
 void Relay::admit(UniqueFd socket, std::string client) {
   prepareStreamSocket(socket.get());
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   if (_connections.size() >= kMaximumConnections) return;
   Connection& connection = _connections.emplace_back();
   connection.stream = _tls ? _tls->accept(std::move(socket)) : Transport::plain(std::move(socket));
@@ -93,7 +94,7 @@ void Relay::admit(UniqueFd socket, std::string client) {
     RelayConnection(*connection.stream, _context, client, _tls != nullptr).run();
     {
       // Closed here, not when the thread is joined: the client waits for it.
-      const std::lock_guard lock(_mutex);
+      const platform::MutexLock lock(_mutex);
       connection.stream.reset();
     }
     connection.finished = true;
@@ -101,7 +102,7 @@ void Relay::admit(UniqueFd socket, std::string client) {
 }
 
 void Relay::joinFinished() {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   for (auto it = _connections.begin(); it != _connections.end();) {
     if (!it->finished) {
       ++it;

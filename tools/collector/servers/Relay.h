@@ -4,11 +4,11 @@
 #include <cstdint>
 #include <list>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <thread>
 
 #include "interface/Values.h"
+#include "platform/core/Mutex.h"
 #include "platform/core/UniqueFd.h"
 #include "tools/collector/servers/RelayConnection.h"
 #include "tools/collector/wire/Tls.h"
@@ -34,7 +34,8 @@ class Relay {
 
  private:
   struct Connection {
-    std::unique_ptr<Transport> stream;  // null once it has ended; set and cleared under the mutex
+    // Null once it has ended. Set and cleared under the relay's mutex, in between used by `thread`.
+    std::unique_ptr<Transport> stream;
     std::thread thread;
     std::atomic<bool> finished{false};
   };
@@ -51,8 +52,8 @@ class Relay {
   std::thread _acceptor;
   std::atomic<bool> _stopping{false};
 
-  std::mutex _mutex;
-  std::list<Connection> _connections;  // guarded by _mutex; a connection's stream is used by its thread
+  platform::Mutex _mutex;
+  std::list<Connection> _connections GUARDED_BY(_mutex);
 };
 
 }  // namespace orvanta::collector

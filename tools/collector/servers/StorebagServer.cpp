@@ -105,31 +105,31 @@ void StorebagServer::setPlaceholders(BagPlaceholders placeholders) {
 }
 
 void StorebagServer::setSettings(const StorebagSettings& settings) {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   _settings = settings;
 }
 
 StorebagSettings StorebagServer::settings() const {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   return _settings;
 }
 
 void StorebagServer::setBag(const std::string& name, Value inner) {
   const auto now = std::chrono::system_clock::now().time_since_epoch();
   const std::int64_t nanoseconds = std::chrono::duration_cast<std::chrono::nanoseconds>(now).count();
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   HeldBag& held = _held[name];
   held.inner = std::move(inner);
   held.modifiedNanoseconds = std::max(nanoseconds, held.modifiedNanoseconds + 1);
 }
 
 void StorebagServer::clearBags() {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   _held.clear();
 }
 
 Result<StorebagServer::Source> StorebagServer::sourceFor(const std::string& name) const {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   // The bag's own source goes before the one for all names; held bags before files.
   const std::array<std::pair<std::string, std::string>, 2> candidates{{{name, name}, {"", "storebag"}}};
   for (const auto& [heldName, fileName] : candidates) {
@@ -145,7 +145,7 @@ Result<StorebagServer::Source> StorebagServer::sourceFor(const std::string& name
 
 // HTTP's times are whole seconds, in which a file may change twice: each change gets a second of its own.
 std::int64_t StorebagServer::stampFor(const std::string& identity, std::int64_t modified) {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   Stamp& last = _stamps[identity];
   if (last.modifiedNanoseconds != modified) {
     last.stamp = last.stamp == 0 ? modified / kNanoseconds : std::max(modified / kNanoseconds, last.stamp + 1);

@@ -3,12 +3,12 @@
 #include <cstdint>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
 
 #include "interface/Values.h"
+#include "platform/core/Mutex.h"
 #include "tools/collector/store/ReceivedRecords.h"
 #include "tools/storebag/StorebagFile.h"
 
@@ -83,10 +83,10 @@ class StorebagServer {
     Value inner;
     std::int64_t modifiedNanoseconds = 0;
   };
-  mutable std::mutex _mutex;
-  StorebagSettings _settings;            // guarded by _mutex
-  std::map<std::string, HeldBag> _held;  // guarded by _mutex
-  std::map<std::string, Stamp> _stamps;  // guarded by _mutex; by file or held name, which the directory bounds
+  mutable platform::Mutex _mutex;
+  StorebagSettings _settings GUARDED_BY(_mutex);
+  std::map<std::string, HeldBag> _held GUARDED_BY(_mutex);
+  std::map<std::string, Stamp> _stamps GUARDED_BY(_mutex);  // by file or held name, which the directory bounds
 };
 
 }  // namespace orvanta::collector

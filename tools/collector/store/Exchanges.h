@@ -3,8 +3,8 @@
 #include <cstdint>
 #include <map>
 #include <memory>
-#include <mutex>
 
+#include "platform/core/Mutex.h"
 #include "tools/collector/store/ReceivedRecords.h"
 
 namespace orvanta::collector {
@@ -17,23 +17,23 @@ class Exchanges {
   static constexpr const char* kHeader = "X-Collector-Exchange";
 
   void begin(std::shared_ptr<const ReceivedRequest> request) {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     _open[request->exchange] = std::move(request);
   }
   void end(std::int64_t exchange) {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     _open.erase(exchange);
   }
   // Null when there is no such exchange.
   std::shared_ptr<const ReceivedRequest> find(std::int64_t exchange) const {
-    const std::lock_guard lock(_mutex);
+    const platform::MutexLock lock(_mutex);
     const auto found = _open.find(exchange);
     return found != _open.end() ? found->second : nullptr;
   }
 
  private:
-  mutable std::mutex _mutex;
-  std::map<std::int64_t, std::shared_ptr<const ReceivedRequest>> _open;  // guarded by _mutex
+  mutable platform::Mutex _mutex;
+  std::map<std::int64_t, std::shared_ptr<const ReceivedRequest>> _open GUARDED_BY(_mutex);
 };
 
 }  // namespace orvanta::collector

@@ -54,7 +54,7 @@ void Inbox::countRequests() {
 }
 
 void Inbox::add(ReceivedRequest& request) {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   _database->run("BEGIN");
   rows::insert(_insertRequest, request);
   request.id = _database->lastInsertId();
@@ -79,7 +79,7 @@ void Inbox::addEvents(const ReceivedRequest& request) {
 }
 
 void Inbox::add(ReceivedDatagram& datagram) {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   rows::insert(_insertDatagram, datagram);
   datagram.id = _database->lastInsertId();
   ++_counts.datagrams;
@@ -108,7 +108,7 @@ void Inbox::prune() {
 }
 
 void Inbox::clear() {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   _database->run("DELETE FROM requests; DELETE FROM events; DELETE FROM datagrams;");
   _counts = {};
   _bytes = 0;
@@ -116,13 +116,13 @@ void Inbox::clear() {
 }
 
 std::int64_t Inbox::nextExchange() {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   return ++_lastExchange;
 }
 
 std::vector<ReceivedRequest> Inbox::requests(const InboxQuery& query) const {
   const std::string_view kind = query.kind ? requestKindText(*query.kind) : std::string_view();
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   Statement statement = select(rows::kSelectRequests,
                                "WHERE id > ?1 AND (?2 IS NULL OR path = ?2) AND (?3 IS NULL OR kind = ?3) "
                                "ORDER BY id LIMIT ?4");
@@ -141,7 +141,7 @@ std::optional<ReceivedRequest> Inbox::requestOfExchange(std::int64_t exchange) c
 }
 
 std::optional<ReceivedRequest> Inbox::firstRequest(std::string_view where, std::int64_t number) const {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   Statement statement = select(rows::kSelectRequests, where);
   statement.bind(0, number);
   if (!statement.step()) return std::nullopt;
@@ -153,49 +153,56 @@ Statement Inbox::select(std::string_view columns, std::string_view which) const 
 }
 
 std::vector<ReceivedEvent> Inbox::events(const InboxQuery& query) const {
-  const std::lock_guard lock(_mutex);
-  Statement statement = select(rows::kSelectEvents,
-                               "WHERE events.id > ?1 AND (?2 IS NULL OR path = ?2) ORDER BY events.id LIMIT ?3");
+  const platform::MutexLock lock(_mutex);
+  Statement statement =
+      select(rows::kSelectEvents, "WHERE events.id > ?1 AND (?2 IS NULL OR path = ?2) ORDER BY events.id LIMIT ?3");
   statement.bind(0, query.since).bind(2, limitOf(query));
   if (query.path) statement.bindText(1, *query.path);
   return readAll(statement, rows::readEvent);
 }
 
 std::vector<ReceivedDatagram> Inbox::datagrams(const InboxQuery& query) const {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   Statement statement = select(rows::kSelectDatagrams, "WHERE id > ?1 ORDER BY id LIMIT ?2");
   statement.bind(0, query.since).bind(1, limitOf(query));
   return readAll(statement, rows::readDatagram);
 }
 
 InboxCounts Inbox::counts() const {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   return _counts;
 }
 
 void Inbox::changed() {
   ++_version;
-  _condition.notify_all();
+  _changed.notifyAll();
 }
 
 bool Inbox::waitUntil(const std::function<bool()>& predicate, std::chrono::milliseconds limit) const {
   const auto end = std::chrono::steady_clock::now() + limit;
-  std::unique_lock lock(_mutex);
+  platform::MutexLock lock(_mutex);
   while (true) {
     const std::uint64_t seen = _version;
     lock.unlock();
     if (predicate()) return true;
     lock.lock();
-    if (!_condition.wait_until(lock, end, [&] { return _version != seen; })) return false;
+    while (_version == seen) {
+      if (!_changed.waitUntil(lock, end) && _version == seen) return false;
+    }
   }
 }
 
+bool Inbox::reached(const InboxCounts& least) const {
+  return _counts.requests >= least.requests && _counts.events >= least.events && _counts.datagrams >= least.datagrams;
+}
+
 bool Inbox::waitForCounts(const InboxCounts& least, std::chrono::milliseconds limit) const {
-  const auto reached = [&] {
-    return _counts.requests >= least.requests && _counts.events >= least.events && _counts.datagrams >= least.datagrams;
-  };
-  std::unique_lock lock(_mutex);
-  return _condition.wait_for(lock, limit, reached);
+  const auto end = std::chrono::steady_clock::now() + limit;
+  platform::MutexLock lock(_mutex);
+  while (!reached(least)) {
+    if (!_changed.waitUntil(lock, end)) return reached(least);
+  }
+  return true;
 }
 
 }  // namespace orvanta::collector

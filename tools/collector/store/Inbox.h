@@ -1,17 +1,16 @@
 #pragma once
 
 #include <chrono>
-#include <condition_variable>
 #include <cstdint>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "interface/Values.h"
+#include "platform/core/Mutex.h"
 #include "tools/collector/store/Database.h"
 #include "tools/collector/store/ReceivedRecords.h"
 
@@ -65,25 +64,25 @@ class Inbox {
 
  private:
   explicit Inbox(std::unique_ptr<Database> database, const InboxLimits& limits);
-  void addEvents(const ReceivedRequest& request);
-  void prune();
-  void changed();
-  void countRequests();
-  Statement select(std::string_view columns, std::string_view which) const;
+  void addEvents(const ReceivedRequest& request) REQUIRES(_mutex);
+  void prune() REQUIRES(_mutex);
+  void changed() REQUIRES(_mutex);
+  void countRequests() REQUIRES(_mutex);
+  bool reached(const InboxCounts& least) const REQUIRES(_mutex);
+  Statement select(std::string_view columns, std::string_view which) const REQUIRES(_mutex);
   std::optional<ReceivedRequest> firstRequest(std::string_view where, std::int64_t number) const;
 
   const InboxLimits _limits;
-  mutable std::mutex _mutex;
-  mutable std::condition_variable _condition;
-  // Guarded by _mutex.
-  const std::unique_ptr<Database> _database;
-  Statement _insertRequest;
-  Statement _insertEvent;
-  Statement _insertDatagram;
-  InboxCounts _counts;
-  std::size_t _bytes = 0;
-  std::int64_t _lastExchange = 0;
-  std::uint64_t _version = 0;  // counts changes
+  mutable platform::Mutex _mutex;
+  mutable platform::Condition _changed;
+  const std::unique_ptr<Database> _database POINTEE_GUARDED_BY(_mutex);
+  Statement _insertRequest GUARDED_BY(_mutex);
+  Statement _insertEvent GUARDED_BY(_mutex);
+  Statement _insertDatagram GUARDED_BY(_mutex);
+  InboxCounts _counts GUARDED_BY(_mutex);
+  std::size_t _bytes GUARDED_BY(_mutex) = 0;  // of bodies, as InboxLimits counts them
+  std::int64_t _lastExchange GUARDED_BY(_mutex) = 0;
+  std::uint64_t _version GUARDED_BY(_mutex) = 0;  // counts changes
 };
 
 }  // namespace orvanta::collector

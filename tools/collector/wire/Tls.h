@@ -44,8 +44,8 @@ class TlsServer {
  public:
   static Result<std::shared_ptr<TlsServer>> make(const ServerIdentity& identity);
   virtual ~TlsServer() = default;
-  // Returns at once; the stream shakes hands at its first read, so that the caller can interrupt it meanwhile. If the peer
-  // breaks off, reads end at once.
+  // Returns at once; the stream shakes hands at its first read, so that the caller can interrupt it meanwhile. If the
+  // peer breaks off, reads end at once.
   virtual std::unique_ptr<Transport> accept(platform::UniqueFd socket) = 0;
 };
 
