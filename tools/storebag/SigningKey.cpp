@@ -13,9 +13,9 @@
 #include <array>
 #include <cerrno>
 #include <cstdio>
-#include <cstring>
 #include <utility>
 
+#include "platform/core/Text.h"
 #include "platform/core/WholeFile.h"
 #include "platform/host/Digest.h"
 
@@ -47,7 +47,7 @@ class OpenSslSigningKey final : public SigningKey {
   Result<void> write(const std::string& path) const override {
     const int fd = ::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
     const FilePointer file(fd < 0 ? nullptr : ::fdopen(fd, "w"), &std::fclose);
-    if (!file) return Failure{fmt::format("cannot write {}: {}", path, std::strerror(errno))};
+    if (!file) return Failure{fmt::format("cannot write {}: {}", path, platform::errnoText(errno))};
     if (PEM_write_PrivateKey(file.get(), _key.get(), nullptr, nullptr, 0, nullptr, nullptr) != 1 ||
         std::fflush(file.get()) != 0) {
       return Failure{fmt::format("cannot write {}: {}", path, lastOpenSslError())};

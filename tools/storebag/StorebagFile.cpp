@@ -3,12 +3,12 @@
 #include <fmt/format.h>
 
 #include <cerrno>
-#include <cstring>
 #include <filesystem>
 #include <fstream>
 
 #include "platform/codec/Json.h"
 #include "platform/codec/PropertyList.h"
+#include "platform/core/Text.h"
 #include "platform/core/WholeFile.h"
 
 namespace orvanta {
@@ -18,11 +18,11 @@ namespace {
 constexpr std::size_t kMaximumFileBytes = 64U << 20U;
 
 Result<std::vector<std::uint8_t>> decodedField(const Dictionary& document, std::string_view key) {
-  const Value* field = document.find(key);
-  if (field == nullptr) return Failure{fmt::format("the document has no \"{}\"", key)};
-  if (field->string() == nullptr) return Failure{fmt::format("the document's \"{}\" is no text", key)};
-  auto bytes = platform::decodeBase64(*field->string());
-  if (!bytes) return Failure{fmt::format("the document's \"{}\" is no base64", key)};
+  if (!document.contains(key)) return Failure{fmt::format("the document has no \"{}\"", key)};
+  const std::string* text = document.text(key);
+  if (text == nullptr) return Failure{fmt::format("the document's \"{}\" is not a string", key)};
+  auto bytes = platform::decodeBase64(*text);
+  if (!bytes) return Failure{fmt::format("the document's \"{}\" is not base64", key)};
   return std::move(*bytes);
 }
 
@@ -101,7 +101,7 @@ Result<void> writeFile(const std::string& path, std::span<const std::uint8_t> by
     file.write(reinterpret_cast<const char*>(bytes.data()), static_cast<std::streamsize>(bytes.size()));
     file.flush();
     if (!file) {
-      return Failure{fmt::format("cannot write {}: {}", temporary, std::strerror(errno))};
+      return Failure{fmt::format("cannot write {}: {}", temporary, platform::errnoText(errno))};
     }
   }
   std::error_code error;

@@ -26,7 +26,7 @@ void answerEvents(const Request& request, Response& response, const ApiContext& 
   const auto received = requestOf(request, response, context);
   if (!received) return;
   if (!received->damage.empty()) return answerError(response, 400, received->damage);
-  const auto& events = *received->json->dictionary()->find("events")->array();
+  const Array& events = *received->json->dictionary()->array("events");
   answerJson(response, Dictionary{{"accepted", static_cast<std::int64_t>(events.size())}});
 }
 

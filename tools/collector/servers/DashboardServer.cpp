@@ -8,10 +8,10 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <cstring>
 #include <utility>
 
 #include "backends/dashboard/DashboardDatagram.h"
+#include "platform/core/Text.h"
 #include "tools/collector/wire/Transport.h"
 
 namespace orvanta::collector {
@@ -57,7 +57,7 @@ Result<std::unique_ptr<DashboardServer>> DashboardServer::start(const std::strin
   if (!foreign) return Failure{foreign.error()};
   ::setsockopt(bound->socket.get(), SOL_SOCKET, SO_RCVBUF, &kReceiveBufferBytes, sizeof kReceiveBufferBytes);
   UniqueFd wakeUp(::eventfd(0, EFD_CLOEXEC));
-  if (!wakeUp) return Failure{fmt::format("cannot make an event descriptor: {}", std::strerror(errno))};
+  if (!wakeUp) return Failure{fmt::format("cannot make an event descriptor: {}", platform::errnoText(errno))};
   return std::unique_ptr<DashboardServer>(
       new DashboardServer(std::move(bound->socket), bound->port, std::move(foreign->socket), std::move(wakeUp), inbox));
 }

@@ -9,9 +9,9 @@
 #include <array>
 #include <cerrno>
 #include <csignal>
-#include <cstring>
 #include <utility>
 
+#include "platform/core/Text.h"
 #include "tools/collector/wire/Transport.h"
 
 namespace orvanta::collector {
@@ -34,7 +34,7 @@ Result<std::unique_ptr<Relay>> Relay::listen(const std::string& address, std::ui
   auto bound = bindSocket(SOCK_STREAM, address, port);
   if (!bound) return Failure{bound.error()};
   if (::listen(bound->socket.get(), SOMAXCONN) != 0) {
-    return Failure{fmt::format("cannot listen on port {}: {}", bound->port, std::strerror(errno))};
+    return Failure{fmt::format("cannot listen on port {}: {}", bound->port, platform::errnoText(errno))};
   }
   return std::unique_ptr<Relay>(new Relay(std::move(bound->socket), bound->port, std::move(tls), std::move(context)));
 }

@@ -1,7 +1,6 @@
 #include "tools/collector/servers/RelayConnection.h"
 
 #include <fmt/format.h>
-#include <strings.h>
 
 #include <algorithm>
 #include <array>
@@ -9,6 +8,7 @@
 #include <utility>
 
 #include "platform/codec/Json.h"
+#include "platform/core/Text.h"
 #include "tools/collector/wire/MessageReader.h"
 
 namespace orvanta::collector {
@@ -48,13 +48,13 @@ RequestKind kindOf(std::string_view method, std::string_view path) {
 bool isHopByHop(const std::string& name) {
   constexpr std::array<const char*, 3> kNames{"Connection", "Keep-Alive", "Transfer-Encoding"};
   return std::any_of(kNames.begin(), kNames.end(),
-                     [&](const char* each) { return ::strcasecmp(each, name.c_str()) == 0; });
+                     [&](const char* each) { return platform::equalsIgnoringCase(each, name); });
 }
 
 void decodeBody(ReceivedRequest& request, std::size_t maximumBytes) {
   const std::string* encoding = request.header("Content-Encoding");
-  const bool compressed = encoding != nullptr && (::strcasecmp(encoding->c_str(), "gzip") == 0 ||
-                                                  ::strcasecmp(encoding->c_str(), "deflate") == 0);
+  const bool compressed = encoding != nullptr && (platform::equalsIgnoringCase(*encoding, "gzip") ||
+                                                  platform::equalsIgnoringCase(*encoding, "deflate"));
   if (!compressed) {
     request.body = request.rawBody;
     return;
@@ -72,12 +72,11 @@ void parseEvents(ReceivedRequest& request) {
   if (!request.damage.empty()) return;
   auto parsed = platform::parseJson(request.body);
   if (!parsed) {
-    request.damage = "the body is no JSON: " + parsed.error();
+    request.damage = "the body is not JSON: " + parsed.error();
     return;
   }
   const Dictionary* envelope = parsed->dictionary();
-  const Value* events = envelope != nullptr ? envelope->find("events") : nullptr;
-  if (events == nullptr || events->array() == nullptr) {
+  if (envelope == nullptr || envelope->array("events") == nullptr) {
     request.damage = "the body has no \"events\"";
     return;
   }
@@ -214,7 +213,7 @@ bool RelayConnection::send(const ReceivedRequest& request, const BackendAnswer& 
   bool hasLength = false;
   for (const auto& [name, value] : answer.head.headers) {
     if (isHopByHop(name)) continue;
-    hasLength = hasLength || ::strcasecmp(name.c_str(), "Content-Length") == 0;
+    hasLength = hasLength || platform::equalsIgnoringCase(name, "Content-Length");
     bytes += fmt::format("{}: {}\r\n", name, value);
   }
   if (!hasLength) bytes += fmt::format("Content-Length: {}\r\n", answer.body.size());

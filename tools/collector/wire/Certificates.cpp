@@ -12,10 +12,10 @@
 #include <array>
 #include <cerrno>
 #include <cstdint>
-#include <cstring>
 #include <memory>
 #include <utility>
 
+#include "platform/core/Text.h"
 #include "platform/core/UniqueFd.h"
 #include "platform/core/WholeFile.h"
 
@@ -122,7 +122,7 @@ Result<ServerIdentity> makeAuthority() {
 Result<void> writeText(const std::string& path, const std::string& text, mode_t mode) {
   const platform::UniqueFd file(::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, mode));
   if (!file || ::write(file.get(), text.data(), text.size()) != static_cast<ssize_t>(text.size())) {
-    return Failure{fmt::format("cannot write {}: {}", path, std::strerror(errno))};
+    return Failure{fmt::format("cannot write {}: {}", path, platform::errnoText(errno))};
   }
   return {};
 }

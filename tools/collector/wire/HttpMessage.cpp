@@ -1,20 +1,17 @@
 #include "tools/collector/wire/HttpMessage.h"
 
 #include <fmt/format.h>
-#include <strings.h>
 
 #include <algorithm>
 #include <array>
 #include <charconv>
 #include <ctime>
 
+#include "platform/core/Text.h"
+
 namespace orvanta::collector {
 
 namespace {
-
-bool equalsIgnoringCase(std::string_view a, std::string_view b) {
-  return a.size() == b.size() && ::strncasecmp(a.data(), b.data(), a.size()) == 0;
-}
 
 std::string_view trimmed(std::string_view text) {
   const auto first = text.find_first_not_of(" \t");
@@ -46,36 +43,29 @@ Result<HeaderFields> parseHeaders(std::string_view rest) {
   }
 }
 
-int hexDigit(char c) {
-  if (c >= '0' && c <= '9') return c - '0';
-  if (c >= 'a' && c <= 'f') return c - 'a' + 10;
-  if (c >= 'A' && c <= 'F') return c - 'A' + 10;
-  return -1;
-}
-
 }  // namespace
 
 bool RequestHead::chunked() const {
   const std::string* encoding = findHeader(headers, "Transfer-Encoding");
-  return encoding != nullptr && equalsIgnoringCase(*encoding, "chunked");
+  return encoding != nullptr && platform::equalsIgnoringCase(*encoding, "chunked");
 }
 
 bool RequestHead::expectsContinue() const {
   const std::string* expect = findHeader(headers, "Expect");
-  return expect != nullptr && equalsIgnoringCase(*expect, "100-continue");
+  return expect != nullptr && platform::equalsIgnoringCase(*expect, "100-continue");
 }
 
 bool RequestHead::keepsAlive() const {
   const std::string* connection = findHeader(headers, "Connection");
   if (connection == nullptr) return http11;
-  if (equalsIgnoringCase(*connection, "close")) return false;
-  return http11 || equalsIgnoringCase(*connection, "keep-alive");
+  if (platform::equalsIgnoringCase(*connection, "close")) return false;
+  return http11 || platform::equalsIgnoringCase(*connection, "keep-alive");
 }
 
 Result<std::optional<std::size_t>> RequestHead::contentLength() const {
   std::optional<std::size_t> length;
   for (const auto& [name, value] : headers) {
-    if (!equalsIgnoringCase(name, "Content-Length")) continue;
+    if (!platform::equalsIgnoringCase(name, "Content-Length")) continue;
     std::size_t number = 0;
     const auto [end, error] = std::from_chars(value.data(), value.data() + value.size(), number);
     if (error != std::errc() || end != value.data() + value.size())
@@ -129,22 +119,8 @@ std::optional<std::size_t> parseChunkSize(std::string_view line) {
   return size;
 }
 
-std::string percentDecode(std::string_view text) {
-  std::string decoded;
-  decoded.reserve(text.size());
-  for (std::size_t i = 0; i < text.size(); ++i) {
-    if (text[i] == '%' && i + 2 < text.size() && hexDigit(text[i + 1]) >= 0 && hexDigit(text[i + 2]) >= 0) {
-      decoded.push_back(static_cast<char>(hexDigit(text[i + 1]) * 16 + hexDigit(text[i + 2])));
-      i += 2;
-    } else {
-      decoded.push_back(text[i]);
-    }
-  }
-  return decoded;
-}
-
 std::string pathOfTarget(std::string_view target) {
-  return percentDecode(target.substr(0, target.find('?')));
+  return platform::percentDecode(target.substr(0, target.find('?')));
 }
 
 std::optional<std::string> queryParameter(std::string_view target, std::string_view name) {
@@ -155,8 +131,8 @@ std::optional<std::string> queryParameter(std::string_view target, std::string_v
     const auto end = std::min(rest.find('&'), rest.size());
     const auto pair = rest.substr(0, end);
     const auto equals = std::min(pair.find('='), pair.size());
-    if (percentDecode(pair.substr(0, equals)) == name) {
-      return percentDecode(pair.substr(std::min(equals + 1, pair.size())));
+    if (platform::percentDecode(pair.substr(0, equals)) == name) {
+      return platform::percentDecode(pair.substr(std::min(equals + 1, pair.size())));
     }
     rest.remove_prefix(std::min(end + 1, rest.size()));
   }
@@ -213,7 +189,7 @@ std::optional<std::int64_t> parseHttpDate(const std::string& text) {
 
 const std::string* findHeader(const HeaderFields& headers, std::string_view name) {
   for (const auto& [key, value] : headers) {
-    if (key.size() == name.size() && ::strncasecmp(key.data(), name.data(), key.size()) == 0) return &value;
+    if (platform::equalsIgnoringCase(key, name)) return &value;
   }
   return nullptr;
 }

@@ -45,8 +45,6 @@ Result<ResponseHead> parseResponseHead(std::string_view head);
 // One step of the chunked form: the size line of the next chunk, without its line break.
 std::optional<std::size_t> parseChunkSize(std::string_view line);
 
-// "%41" becomes "A"; what is no escape stays as it is.
-std::string percentDecode(std::string_view text);
 // The path of a request target, percent-decoded.
 std::string pathOfTarget(std::string_view target);
 std::optional<std::string> queryParameter(std::string_view target, std::string_view name);
