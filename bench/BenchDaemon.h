@@ -10,11 +10,11 @@
 
 namespace orvanta::bench {
 
-// A real daemon that logs nothing but warnings, with its storebag's section from a collector. Construction throws when
-// something does not start.
+// A real daemon that logs only warnings, with its storebag's section from a collector. Construction throws if one of
+// the two does not start; destroying it ends both.
 class BenchDaemon {
  public:
-  // Without a section there is no collector, and no session has a backend. `consent`: to diagnostics, by the user.
+  // Without a section there is no collector, and no session has a backend. `consent`: the user allows diagnostics.
   explicit BenchDaemon(Dictionary section = {}, bool consent = true, bool sandbox = true);
   test::DaemonProcess& process() const { return *_process; }
 
@@ -24,7 +24,7 @@ class BenchDaemon {
   std::unique_ptr<test::DaemonProcess> _process;
 };
 
-// A section by which sessions post to `sink` whatever the user's consent, fifty events at a time where they ask for it.
+// A section with which sessions post to `sink` even without the user's consent, in batches of fifty if they ask for it.
 Dictionary batchingSection(const PostSink& sink);
 
 }  // namespace orvanta::bench

@@ -91,13 +91,13 @@ void benchWholePath(const RawLimits& limits) {
     const auto postsBefore = sink.posts();
     const Stretch time(daemon.process().process().pid());
     const std::uint64_t perPost = batched ? 50 : 1;
-    // What waits in a lane is bounded: a client that calls faster than posts are answered would have posts refused.
+    // A lane holds a limited number of posts, and refuses more to a client that calls faster than they are answered.
     for (std::uint64_t sent = 0; sent < events; sent += kChunk) {
       driver.pipeline(burst, kNilAnswer, kChunk, kWindow);
       awaitPosts(sink, postsBefore + (sent < kInFlight ? 0 : (sent - kInFlight) / perPost));
     }
     driver.call(encodeCall("flushMessagesWithCompletion", {}));
-    // Everything has been handed over; what is still to be posted counts as well.
+    // The daemon has taken every event; the posts still to come count as well.
     awaitPosts(sink, postsBefore + events / perPost);
     const auto figure = figureOf(time, events);
     const double raw = batched ? limits.decode + limits.encode + limits.gzip + limits.post / 50

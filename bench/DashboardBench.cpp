@@ -33,8 +33,8 @@ using platform::UniqueFd;
 constexpr double kSeconds = 1.0;
 constexpr std::uint64_t kWindow = 64;
 
-// Appending `line` to the only file of a directory: with the look-up by which a call that remembers nothing finds the
-// file and its age, or without.
+// Appends `line` to the only file of a directory, with or without the look-up by which a call that remembers nothing
+// finds the file and its age.
 double rawAppend(const test::TemporaryDirectory& directory, const std::string& line, bool lookUp) {
   const std::string file = directory.write("log/orvantad_1_messageLog.diag", "");
   const std::string parent = directory / "log";
@@ -64,7 +64,7 @@ double rawSend(const DatagramSink& sink, const std::vector<std::uint8_t>& datagr
   if (::connect(socket.get(), reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) {
     throw std::runtime_error("connect");
   }
-  // In bursts, as they leave the daemon: a receiver that has fallen asleep has to be woken.
+  // In bursts, as the daemon sends them: each time the receiver has to be woken.
   const auto figure = measure(kSeconds, [&] {
     std::uint64_t sent = 0;
     for (std::uint64_t i = 0; i < kWindow; ++i) {
@@ -98,7 +98,7 @@ std::vector<std::uint8_t> sampleDatagram() {
   return encodeDashboardDatagram(sender, {payload, {1'700'000'000, 0}, 5, 6, EventFlag::none, 1});
 }
 
-// Until no more arrive; what was lost on the way is not waited for.
+// Waits until no more arrive, since some may be lost on the way.
 std::uint64_t settledCount(const DatagramSink& sink, std::uint64_t expected) {
   for (std::uint64_t count = 0;;) {
     const auto now = sink.datagrams();
@@ -133,7 +133,7 @@ void benchDashboard() {
   const double datagram = rawSend(sink, sampleDatagram());
   std::this_thread::sleep_for(std::chrono::milliseconds(200));
 
-  // The raw system calls pass no sandbox; what it adds to the daemon's shows between the two.
+  // The raw system calls pass no sandbox: the difference between the two is what it adds.
   for (const bool sandbox : {false, true}) {
     const BenchDaemon daemon({{"dashboard", Dictionary{{"ip", "127.0.0.1"}, {"port", sink.port()}}}}, true, sandbox);
     CallDriver driver(daemon.process().socketPath());

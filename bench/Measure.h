@@ -9,7 +9,7 @@
 
 namespace orvanta::bench {
 
-// CPU time that a process has used so far, all its threads together, in microseconds; the calling process for pid 0.
+// The CPU time that all threads of a process have used so far, in microseconds. Pid 0 is the calling process.
 double cpuMicroseconds(pid_t pid = 0);
 
 // Wall and CPU time of a stretch of work, of this process or another one.
@@ -27,7 +27,7 @@ class Stretch {
   const std::chrono::steady_clock::time_point _begun;
 };
 
-// What one measurement gave, per event.
+// The result of one measurement, per event.
 struct Figure {
   double perSecond = 0;
   double cpuPerEvent = 0;  // microseconds
@@ -37,12 +37,12 @@ Figure figureOf(const Stretch& stretch, std::uint64_t events);
 double median(std::vector<double> values);
 double percentile(std::vector<double> values, double share);
 
-// One line of the table: the figure, the raw limit measured in the same run, their ratio and the goal.
+// The lines of the table: a figure, or its ratio to the raw limit measured in the same run, with the goal.
 void printHeading(const std::string& title);
 void printFigure(const std::string& name, const Figure& figure);
 void printRatio(const std::string& name, double value, double rawLimit, double goal);
 
-// Runs `once` until at least `seconds` have passed; how often it ran is in the result's events.
+// Runs `once`, which returns how many events it made, until at least `seconds` have passed.
 template <class Once>
 Figure measure(double seconds, Once once) {
   const Stretch stretch;

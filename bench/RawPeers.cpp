@@ -40,13 +40,13 @@ namespace {
   }
 }
 
-// What has arrived of the request that a connection is in the middle of.
+// The part of an unfinished request that has arrived on a connection.
 struct HalfRequest {
   std::string head;
   std::size_t bodyLeft = 0;
 };
 
-// Takes bytes in; how many requests they completed.
+// Returns how many requests the bytes completed.
 int completed(HalfRequest& half, const char* bytes, std::size_t length) {
   int requests = 0;
   while (length > 0) {
@@ -115,7 +115,7 @@ int completed(HalfRequest& half, const char* bytes, std::size_t length) {
   }
 }
 
-// In memory that a forked process shares.
+// A counter in memory that is shared with a forked process.
 volatile std::uint64_t* sharedCounter() {
   void* const memory =
       ::mmap(nullptr, sizeof(std::uint64_t), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
@@ -123,7 +123,7 @@ volatile std::uint64_t* sharedCounter() {
   return static_cast<volatile std::uint64_t*>(memory);
 }
 
-// On any port of the loopback address.
+// Binds to any free port of the loopback address.
 int boundSocket(int type, std::uint16_t& port) {
   const int socket = ::socket(AF_INET, type | SOCK_CLOEXEC, 0);
   sockaddr_in address{};

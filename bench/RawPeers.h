@@ -7,7 +7,8 @@
 
 namespace orvanta::bench {
 
-// The least that a server can do, each in a process of its own so that its CPU time is its own. Ended with the object.
+// A server that does the least it can, in a process of its own so that its CPU time counts for neither side. Destroying
+// the object ends the process.
 class RawPeer {
  public:
   RawPeer(const RawPeer&) = delete;
@@ -20,14 +21,14 @@ class RawPeer {
   pid_t _pid = -1;
 };
 
-// Answers every `requestSize` bytes on a Unix stream socket with `answerSize` bytes: what a call would cost if there
-// were nothing to do.
+// Answers every `requestSize` bytes on a Unix stream socket with `answerSize` bytes: what a call costs that does
+// nothing.
 class EchoServer : public RawPeer {
  public:
   EchoServer(const std::string& socketPath, std::size_t requestSize, std::size_t answerSize);
 };
 
-// Takes HTTP posts on any number of kept-alive connections and answers each with an empty 200.
+// Receives HTTP posts on any number of kept-alive connections and answers each with an empty 200.
 class PostSink : public RawPeer {
  public:
   PostSink();
@@ -41,12 +42,12 @@ class PostSink : public RawPeer {
   volatile std::uint64_t* _posts = nullptr;  // shared with the process
 };
 
-// Takes UDP datagrams as they come, as fast as its processor lets it.
+// Receives UDP datagrams as fast as its processor lets it.
 class DatagramSink : public RawPeer {
  public:
   DatagramSink();
   std::uint16_t port() const { return _port; }
-  // Datagrams received so far; what finds no room in the socket is lost.
+  // Datagrams received so far. Those that find the socket full are lost.
   std::uint64_t datagrams() const;
 
  private:

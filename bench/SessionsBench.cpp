@@ -23,7 +23,7 @@ namespace {
 
 constexpr std::uint64_t kWindow = 64;
 
-// Confines every thread of the process, and with them those that they will start, to its first `cores` processors.
+// Confines the threads of the process, and with them those that they will start, to its first `cores` processors.
 void confine(pid_t pid, unsigned cores) {
   cpu_set_t allowed, set;
   CPU_ZERO(&allowed);
@@ -42,7 +42,7 @@ void confine(pid_t pid, unsigned cores) {
   }
 }
 
-// All sessions send at once, one burst on its way and one behind it each; until the last post has been made.
+// All sessions send at once, each with one burst under way and one behind it, until the last post has been made.
 Figure sendAtOnce(const BenchDaemon& daemon, const PostSink& sink, std::size_t sessions, std::uint64_t eventsEach) {
   std::vector<std::unique_ptr<CallDriver>> drivers;
   for (std::size_t i = 0; i < sessions; ++i) {
@@ -62,14 +62,14 @@ Figure sendAtOnce(const BenchDaemon& daemon, const PostSink& sink, std::size_t s
   }
   for (const auto& driver : drivers) driver->receive(kNilAnswer * kWindow);
   for (const auto& driver : drivers) driver->call(encodeCall("flushMessagesWithCompletion", {}));
-  // Asleep in between: the processors are the daemon's.
+  // Sleeps in between, to leave the processors to the daemon.
   const auto waitFor = [&sink](std::uint64_t expected) {
     while (sink.posts() < expected) std::this_thread::sleep_for(std::chrono::microseconds(200));
   };
   waitFor(posts);
   const Figure figure = figureOf(time, events);
   drivers.clear();
-  waitFor(posts + sessions);  // the last record of each is no part of what is measured next
+  waitFor(posts + sessions);  // each session's last record must not count in the next measurement
   return figure;
 }
 
@@ -99,7 +99,7 @@ void benchScaling() {
              std::thread::hardware_concurrency());
 }
 
-// What joining, asking and leaving cost in a group of that size, in microseconds.
+// The cost of joining, querying and leaving a group of that size, in microseconds.
 struct GroupCost {
   double join = 0;
   double ask = 0;
@@ -123,7 +123,7 @@ GroupCost costInGroupOf(std::size_t size) {
     sessions.push_back(OrvantadSession::create(device, agent, nullptr));
     configure(*sessions.back(), i);
   }
-  // Again and again: a session that is configured again leaves its place and takes the last one.
+  // A session that is configured again leaves its place and takes the last one.
   GroupCost cost;
   std::size_t next = 0;
   cost.join = measure(0.5, [&] {

@@ -32,13 +32,13 @@ namespace {
 constexpr double kSeconds = 1.0;
 constexpr std::size_t kBatch = 50;
 
-// Keeps a result alive for the compiler.
+// Keeps the compiler from removing a result.
 void consume(std::size_t value) {
   static std::atomic<std::size_t> sink{0};
   sink.store(value, std::memory_order_relaxed);
 }
 
-// The fields of `record` straight into JSON: what any encoder has to do at least.
+// Writes the fields of `record` straight into JSON: the least that any encoder has to do.
 void appendFlat(std::string& out, const Dictionary& record) {
   out += '{';
   for (const auto& [key, value] : record) {
@@ -69,8 +69,8 @@ double benchDecode() {
   return figure.cpuPerEvent;
 }
 
-// Bodies as different from each other as those of one session are: compressing the same one over and over would be
-// quicker than what the daemon has to do.
+// Bodies differ from each other as those of one session do: compressing the same one over and over would be quicker
+// than the daemon's work.
 constexpr std::size_t kBodies = 40;
 
 struct Encoded {
@@ -135,7 +135,7 @@ Encoded benchEncode(test::TestPlatform& device) {
   return encoded;
 }
 
-// One kept stream: nothing is set up for a body.
+// Keeps one stream, so that no body pays for its set-up.
 double rawGzip(const std::vector<std::string>& bodies) {
   z_stream stream{};
   if (::deflateInit2(&stream, -1, Z_DEFLATED, 31, 8, Z_DEFAULT_STRATEGY) != Z_OK) throw std::runtime_error("zlib");
@@ -168,7 +168,7 @@ double benchGzip(const std::vector<std::string>& bodies, const char* name) {
   return raw;
 }
 
-// The same over one kept-alive connection with nothing but the transport's library, one after the other.
+// Posts over one kept-alive connection with nothing but the HTTP library, one after the other.
 double libraryPost(const PostSink& sink, const std::string& body) {
   CURL* const easy = curl_easy_init();
   const std::string url = sink.url();
@@ -184,7 +184,7 @@ double libraryPost(const PostSink& sink, const std::string& body) {
   return figure.cpuPerEvent;
 }
 
-// A post over one kept-alive connection with nothing but the socket.
+// Posts over one kept-alive connection with nothing but the socket.
 double rawPost(const PostSink& sink, const std::string& body) {
   const int fd = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
   sockaddr_in address{};
@@ -206,7 +206,7 @@ double rawPost(const PostSink& sink, const std::string& body) {
   return figure.cpuPerEvent;
 }
 
-// Where the sink's process happens to run matters more than anything else here.
+// Several runs, since the processor that the sink happens to run on matters more than anything else here.
 double medianOf(double (*post)(const PostSink&, const std::string&), const PostSink& sink, const std::string& body) {
   std::vector<double> figures;
   for (int i = 0; i < 5; ++i) figures.push_back(post(sink, body));

@@ -4,8 +4,8 @@
 
 namespace orvanta::bench {
 
-// CPU microseconds per event of the least that each stage can do, measured in this run; the whole path is held against
-// their sum.
+// The least that each stage can cost, in CPU microseconds per event, measured in this run. The whole path is compared
+// with their sum.
 struct RawLimits {
   double decode = 0;
   double encode = 0;
@@ -14,14 +14,14 @@ struct RawLimits {
   double post = 0;        // one post
 };
 
-// Each prints its lines.
+// Each runs its measurements and prints their lines.
 RawLimits benchStages();
 void benchCallPath();
 void benchDashboard();
 void benchWholePath(const RawLimits& limits);
-// How events per second grow with processors, and what a large group of related sessions costs each of them.
+// How events per second grow with processors, and how the cost of a session grows with its group.
 void benchSessions();
-// CPU microseconds of the system calls that a message-log line takes at least: listing, statx, open, write, close.
+// Returns the CPU microseconds of the system calls that a message-log line needs: listing, statx, open, write, close.
 double benchMessageLog();
 
 }  // namespace orvanta::bench

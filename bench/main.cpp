@@ -7,8 +7,7 @@
 #include "bench/Stages.h"
 
 // Prints, for each stage of an event's way and for the whole, events per second, CPU microseconds per event and the
-// ratio to the raw limit measured in the same run. Absolute values belong to the machine; the ratios are what is to be
-// kept.
+// ratio to the raw limit measured in the same run. Absolute values depend on the machine; the ratios must not grow.
 int main(int argumentCount, char** arguments) {
   using namespace orvanta::bench;
   const std::string_view only = argumentCount > 1 ? arguments[1] : "";

@@ -11,7 +11,7 @@ const std::string kPost = R"({"events":[{"n":1}]})";
 
 class CollectorFaultsTest : public CollectorFixture {
  protected:
-  // One POST of events: all bytes until the collector closes, or what kept them from coming.
+  // Posts events and returns all bytes until the collector closes, with "[reset]" if it resets the connection.
   std::string rawAnswer(const std::string& path) const {
     return converse("POST " + path + " HTTP/1.1\r\nConnection: close\r\nContent-Length: " +
                     std::to_string(kPost.size()) + "\r\n\r\n" + kPost);

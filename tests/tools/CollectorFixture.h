@@ -43,7 +43,7 @@ class CollectorFixture : public testing::Test {
   httplib::Result post(const std::string& path, const std::string& body) const {
     return http().Post(path, body, "application/json");
   }
-  // Sends bytes as they are, over a fresh connection, and reads until the collector closes.
+  // Sends bytes as they are, over a fresh connection, and reads until the collector closes or resets it.
   std::string converse(const std::string& bytes, bool finishes = false) const {
     const auto stream = Transport::connectLoopback(collector->httpPort());
     EXPECT_TRUE(stream->write(bytes));
@@ -61,7 +61,7 @@ class CollectorFixture : public testing::Test {
     EXPECT_TRUE(parsed) << parsed.error();
     return parsed ? std::move(parsed.value()) : Value();
   }
-  // The entry of a dictionary, which must be there.
+  // The entry of a dictionary; throws if it is absent.
   static const Value& at(const Value& value, const std::string& key) {
     const Value* found = value.dictionary() != nullptr ? value.dictionary()->find(key) : nullptr;
     if (found == nullptr) throw std::out_of_range("no \"" + key + "\" in " + value.description());

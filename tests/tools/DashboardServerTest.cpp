@@ -12,7 +12,7 @@
 namespace orvanta::collector {
 namespace {
 
-// A daemon's side: an unconnected socket, so that forged acknowledgements from elsewhere show too.
+// A daemon's side: an unconnected socket, so that it receives acknowledgements forged from another port too.
 class DashboardServerTest : public CollectorFixture {
  protected:
   static std::string datagram(std::uint16_t eventNumber, bool reliable = true) {
@@ -29,7 +29,7 @@ class DashboardServerTest : public CollectorFixture {
     to.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
     _socket.sendTo(to, test::bytesOf(bytes));
   }
-  // The next acknowledgement; empty when none comes.
+  // The next acknowledgement; empty if the time is over first.
   std::string receive() {
     const auto datagram = _socket.receive();
     return datagram ? std::string(datagram->begin(), datagram->end()) : "";
@@ -45,7 +45,7 @@ class DashboardServerTest : public CollectorFixture {
 TEST_F(DashboardServerTest, AcknowledgesOnlyWhatAsksForIt) {
   send(datagram(1, false));
   send("short");
-  send(datagram(2).substr(0, 64));  // tells a longer length
+  send(datagram(2).substr(0, 64));  // its header says that it is longer
   send(datagram(3));
   EXPECT_EQ(receive(), datagram(3).substr(0, 64));
   EXPECT_FALSE(waits());

@@ -2,8 +2,8 @@
 #include <memory>
 #include <thread>
 
-// Does what the build's sanitizer is there to find: a test expects its report, so that a build in which the sanitizer
-// has gone missing is noticed.
+// Commits the fault that the build's sanitizer finds. A test expects the report, and so fails in a build
+// that lacks its sanitizer.
 
 namespace {
 

@@ -87,7 +87,7 @@ TEST(OrvantactlProgramTest, TellsByItsStatusWhatWentWrong) {
   std::filesystem::create_directories(directory / "unreadable/com.kovalt.orvanta.plist");
   std::filesystem::create_directory(directory / "empty");
   const struct {
-    const char* command;  // behind the program's name; $1 is the directory
+    const char* command;  // follows the program's name; $1 is the directory
     int status;
     const char* errors;
   } rows[] = {
@@ -125,7 +125,7 @@ TEST(StorebagFileTest, RefusesDamagedDocuments) {
 TEST(CollectorProgramTest, TellsItsPlacesAndEndsOnSigterm) {
   const TemporaryDirectory directory;
   ChildProcess::Options options;
-  // Its line on standard output is read while it runs.
+  // Standard output goes to standard error, which can be read while it runs.
   options.program = "/bin/sh";
   options.arguments = {"-c", "exec \"$0\" --directory \"$1\" --any-ports 1>&2",
                        DaemonProcess::programPath("orvanta-collector"), directory / "data"};

@@ -16,7 +16,7 @@ class StorebagServerTest : public CollectorFixture {
   httplib::Result get(const std::string& name, httplib::Headers headers = {}) const {
     return http().Get("/storebags/" + name + "?version=8.0", headers);
   }
-  // The inner bag of a document, whose signature must be right by the daemon's own check under that key file.
+  // Returns the inner bag of a document and expects its signature to pass the daemon's own check with that key file.
   static Value verified(const std::string& document, const std::string& keyFile) {
     const auto content = openStorebag(test::bytesOf(document));
     EXPECT_TRUE(content) << content.error();
@@ -60,7 +60,7 @@ TEST_F(StorebagServerTest, AnswersNotModifiedByTheFilesTime) {
   EXPECT_EQ(unchanged->get_header_value("Cache-Control"), "max-age=60") << "what daemons then go by";
   EXPECT_EQ(since("Tue, 14 Nov 2023 22:13:19 GMT")->status, 200);
   EXPECT_EQ(since("yesterday")->status, 200);
-  // Changed twice within the second that HTTP can tell apart.
+  // Changed twice within one second, the unit of dates in HTTP.
   setFileTime(file, 1'700'000'100);
   const auto second = get("x")->get_header_value("Last-Modified");
   std::filesystem::last_write_time(file, std::filesystem::last_write_time(file) + std::chrono::milliseconds(1));

@@ -21,7 +21,7 @@ class WholeCollector final : public Collector {
   explicit WholeCollector(CollectorOptions options) : _options(std::move(options)) {}
   ~WholeCollector() override { WholeCollector::stop(); }
 
-  // A failure says what could not be made.
+  // A failure says which part could not be made.
   Result<void> open();
   void stop() override;
 
@@ -98,7 +98,7 @@ Result<void> WholeCollector::openServers() {
   auto http = Relay::listen(_options.address, _options.httpPort, nullptr, context);
   if (!http) return Failure{http.error()};
   _http = std::move(http.value());
-  // What answers need to know is known before the first is given.
+  // The first answer may need the placeholders: they are set before the relays begin.
   _storebags->setPlaceholders({httpURL(), httpsURL(), _dashboard->port()});
   _http->begin();
   _https->begin();

@@ -19,7 +19,7 @@
 namespace orvanta::collector {
 
 struct CollectorOptions {
-  // Holds keys, certificates, bags and the database; made when it does not exist.
+  // Holds keys, certificates, bags and the database; created if missing.
   std::string directory;
   std::string address = "127.0.0.1";
   // 0 takes any free port.
@@ -34,18 +34,18 @@ struct CollectorOptions {
   std::function<void(const ReceivedRequest&)> observer;
 };
 
-// Everything outside a daemon on one machine: storebag server, event server (http and https), upload and log-data
-// server, dashboard server; whatever comes in is recorded. Runs on threads of its own from start() until stop() or
-// destruction. Thread-safe.
+// Every server that a daemon talks to, on one machine: storebag server, event server (http and https), upload and
+// log-data server, dashboard server. Records all that comes in. Owned by its program or test; runs on threads of its
+// own from start() until stop() or destruction. Thread-safe.
 class Collector {
  public:
-  // Listens when it returns. A failure says what could not be made or bound.
+  // The collector listens when this returns. A failure says which file or port could not be used.
   static Result<std::unique_ptr<Collector>> start(CollectorOptions options);
   virtual ~Collector() = default;
-  // Ends all connections and answers nothing any more; what was received can still be read.
+  // Ends all connections and answers nothing more. The records can still be read.
   virtual void stop() = 0;
 
-  // --- Where everything is ---
+  // --- Files and addresses ---
 
   virtual const std::string& directory() const = 0;
   virtual std::string databaseFile() const = 0;
@@ -63,28 +63,28 @@ class Collector {
 
   // --- How it answers ---
 
-  // Requests to the path (see Behaviours) are treated so from the next one on.
+  // Applies to requests to the path (see Behaviours) from the next one on.
   virtual void setBehaviour(const std::string& path, PathBehaviour behaviour) = 0;
   void setStatus(const std::string& path, int status);
   void setStatus(const std::string& path, int status, std::size_t times);
   void setFault(const std::string& path, ConnectionFault fault);
   virtual void clearBehaviours() = 0;
   virtual void setAcknowledgements(const AcknowledgementSettings& settings) = 0;
-  // Serves this inner bag from now on: for one storebag name, or for all without one of their own. Texts may hold the
-  // placeholders "${http}", "${https}" and "${dashboard_port}".
+  // Serves this inner bag from now on: for one storebag name, or for all that have none of their own. Strings may hold
+  // the placeholders "${http}", "${https}" and "${dashboard_port}".
   virtual void setBag(const std::string& name, Value inner) = 0;
   void setBag(Value inner) { setBag("", std::move(inner)); }
-  // A bag whose section of every environment is this one.
+  // Serves a bag with this section for every environment.
   void setSection(Dictionary section);
 
-  // --- What it has received ---
+  // --- The records ---
 
   virtual Inbox& inbox() = 0;
   std::vector<ReceivedRequest> requests(const InboxQuery& query = {}) { return inbox().requests(query); }
   std::vector<ReceivedRequest> requests(RequestKind kind);
   std::vector<ReceivedEvent> events(const InboxQuery& query = {}) { return inbox().events(query); }
   std::vector<ReceivedDatagram> datagrams(const InboxQuery& query = {}) { return inbox().datagrams(query); }
-  // Each waits until at least so many have come since the last clear() (or were there before).
+  // Each waits until `count` records exist; returns false if the time is over first. Counting restarts with clear().
   bool waitForRequests(std::size_t count, std::chrono::milliseconds limit);
   bool waitForRequests(RequestKind kind, std::size_t count, std::chrono::milliseconds limit);
   bool waitForEvents(std::size_t count, std::chrono::milliseconds limit);

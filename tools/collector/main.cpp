@@ -14,7 +14,7 @@
 #include "platform/host/Process.h"
 #include "tools/collector/Collector.h"
 
-// Runs a collector until SIGTERM or SIGINT. Prints one line of JSON when it listens.
+// Runs a collector until SIGTERM or SIGINT. Prints one line of JSON as soon as it listens.
 
 namespace {
 
@@ -27,12 +27,12 @@ std::string defaultDirectory() {
   return std::string(home != nullptr ? home : ".") + "/.local/state/orvanta-collector";
 }
 
-// Without exceptions: that standard error takes no more is no reason to stop receiving.
+// Does not throw: the collector goes on receiving when standard error is closed or full.
 void tell(const std::string& line) {
   std::fputs((line + "\n").c_str(), stderr);
 }
 
-// The exit status.
+// Returns the exit status.
 int fail(const std::string& text) {
   tell("orvanta-collector: " + text);
   return 1;
@@ -79,17 +79,27 @@ int main(int argc, char** argv) {
   std::string bag = "xml";
   std::optional<std::int64_t> maxAge;
 
-  CLI::App app("Plays the servers that an orvanta daemon talks to, and records what comes in", "orvanta-collector");
-  app.add_option("-d,--directory", options.directory, "keys, certificates, bags, database")->capture_default_str();
+  CLI::App app(
+      "Plays every server that orvantad talks to, on this machine, and records what they receive.\n"
+      "Prints its addresses and files as a line of JSON, then a line per request on standard error.",
+      "orvanta-collector");
+  app.footer("How to read its records and to inject faults: man orvanta-collector, docs/collector.md");
+  app.add_option("-d,--directory", options.directory,
+                 "for keys, certificates, storebags and records; created if missing")
+      ->capture_default_str();
   app.add_option("--address", options.address, "IPv4 address to listen on")->capture_default_str();
-  app.add_option("--http-port", options.httpPort, "0: any free one")->capture_default_str();
-  app.add_option("--https-port", options.httpsPort, "0: any free one")->capture_default_str();
-  app.add_option("--dashboard-port", options.dashboardPort, "UDP; 0: any free one")->capture_default_str();
-  app.add_flag("--any-ports", anyPorts, "take free ports for all three");
-  app.add_option("--max-age", maxAge, "seconds for which daemons keep a storebag; default: its refresh_cycle");
-  app.add_option("--container", container, "form of the signed document")->check(CLI::IsMember({"xml", "binary"}));
-  app.add_option("--bag", bag, "form of the bag inside")->check(CLI::IsMember({"xml", "binary"}));
-  app.add_flag("-q,--quiet", quiet, "no line per request on standard error");
+  app.add_option("--http-port", options.httpPort, "TCP; 0 takes any free port")->capture_default_str();
+  app.add_option("--https-port", options.httpsPort, "TCP; 0 takes any free port")->capture_default_str();
+  app.add_option("--dashboard-port", options.dashboardPort, "UDP; 0 takes any free port")->capture_default_str();
+  app.add_flag("--any-ports", anyPorts, "take three free ports");
+  app.add_option("--max-age", maxAge, "seconds for which daemons keep a storebag (default: the bag's refresh_cycle)");
+  app.add_option("--container", container, "form of the signed document")
+      ->capture_default_str()
+      ->check(CLI::IsMember({"xml", "binary"}));
+  app.add_option("--bag", bag, "form of the bag inside it")
+      ->capture_default_str()
+      ->check(CLI::IsMember({"xml", "binary"}));
+  app.add_flag("-q,--quiet", quiet, "do not print a line per request");
   CLI11_PARSE(app, argc, argv);
   if (anyPorts) options.httpPort = options.httpsPort = options.dashboardPort = 0;
   options.storebag.maxAgeOfBag = !maxAge;
@@ -98,7 +108,7 @@ int main(int argc, char** argv) {
   options.storebag.bag = *propertyListFormFromText(bag);
   if (!quiet) options.observer = printRequest;
 
-  // Blocked before any thread exists, so that only the wait below takes them.
+  // Blocked before any thread exists, so that only sigwait() below receives them.
   sigset_t signals;
   sigemptyset(&signals);
   sigaddset(&signals, SIGTERM);

@@ -30,7 +30,7 @@ using ContextPointer = std::unique_ptr<EVP_PKEY_CTX, decltype(&EVP_PKEY_CTX_free
 using BioPointer = std::unique_ptr<BIO, decltype(&BIO_free)>;
 using FilePointer = std::unique_ptr<std::FILE, decltype(&std::fclose)>;
 
-// What stands before the 20 digest bytes in the signed block: the DER of DigestInfo for SHA-1.
+// The DER of DigestInfo for SHA-1, which precedes the 20 digest bytes in the signed block.
 constexpr std::array<std::uint8_t, 15> kSha1DigestInfo{0x30, 0x21, 0x30, 0x09, 0x06, 0x05, 0x2b, 0x0e,
                                                        0x03, 0x02, 0x1a, 0x05, 0x00, 0x04, 0x14};
 
@@ -69,7 +69,7 @@ class OpenSslSigningKey final : public SigningKey {
     std::array<std::uint8_t, kSha1DigestInfo.size() + digest.size()> block{};
     std::copy(kSha1DigestInfo.begin(), kSha1DigestInfo.end(), block.begin());
     std::copy(digest.begin(), digest.end(), block.begin() + kSha1DigestInfo.size());
-    // Without a digest set the block is padded and signed as it is, which no digest policy looks at.
+    // Without a digest set the block is padded and signed as it is, which no digest policy forbids.
     const ContextPointer context(EVP_PKEY_CTX_new(_key.get(), nullptr), &EVP_PKEY_CTX_free);
     std::size_t size = 0;
     if (!context || EVP_PKEY_sign_init(context.get()) != 1 ||
@@ -103,8 +103,8 @@ Result<std::shared_ptr<const SigningKey>> SigningKey::read(const std::string& pa
   const BioPointer source(BIO_new_mem_buf(pem->data(), static_cast<int>(pem->size())), &BIO_free);
   // The empty pass phrase keeps OpenSSL from asking for one on the terminal.
   KeyPointer key(PEM_read_bio_PrivateKey(source.get(), nullptr, nullptr, const_cast<char*>("")), &EVP_PKEY_free);
-  if (!key) return Failure{fmt::format("{} is no private key in PEM form: {}", path, lastOpenSslError())};
-  if (EVP_PKEY_get_base_id(key.get()) != EVP_PKEY_RSA) return Failure{path + " is no RSA key"};
+  if (!key) return Failure{fmt::format("{} holds no private key in PEM form: {}", path, lastOpenSslError())};
+  if (EVP_PKEY_get_base_id(key.get()) != EVP_PKEY_RSA) return Failure{path + " is not an RSA key"};
   return std::shared_ptr<const SigningKey>(std::make_shared<OpenSslSigningKey>(std::move(key)));
 }
 

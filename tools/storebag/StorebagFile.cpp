@@ -59,15 +59,15 @@ Result<std::vector<std::uint8_t>> makeStorebag(const Value& inner, const Signing
 
 Result<StorebagContent> openStorebag(std::span<const std::uint8_t> document) {
   const auto parsed = platform::parsePropertyList(document);
-  if (!parsed) return Failure{"the document is no property list: " + parsed.error()};
+  if (!parsed) return Failure{"the document holds no property list: " + parsed.error()};
   const Dictionary* fields = parsed.value().dictionary();
-  if (fields == nullptr) return Failure{"the document is no dictionary"};
+  if (fields == nullptr) return Failure{"the document is not a dictionary"};
   auto signature = decodedField(*fields, "signature");
   if (!signature) return Failure{signature.error()};
   auto bag = decodedField(*fields, "bag");
   if (!bag) return Failure{bag.error()};
   auto inner = platform::parsePropertyList(bag.value());
-  if (!inner) return Failure{"the bag inside is no property list: " + inner.error()};
+  if (!inner) return Failure{"the bag inside is not a property list: " + inner.error()};
   return StorebagContent{std::move(bag.value()), std::move(signature.value()), std::move(inner.value())};
 }
 

@@ -14,13 +14,13 @@ namespace orvanta {
 
 enum class PropertyListForm { xml, binary };
 
-// "xml" or "binary"; none for anything else.
+// "xml" or "binary"; returns nullopt for anything else.
 std::optional<PropertyListForm> propertyListFormFromText(std::string_view text);
 std::string_view propertyListFormText(PropertyListForm form);
 
 Result<std::vector<std::uint8_t>> writePropertyList(const Value& value, PropertyListForm form);
 
-// What a storebag document holds once it is taken apart, whether or not its signature is right.
+// The parts of a storebag document, whether or not its signature is right.
 struct StorebagContent {
   std::vector<std::uint8_t> bag;
   std::vector<std::uint8_t> signature;
@@ -32,8 +32,8 @@ Result<std::vector<std::uint8_t>> makeStorebag(const Value& inner, const Signing
                                                PropertyListForm bag);
 Result<StorebagContent> openStorebag(std::span<const std::uint8_t> document);
 
-// An inner bag as its author keeps it: JSON, or a property list of either form, told apart by the first bytes. The
-// failure says what and where.
+// Reads an inner bag as its author keeps it: JSON or a property list of either form, told apart by the first bytes. The
+// failure says what is wrong and where.
 Result<Value> parseBagSource(std::span<const std::uint8_t> bytes);
 Result<Value> readBagSource(const std::string& path);
 

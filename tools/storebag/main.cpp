@@ -88,7 +88,9 @@ Result<void> show(const std::string& path, bool xml) {
 
 int main(int argc, char** argv) {
   platform::secureStandardDescriptors();
-  CLI::App app("Makes, checks and prints signed storebags", "orvanta-storebag");
+  CLI::App app("Signs storebags, checks their signatures and prints the bags inside, without a server.",
+               "orvanta-storebag");
+  app.footer("More: man orvanta-storebag; the keys of a bag: docs/storebag.md");
   app.require_subcommand(1);
   std::string input;
   std::string output = "-";
@@ -99,26 +101,31 @@ int main(int argc, char** argv) {
   bool xml = false;
 
   CLI::App* keyCommand =
-      app.add_subcommand("make-key", "Make a signing key (unless it exists) and its public key file");
-  keyCommand->add_option("KEY", key, "private key, PEM")->required();
-  keyCommand->add_option("-o,--output", output, "where publicKey.der goes (- for standard output)")->required();
-  keyCommand->add_option("--layout", layout, "layout of publicKey.der")->check(CLI::IsMember({"spki", "pkcs1"}));
+      app.add_subcommand("make-key", "Make a signing key, unless it exists, and write its public key");
+  keyCommand->add_option("KEY", key, "private key file (PEM)")->required();
+  keyCommand->add_option("-o,--output", output, "publicKey.der to write (- for standard output)")->required();
+  keyCommand->add_option("--layout", layout, "layout of publicKey.der")
+      ->capture_default_str()
+      ->check(CLI::IsMember({"spki", "pkcs1"}));
 
-  CLI::App* signCommand = app.add_subcommand("sign", "Sign a bag (JSON or property list)");
-  signCommand->add_option("BAG", input, "the inner bag")->required();
-  signCommand->add_option("-k,--key", key, "private key, PEM")->required();
-  signCommand->add_option("-o,--output", output, "where the storebag goes (default standard output)");
-  signCommand->add_option("--container", container, "form of the outer document")
+  CLI::App* signCommand = app.add_subcommand("sign", "Make a storebag from a bag");
+  signCommand->add_option("BAG", input, "the bag, as JSON or a property list")->required();
+  signCommand->add_option("-k,--key", key, "private key file (PEM)")->required();
+  signCommand->add_option("-o,--output", output, "storebag to write (default: standard output)");
+  signCommand->add_option("--container", container, "form of the signed document")
+      ->capture_default_str()
       ->check(CLI::IsMember({"xml", "binary"}));
-  signCommand->add_option("--bag", bagForm, "form of the bag inside")->check(CLI::IsMember({"xml", "binary"}));
+  signCommand->add_option("--bag", bagForm, "form of the bag inside it")
+      ->capture_default_str()
+      ->check(CLI::IsMember({"xml", "binary"}));
 
   CLI::App* verifyCommand = app.add_subcommand("verify", "Check a storebag's signature");
-  verifyCommand->add_option("STOREBAG", input)->required();
-  verifyCommand->add_option("-k,--public-key", key, "publicKey.der")->required();
+  verifyCommand->add_option("STOREBAG", input, "the signed document")->required();
+  verifyCommand->add_option("-k,--public-key", key, "public key file (DER), such as publicKey.der")->required();
 
-  CLI::App* showCommand = app.add_subcommand("show", "Print the bag inside (the signature is not looked at)");
-  showCommand->add_option("STOREBAG", input)->required();
-  showCommand->add_flag("--xml", xml, "as an XML property list instead of JSON");
+  CLI::App* showCommand = app.add_subcommand("show", "Print the bag inside, without checking the signature");
+  showCommand->add_option("STOREBAG", input, "the signed document")->required();
+  showCommand->add_flag("--xml", xml, "print an XML property list instead of JSON");
 
   CLI11_PARSE(app, argc, argv);
   const auto done = keyCommand->parsed()      ? makeKey(key, output, layout)

@@ -10,12 +10,13 @@
 
 namespace orvanta::collector {
 
-// The routes, by what they are for. Of two that match, the one added first is taken.
+// Adds the routes of one purpose each. Of two routes that match a request, the library takes the one added first, so
+// that ReceivingRoutes, which takes posts to any path, goes last. `context` outlives the server.
 void addListingRoutes(httplib::Server& server, const ApiContext& context);
 void addControlRoutes(httplib::Server& server, const ApiContext& context);
 void addReceivingRoutes(httplib::Server& server, const ApiContext& context);
 
-// The request as the relay read it; null (and an answer that says so) for one that did not come through the relay.
+// Returns the request as the relay read it. Returns null, and answers 403, if it did not come through the relay.
 std::shared_ptr<const ReceivedRequest> requestOf(const httplib::Request& request, httplib::Response& response,
                                                  const ApiContext& context);
 void answerJson(httplib::Response& response, const Value& value, int status = 200);

@@ -16,7 +16,7 @@ namespace {
 class HttplibServer final : public ApiServer {
  public:
   explicit HttplibServer(ApiContext context) : _context(std::move(context)) {
-    // Each kept-alive connection holds a thread; the relay has so many at most, and closed ones linger a moment.
+    // Each kept-alive connection holds a thread. The relay has kMaximum of them, and closed ones linger a moment.
     _server.new_task_queue = [] { return new httplib::ThreadPool(2 * BackendConnections::kMaximum); };
     _server.set_keep_alive_max_count(std::numeric_limits<std::size_t>::max());
     _server.set_tcp_nodelay(true);

@@ -14,7 +14,7 @@
 
 namespace orvanta::collector {
 
-// What the URLs read and change. Each part is thread-safe and outlives the server.
+// The parts that the URLs read and change. Each is thread-safe and outlives the server.
 struct ApiContext {
   Inbox& inbox;
   Exchanges& exchanges;
@@ -26,7 +26,8 @@ struct ApiContext {
 };
 
 // The HTTP library behind the relay, with every URL of the collector: storebags, posts, uploads, listings, control.
-// Listens on the loopback on a port that only the relay knows. Handlers run on a pool of threads of its own.
+// Owned by the collector. Listens on the loopback, on a port that only the relay knows, from start() until it is
+// destroyed. Handlers run on the library's pool of threads, several at a time; a failed one is answered 4xx or 5xx.
 class ApiServer {
  public:
   static Result<std::unique_ptr<ApiServer>> start(ApiContext context);

@@ -22,7 +22,7 @@ void answerState(Response& response, const ApiContext& context) {
                                   {"storebag", describe(context.storebags.settings())}});
 }
 
-// Parses the body with `parse` and hands the settings to `apply`; answers with the new state, or with what was wrong.
+// Parses the body with `parse` and passes the settings to `apply`; answers with the new state, or 400 with the reason.
 template <class Settings>
 httplib::Server::Handler settingsHandler(const ApiContext& context, Result<Settings> (*parse)(const Value&),
                                          std::function<void(Settings)> apply) {
@@ -78,9 +78,9 @@ void addControlRoutes(httplib::Server& server, const ApiContext& context) {
     context.storebags.clearBags();
     response.status = 204;
   });
-  // What is left below /control is no event post.
+  // Without this, posts to misspelt URLs below /control would be taken for events.
   server.Post(R"(/control(/.*)?)",
-              [](const Request&, Response& response) { answerError(response, 404, "no such knob"); });
+              [](const Request&, Response& response) { answerError(response, 404, "no such URL below /control"); });
 }
 
 }  // namespace orvanta::collector

@@ -8,7 +8,7 @@
 #include "tools/collector/api/ApiRoutes.h"
 #include "tools/collector/store/ReceivedRecords.h"
 
-// The URLs that tell what has been received.
+// The URLs that list what has been received.
 
 namespace orvanta::collector {
 
@@ -19,7 +19,7 @@ namespace {
 
 constexpr std::int64_t kUsualLimit = 1000;
 constexpr std::int64_t kHighestLimit = 100'000;
-constexpr std::size_t kMaximumFileBytes = 1U << 20U;  // certificates and keys have a few KiB
+constexpr std::size_t kMaximumFileBytes = 1U << 20U;  // certificates and keys take a few KiB
 
 std::optional<std::int64_t> wholeNumber(const std::string& text) {
   std::int64_t number = 0;
@@ -28,7 +28,7 @@ std::optional<std::int64_t> wholeNumber(const std::string& text) {
   return number;
 }
 
-// The query's parameters; none, with an answer that says why, when one is wrong or unknown.
+// Returns nullopt, and answers 400 with the reason, if a parameter is wrong or unknown.
 std::optional<InboxQuery> readQuery(const Request& request, Response& response) {
   InboxQuery query;
   query.limit = kUsualLimit;
@@ -105,7 +105,7 @@ void addRecordRoutes(httplib::Server& server, const ApiContext& context) {
   server.Get(R"(/uploads/(\d+))", [&context](const Request& request, Response& response) {
     answerBytes(response, context.inbox.request(numberIn(request)), &ReceivedRequest::body);
   });
-  // Log data is named by its exchange, which is known when the location is handed out.
+  // Log data is named by its exchange, whose number is known when the location is given to the client.
   server.Get(R"(/logdata/(\d+))", [&context](const Request& request, Response& response) {
     answerBytes(response, context.inbox.requestOfExchange(numberIn(request)), &ReceivedRequest::body);
   });

@@ -4,7 +4,7 @@
 
 #include "tools/collector/api/ApiRoutes.h"
 
-// The URLs that daemons use: storebags, posts of events, log data, uploads.
+// The URLs for daemons: storebags, posts of events, log data, uploads.
 
 namespace orvanta::collector {
 

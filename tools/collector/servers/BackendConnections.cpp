@@ -21,7 +21,7 @@ std::unique_ptr<Transport> BackendConnections::take() {
   while (!_idle.empty()) {
     auto connection = std::move(_idle.back());
     _idle.pop_back();
-    // The library closes connections that were idle for long; that shows as something to read.
+    // The library closes connections that were idle for long, which makes them readable.
     if (!connection->readable()) return connection;
   }
   lock.unlock();
@@ -42,7 +42,7 @@ void BackendConnections::closeIdle() {
 
 Result<BackendAnswer> BackendConnections::exchangeOn(Transport& connection, const std::string& head,
                                                      bool answerHasBody) {
-  if (!connection.write(head)) return Failure{"the HTTP library does not take the request"};
+  if (!connection.write(head)) return Failure{"the HTTP library does not accept the request"};
   MessageReader reader(connection);
   auto answerHead = reader.readHead();
   if (!answerHead) return Failure{answerHead.error()};
@@ -63,7 +63,7 @@ Result<BackendAnswer> BackendConnections::exchangeOn(Transport& connection, cons
 
 Result<BackendAnswer> BackendConnections::exchange(const std::string& head, bool answerHasBody) {
   Result<BackendAnswer> answer = Failure{"the HTTP library cannot be reached"};
-  // A kept connection may be closed just now, so a second one is tried; handlers may run twice without harm.
+  // The library may close a kept connection just now, so try a second one. Handlers may run twice without harm.
   for (int attempt = 0; attempt < 2 && !answer; ++attempt) {
     auto connection = take();
     if (connection) answer = exchangeOn(*connection, head, answerHasBody);

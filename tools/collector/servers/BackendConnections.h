@@ -18,8 +18,8 @@ struct BackendAnswer {
   std::string body;
 };
 
-// The relay's connections to the HTTP library: one per request under way, at most kMaximum at once, a few kept for the
-// next. Thread-safe; callers beyond the maximum wait.
+// The relays' connections to the HTTP library: one per request under way, at most kMaximum at once, a few kept open for
+// the next requests. Owned by the collector. Thread-safe; callers beyond the maximum wait.
 class BackendConnections {
  public:
   static constexpr std::size_t kMaximum = 16;
@@ -27,7 +27,7 @@ class BackendConnections {
   explicit BackendConnections(std::uint16_t port) : _port(port) {}
   // Sends a request without a body and waits for its answer.
   Result<BackendAnswer> exchange(const std::string& head, bool answerHasBody);
-  // Closes those kept. Called when no exchange is under way.
+  // Closes the kept connections. Called when no exchange is under way.
   void closeIdle();
 
  private:

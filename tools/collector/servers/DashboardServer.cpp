@@ -108,14 +108,14 @@ void DashboardServer::run() {
 }
 
 void DashboardServer::receiveAll() {
-  // A little more than the longest datagram, so that a longer one shows.
+  // Longer than the longest valid datagram, so that a longer one is noticed.
   std::array<char, 2048> buffer{};
   for (int i = 0; i < kDatagramsPerTurn; ++i) {
     sockaddr_in from{};
     socklen_t size = sizeof from;
     const ssize_t count = ::recvfrom(_socket.get(), buffer.data(), buffer.size(), MSG_DONTWAIT,
                                      reinterpret_cast<sockaddr*>(&from), &size);
-    // A refused acknowledgement comes back as an error of the next read.
+    // If the peer refused an acknowledgement, the next read reports it.
     if (count < 0 && (errno == EINTR || errno == ECONNREFUSED)) continue;
     if (count < 0) return;
     take({buffer.data(), static_cast<std::size_t>(count)}, from);
@@ -162,7 +162,7 @@ void DashboardServer::sendDue() {
   while (!_delayed.empty() && _delayed.begin()->first <= now) {
     const Acknowledgement& each = _delayed.begin()->second;
     const int socket = each.foreign ? _foreignSocket.get() : _socket.get();
-    // One that cannot be sent is lost, as datagrams may be.
+    // If it cannot be sent it is lost, as datagrams may be.
     ::sendto(socket, each.bytes.data(), each.bytes.size(), MSG_DONTWAIT | MSG_NOSIGNAL,
              reinterpret_cast<const sockaddr*>(&each.to), sizeof each.to);
     _delayed.erase(_delayed.begin());

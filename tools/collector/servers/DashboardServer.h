@@ -18,8 +18,8 @@
 
 namespace orvanta::collector {
 
-// How the dashboard server acknowledges the datagrams that ask for it. Forged ones are sent besides the right one, lost
-// or not.
+// How the dashboard server acknowledges the datagrams that ask for it. Forged acknowledgements go out before the right
+// one, and even if that is lost.
 struct AcknowledgementSettings {
   bool acknowledge = true;
   unsigned lossPercent = 0;  // of the right ones
@@ -30,8 +30,9 @@ struct AcknowledgementSettings {
   unsigned foreign = 0;         // forged: the right number, from another port
 };
 
-// Receives dashboard datagrams on one UDP port, keeps them in the inbox and acknowledges those that ask for it, on a
-// thread of its own. stop() and the settings may be called on any other thread.
+// Receives dashboard datagrams on one UDP port, stores them in the inbox and acknowledges those that ask for it, on a
+// thread of its own. Owned by the collector. Any other thread may read and change the settings
+// and call stop().
 class DashboardServer {
  public:
   // Port 0 takes any free one. The inbox outlives the server.
@@ -72,7 +73,7 @@ class DashboardServer {
   const platform::UniqueFd _wakeUp;
   Inbox& _inbox;
 
-  // The thread's own.
+  // Owned by the thread.
   std::multimap<Clock::time_point, Acknowledgement> _delayed;
   std::minstd_rand _dice{1};  // the same losses in every run
 

@@ -19,7 +19,7 @@ using platform::UniqueFd;
 
 namespace {
 
-// A peer that goes while OpenSSL writes must not end the process.
+// A peer that closes the connection while OpenSSL writes must not end the process.
 void blockBrokenPipeSignal() {
   sigset_t signals;
   sigemptyset(&signals);

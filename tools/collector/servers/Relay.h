@@ -15,13 +15,14 @@
 
 namespace orvanta::collector {
 
-// Listens on one TCP port, plain or TLS, with a thread per connection. Connections wait until begin(); stop() (or
-// destruction) ends them all at once and may be called on any thread but the relay's own.
+// Listens on one TCP port, plain or TLS, with a thread per connection. Owned by the collector. Clients may connect
+// before begin() but wait until then for answers; stop() (or destroying the relay) ends all connections at once and may
+// be called on any thread but the relay's own. Connections beyond kMaximumConnections are closed unread.
 class Relay {
  public:
   static constexpr std::size_t kMaximumConnections = 512;
 
-  // Port 0 takes any free one. `tls` null: plain.
+  // Port 0 takes any free one; without `tls`, plain. A failure names the port.
   static Result<std::unique_ptr<Relay>> listen(const std::string& address, std::uint16_t port,
                                                std::shared_ptr<TlsServer> tls, RelayContext context);
   ~Relay();

@@ -15,7 +15,7 @@ namespace orvanta::collector {
 
 namespace {
 
-// A query may hold further question marks, but the library refuses them.
+// The library refuses further question marks in a query, although they are valid.
 std::string targetForLibrary(std::string target) {
   const auto query = target.find('?');
   if (query == std::string::npos) return target;
@@ -25,7 +25,7 @@ std::string targetForLibrary(std::string target) {
   return target;
 }
 
-// A body may inflate to a few times what it may measure on the wire, not to all that a hostile one could.
+// Bounds what a hostile body inflates to: this many times the limit on the wire.
 constexpr std::size_t kInflationAllowance = 4;
 
 double wallSeconds() {
@@ -44,7 +44,7 @@ RequestKind kindOf(std::string_view method, std::string_view path) {
   return RequestKind::events;
 }
 
-// The library's answer is sent on without the fields that belong to its own connection.
+// Fields of the library's answer that belong to its own connection and are not passed on.
 bool isHopByHop(const std::string& name) {
   constexpr std::array<const char*, 3> kNames{"Connection", "Keep-Alive", "Transfer-Encoding"};
   return std::any_of(kNames.begin(), kNames.end(),
@@ -123,7 +123,7 @@ bool RelayConnection::handleOne() {
   const auto text = _reader.readHead();
   if (text && !text.value()) return false;
   if (!text) {
-    // An end inside a head leaves nobody to answer.
+    // If the stream ended inside the head, no client is left to answer.
     return text.error().find("too long") != std::string::npos && refuse(request, 431, text.error());
   }
   auto head = parseRequestHead(*text.value());
@@ -151,7 +151,7 @@ bool RelayConnection::refuse(ReceivedRequest& request, int status, const std::st
   store(request);
   BackendAnswer answer{{status, {{"Content-Type", "text/plain"}}}, reason + "\n"};
   send(request, answer, ConnectionFault::none, false);
-  // Closing with bytes unread would reset the connection and could take the answer with it.
+  // Closing with bytes unread would reset the connection, and the client could lose the answer.
   _reader.discard(_context.maximumBodyBytes);
   return false;
 }

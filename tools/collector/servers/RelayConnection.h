@@ -13,7 +13,7 @@
 
 namespace orvanta::collector {
 
-// What the connections of a relay share. Each part is thread-safe and outlives the relay.
+// The parts that the connections of a relay share. Each is thread-safe and outlives the relay.
 struct RelayContext {
   Behaviours& behaviours;
   Inbox& inbox;
@@ -23,27 +23,28 @@ struct RelayContext {
   std::function<void(const ReceivedRequest&)> observer;  // each stored request, on the relay's threads; may be empty
 };
 
-// One client's connection: reads requests, lets the HTTP library answer, records both, and does to the answer what the
-// behaviour of the path asks for. run() belongs to one thread.
+// One client's connection: reads requests, lets the HTTP library answer, applies the behaviour of the path, records
+// both and sends the answer. Lives on its connection's thread. After a request that cannot be read it
+// answers 4xx and ends.
 class RelayConnection {
  public:
   RelayConnection(Transport& stream, RelayContext& context, std::string client, bool secure)
       : _stream(stream), _reader(stream), _context(context), _client(std::move(client)), _secure(secure) {}
-  // Until either side ends the connection.
+  // Returns when either side has ended the connection.
   void run();
 
  private:
-  // Each tells whether the connection goes on.
+  // Each returns whether the connection stays open.
   bool handleOne();
   bool answer(const std::shared_ptr<ReceivedRequest>& shared, bool keepsAlive);
   bool refuse(ReceivedRequest& request, int status, const std::string& reason);
 
-  // The answer to a request that cannot be read.
+  // How a request that cannot be read is answered.
   struct Refusal {
     int status = 0;
     std::string reason;
   };
-  // Takes the body off the wire into `request`.
+  // Reads the body into `request`, as it is on the wire.
   Result<void, Refusal> readBody(const RequestHead& head, ReceivedRequest& request);
   BackendAnswer usualAnswer(const ReceivedRequest& request);
   bool send(const ReceivedRequest& request, const BackendAnswer& answer, ConnectionFault fault, bool keepsAlive);
@@ -56,7 +57,8 @@ class RelayConnection {
   const bool _secure;
 };
 
-// Requests of the collector's own readers, which are neither recorded nor disturbed.
+// Returns whether the request is for one of the collector's own pages. Those requests are not
+// recorded, and no behaviour applies to them.
 bool isOwnRequest(std::string_view method, std::string_view path);
 
 }  // namespace orvanta::collector

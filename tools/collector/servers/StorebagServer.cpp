@@ -16,7 +16,7 @@ namespace {
 
 constexpr std::array<const char*, 2> kExtensions{".json", ".plist"};
 constexpr std::int64_t kNanoseconds = 1'000'000'000;
-constexpr std::int64_t kLongestRefreshCycle = 86'400;  // more does not count for daemons
+constexpr std::int64_t kLongestRefreshCycle = 86'400;  // daemons count no more
 
 std::optional<std::int64_t> modifiedNanoseconds(const std::string& path) {
   struct stat status {};
@@ -24,7 +24,7 @@ std::optional<std::int64_t> modifiedNanoseconds(const std::string& path) {
   return status.st_mtim.tv_sec * kNanoseconds + status.st_mtim.tv_nsec;
 }
 
-// Names become file names: what could leave the directory is no name.
+// Names become file names: they must not lead out of the directory.
 bool isBagName(const std::string& name) {
   const auto allowed = [](unsigned char c) { return std::isalnum(c) != 0 || c == '_' || c == '-' || c == '.'; };
   return !name.empty() && name.size() <= 100 && name.front() != '.' && std::all_of(name.begin(), name.end(), allowed);
@@ -130,7 +130,7 @@ void StorebagServer::clearBags() {
 
 Result<StorebagServer::Source> StorebagServer::sourceFor(const std::string& name) const {
   const platform::MutexLock lock(_mutex);
-  // The bag's own source goes before the one for all names; held bags before files.
+  // The bag's own source takes precedence over the one for all names, held bags over files.
   const std::array<std::pair<std::string, std::string>, 2> candidates{{{name, name}, {"", "storebag"}}};
   for (const auto& [heldName, fileName] : candidates) {
     const auto held = _held.find(heldName);

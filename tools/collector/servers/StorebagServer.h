@@ -17,18 +17,18 @@ namespace orvanta::collector {
 struct StorebagSettings {
   PropertyListForm container = PropertyListForm::xml;
   PropertyListForm bag = PropertyListForm::xml;
-  // Seconds, in Cache-Control; none: no such header. With `maxAgeOfBag` it is the bag's refresh_cycle that goes there,
-  // and this only for a bag that has none: daemons take refresh_cycle from a bag that arrives, but after an answer that
-  // nothing has changed they go by the header, and an edit should reach them as soon then.
+  // Seconds, in Cache-Control; nullopt leaves the header out. With `maxAgeOfBag` the bag's refresh_cycle goes there,
+  // and this only for a bag that lacks one: daemons take refresh_cycle from a bag that they receive, but after "not
+  // modified" they go by the header, and an edit should reach them as soon then.
   std::optional<std::int64_t> maxAge = 3600;
   bool maxAgeOfBag = true;
-  bool lastModified = true;  // whether answers carry Last-Modified
+  bool lastModified = true;  // answers carry Last-Modified
 };
 
 // The bag that a new directory gets, as JSON with placeholders.
 std::string_view defaultStorebagJson();
 
-// What "${http}" and the like in a bag's texts stand for.
+// The values for "${http}" and the like in a bag's strings.
 struct BagPlaceholders {
   std::string http;   // http://127.0.0.1:PORT
   std::string https;  // https://localhost:PORT
@@ -44,17 +44,19 @@ struct HttpAnswer {
 };
 
 // Answers requests for storebags: the bag NAME comes from NAME.json or NAME.plist in the directory, or else from
-// storebag.json or storebag.plist, is signed, and carries the file's time as Last-Modified. Files are read again when
-// they change. Thread-safe.
+// storebag.json or storebag.plist, is signed, and carries the file's time as Last-Modified. Reads the file for each
+// answer; a broken one is answered 500 with the reason. Owned by the collector. Thread-safe.
 class StorebagServer {
  public:
-  // Makes storebag.json when the directory has no bag, the signing key when there is none, and the public key files.
+  // Makes storebag.json if the directory has no bag, the signing key if it is missing, and the public key files. A
+  // failure names the file.
   static Result<std::unique_ptr<StorebagServer>> make(const std::string& directory);
 
   void setPlaceholders(BagPlaceholders placeholders);  // before the first answer
   void setSettings(const StorebagSettings& settings);
   StorebagSettings settings() const;
-  // Serves this bag instead of files: for that name, or for all names without one of their own when it is empty.
+  // Serves this bag instead of files: for that name or, if the name is empty, for all names without a bag of
+  // their own.
   void setBag(const std::string& name, Value inner);
   void clearBags();
 
@@ -67,7 +69,7 @@ class StorebagServer {
   struct Source;
   StorebagServer(std::string directory, std::shared_ptr<const SigningKey> key);
   Result<Source> sourceFor(const std::string& name) const;
-  // A Last-Modified time that differs from that of every earlier content.
+  // Returns a Last-Modified time that differs from that of every earlier content.
   std::int64_t stampFor(const std::string& identity, std::int64_t modifiedNanoseconds);
 
   // Constant after construction (the placeholders: after set-up).

@@ -16,7 +16,7 @@ Statement& Statement::bind(int index, double value) {
   return *this;
 }
 
-// The texts given here outlive the step that reads them, so that SQLite need not copy them.
+// SQLITE_STATIC: not copied, see the header.
 Statement& Statement::bindText(int index, std::string_view text) {
   sqlite3_bind_text64(_statement.get(), index + 1, text.data() != nullptr ? text.data() : "", text.size(),
                       SQLITE_STATIC, SQLITE_UTF8);
@@ -70,7 +70,7 @@ Result<std::unique_ptr<Database>> Database::open(const std::string& path, const 
   const int opened = sqlite3_open_v2(path.c_str(), &handle, flags, nullptr);
   std::unique_ptr<Database> database(new Database(handle));
   if (opened != SQLITE_OK) return Failure{fmt::format("cannot open {}: {}", path, sqlite3_errstr(opened))};
-  // Readers such as the sqlite3 program may look on while the collector writes.
+  // Readers such as the sqlite3 program may have it open while the collector writes.
   sqlite3_busy_timeout(handle, 5000);
   if (sqlite3_exec(handle, "PRAGMA journal_mode=WAL; PRAGMA synchronous=OFF;", nullptr, nullptr, nullptr) !=
           SQLITE_OK ||

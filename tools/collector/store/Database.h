@@ -11,7 +11,9 @@
 
 namespace orvanta::collector {
 
-// One prepared statement. Parameters and columns count from 0. Used under its database's owner's lock.
+// One prepared statement. Parameters and columns count from 0. Not thread-safe: the owner of the database locks.
+//
+// Bound texts and blobs are not copied: they must live until the step that reads them.
 class Statement {
  public:
   Statement() = default;
@@ -22,9 +24,9 @@ class Statement {
   Statement& bindText(int index, std::string_view text);
   Statement& bindBlob(int index, std::string_view bytes);
   Statement& bindNull(int index);
-  // Whether a row came. After the last row, or on failure, the statement is ready for the next use.
+  // Returns whether there was a row. After the last row, or on failure, the statement is ready for its next use.
   bool step();
-  // Gives up the rows that are left.
+  // Drops the remaining rows.
   void reset();
 
   std::int64_t integer(int column) const;
@@ -36,13 +38,14 @@ class Statement {
   std::unique_ptr<sqlite3_stmt, int (*)(sqlite3_stmt*)> _statement{nullptr, &sqlite3_finalize};
 };
 
-// A SQLite database file. Not thread-safe: the owner locks.
+// A SQLite database file. Not thread-safe: the owner locks. Only open() reports failures: the SQL is the program's own,
+// and records that cannot be written, such as to a full disk, are lost.
 class Database {
  public:
-  // Opens or makes the file and runs the schema.
+  // Opens or creates the file and runs the schema. The failure names the file.
   static Result<std::unique_ptr<Database>> open(const std::string& path, const char* schema);
 
-  // The SQL is the program's own; one that does not compile gives a statement that never has a row.
+  // SQL that does not compile gives a statement that never has a row.
   Statement prepare(std::string_view sql);
   void run(const char* sql);
   std::int64_t lastInsertId() const { return sqlite3_last_insert_rowid(_handle.get()); }

@@ -9,8 +9,9 @@
 
 namespace orvanta::collector {
 
-// The requests that the relay has read and the HTTP library is answering. The library is handed the head alone, with
-// the number of the exchange; its handlers find the whole request here, its body as it was on the wire. Thread-safe.
+// The requests that the relay has read and the HTTP library is answering. The relay passes the library the head alone,
+// with the number of the exchange; the library's handlers find the whole request here, with its body as it was on the
+// wire. Owned by the collector. Thread-safe.
 class Exchanges {
  public:
   // The header that carries the number from the relay to the handlers.
@@ -24,7 +25,7 @@ class Exchanges {
     const platform::MutexLock lock(_mutex);
     _open.erase(exchange);
   }
-  // Null when there is no such exchange.
+  // Returns null if there is no such exchange.
   std::shared_ptr<const ReceivedRequest> find(std::int64_t exchange) const {
     const platform::MutexLock lock(_mutex);
     const auto found = _open.find(exchange);

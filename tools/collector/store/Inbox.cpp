@@ -18,7 +18,7 @@ std::size_t singleNumber(Statement statement) {
   return statement.step() ? static_cast<std::size_t>(std::max<std::int64_t>(statement.integer(0), 0)) : 0;
 }
 
-// What is left to read of the statement.
+// Reads the remaining rows of the statement.
 template <class Record>
 std::vector<Record> readAll(Statement& statement, Record (*read)(const Statement&)) {
   std::vector<Record> found;
@@ -87,7 +87,7 @@ void Inbox::add(ReceivedDatagram& datagram) {
   changed();
 }
 
-// Takes away a tenth at a time, so that most additions need not look.
+// Deletes a tenth at a time, so that most additions find nothing to delete.
 void Inbox::prune() {
   if (_counts.datagrams > _limits.maximumDatagrams) {
     const auto share = static_cast<std::int64_t>(_limits.maximumDatagrams / 10 + 1);

@@ -16,14 +16,14 @@
 
 namespace orvanta::collector {
 
-// Beyond either, the oldest requests (with their events) go; datagrams by number alone.
+// Beyond the number or the bytes, the oldest requests are deleted with their events. Datagrams have their own number.
 struct InboxLimits {
   std::size_t maximumRequests = 200'000;
   std::size_t maximumBytes = 1U << 30U;  // of bodies
   std::size_t maximumDatagrams = 1'000'000;
 };
 
-// Which records a reader wants; everything by default.
+// Selects records; all of them by default.
 struct InboxQuery {
   std::int64_t since = 0;  // only records with a greater id
   std::size_t limit = 1'000'000;
@@ -38,16 +38,18 @@ struct InboxCounts {
 };
 
 // Everything that the collector has received, kept in a SQLite file, in the order in which it was complete.
-// Thread-safe.
+// Owned by the collector. Thread-safe: the relays' and the dashboard server's threads add, the HTTP library's read.
 class Inbox {
  public:
+  // Keeps the records that the file already holds. The failure names the file.
   static Result<std::unique_ptr<Inbox>> open(const std::string& databaseFile, const InboxLimits& limits);
 
-  // Stores the request, and for a post of events each event that its body holds. Sets the id.
+  // Stores the request, and for a post of events each event of its body; sets the id. Then deletes the oldest records
+  // beyond the limits.
   void add(ReceivedRequest& request);
   void add(ReceivedDatagram& datagram);
   void clear();
-  // The number for the next exchange; they go on across restarts.
+  // The number for the next exchange. Numbers go on across restarts.
   std::int64_t nextExchange();
 
   std::vector<ReceivedRequest> requests(const InboxQuery& query = {}) const;
@@ -57,8 +59,8 @@ class Inbox {
   std::vector<ReceivedDatagram> datagrams(const InboxQuery& query = {}) const;
   InboxCounts counts() const;
 
-  // Waits until the predicate holds, asking again after each change; false when the time is over first. The predicate
-  // is called without the lock held, so it may ask the inbox.
+  // Each waits until its condition holds and returns false if the time is over first. waitUntil() evaluates the
+  // predicate again after each change, without the lock held, so that it may query the inbox.
   bool waitUntil(const std::function<bool()>& predicate, std::chrono::milliseconds limit) const;
   bool waitForCounts(const InboxCounts& least, std::chrono::milliseconds limit) const;
 

@@ -9,23 +9,23 @@
 
 namespace orvanta::collector::rows {
 
-// How records lie in the inbox's tables: the schema, and for each kind of record the statement that inserts one, the
-// binding of its parameters, and the reading of a row. Called under the inbox's lock.
+// How records lie in the inbox's tables: the schema, and for each kind of record its insertion and the reading of a
+// row. Statements are used under the inbox's lock.
 //
-// The file outlives the program and is read by other tools: names and meanings of columns stay as they are.
+// The file outlives the program, and other tools read it: names and meanings of columns stay as they are.
 
 extern const char* const kSchema;
 
-// "SELECT …" up to and including FROM; the caller adds what it asks for. The readers below take its columns.
+// Up to and including FROM; the caller appends conditions, order and limit. The readers below expect these columns.
 extern const std::string_view kSelectRequests;
-extern const std::string_view kSelectEvents;  // with the request that each came in
+extern const std::string_view kSelectEvents;  // joined with their requests
 extern const std::string_view kSelectDatagrams;
 
 extern const std::string_view kInsertRequest;
-extern const std::string_view kInsertEvent;  // request, position, text
+extern const std::string_view kInsertEvent;  // parameters: request, position, JSON
 extern const std::string_view kInsertDatagram;
 
-// Each binds all parameters and takes the step that inserts the row. `id` of the record is not stored: SQLite gives it.
+// Binds all parameters and inserts the row. The record's `id` is left to SQLite.
 void insert(Statement& statement, const ReceivedRequest& request);
 void insert(Statement& statement, const ReceivedDatagram& datagram);
 

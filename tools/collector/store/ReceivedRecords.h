@@ -12,7 +12,7 @@
 
 namespace orvanta::collector {
 
-// What a request was for, by its method and path.
+// The purpose of a request, by its method and path.
 enum class RequestKind { storebag, events, logData, upload, other };
 std::string_view requestKindText(RequestKind kind);
 std::optional<RequestKind> requestKindFromText(std::string_view text);
@@ -30,15 +30,15 @@ struct ReceivedRequest {
   std::string path;    // percent-decoded, without the query
   HeaderFields headers;
   std::string rawBody;
-  std::string body;  // decompressed; the same as rawBody where nothing was compressed
-  // Of a post of events: the body as JSON, or why it is none. Not stored.
+  std::string body;  // decompressed; the same as rawBody if that was not compressed
+  // Of a post of events: the body as JSON; null if it is damaged. Not stored.
   std::shared_ptr<const Value> json;
-  std::string damage;
-  std::string note;  // what was wrong with the body, or what was done to the answer; mostly empty
-  int status = 0;    // of the answer; 0 when none was given
+  std::string damage;  // why the body cannot be used; empty if it can. Not stored.
+  std::string note;    // what was wrong with the body, or what was done to the answer; mostly empty
+  int status = 0;      // of the answer; 0 if there was no answer
 
   const std::string* header(std::string_view name) const { return findHeader(headers, name); }
-  // The value of a query parameter, percent-decoded.
+  // Returns the value of a query parameter, percent-decoded; nullopt if it is absent.
   std::optional<std::string> parameter(std::string_view name) const;
 };
 
@@ -73,12 +73,11 @@ struct ReceivedDatagram {
   bool reliable = false;
   bool explicitServer = false;
   std::string text;
-  std::int64_t acknowledgements = 0;  // sent for it, copies included and forged ones not
+  std::int64_t acknowledgements = 0;  // sent for it; counts copies but not forged ones
 };
 
-// The records as the JSON that readers of the collector's URLs get. Headers are pairs, in the order in which they stood
-// on the wire. Bodies: as parsed JSON under "json", else as "text", else (not UTF-8) as "base64"; long ones only as
-// "bodyURL".
+// The records as JSON, for readers of the collector's URLs. Headers are pairs, in their order on the wire. A body is
+// parsed JSON under "json", else "text", else (not UTF-8) "base64"; a long one is only named by "bodyURL".
 Dictionary listRequest(const ReceivedRequest& request);
 Dictionary listEvent(const ReceivedEvent& event);
 Dictionary listDatagram(const ReceivedDatagram& datagram);

@@ -94,7 +94,7 @@ std::pair<CertificatePointer, KeyPointer> identityObjects(const ServerIdentity& 
   return {std::move(certificate), std::move(key)};
 }
 
-// Whether the pair belongs together and lasts long enough to be used once more.
+// Returns whether the pair belongs together and lasts long enough to be used once more.
 bool usable(const ServerIdentity& identity) {
   const auto objects = identityObjects(identity);
   if (!objects.first || !objects.second) return false;
@@ -132,7 +132,7 @@ Result<void> writeText(const std::string& path, const std::string& text, mode_t 
 Result<CertificateAuthority> CertificateAuthority::readOrMake(const std::string& directory) {
   const std::string certificateFile = directory + "/ca.pem";
   const std::string keyFile = directory + "/ca-key.pem";
-  // Without one of the two files, or with one that cannot be read, there is nothing to keep.
+  // A file that is missing or cannot be read counts as empty, and so the pair as unusable.
   const auto textOf = [](const std::string& path) {
     auto text = platform::readWholeFile(path, kMaximumPemBytes);
     return text ? std::move(*text) : std::string();

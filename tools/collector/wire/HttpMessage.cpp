@@ -19,7 +19,7 @@ std::string_view trimmed(std::string_view text) {
   return text.substr(first, text.find_last_not_of(" \t") - first + 1);
 }
 
-// Takes the text up to the next line break off the front; none when there is no line break.
+// Removes the first line and its line break from `rest`; returns nullopt if there is no line break.
 std::optional<std::string_view> takeLine(std::string_view& rest) {
   const auto end = rest.find("\r\n");
   if (end == std::string_view::npos) return std::nullopt;
@@ -36,9 +36,9 @@ Result<HeaderFields> parseHeaders(std::string_view rest) {
     if (!line) return Failure{"the head has no end"};
     if (line->empty()) return headers;
     const auto colon = line->find(':');
-    if (colon == std::string_view::npos || colon == 0) return Failure{fmt::format("no header line: {}", *line)};
+    if (colon == std::string_view::npos || colon == 0) return Failure{fmt::format("not a header line: {}", *line)};
     const auto name = line->substr(0, colon);
-    if (name.find_first_of(" \t") != std::string_view::npos) return Failure{fmt::format("no header name: {}", name)};
+    if (name.find_first_of(" \t") != std::string_view::npos) return Failure{fmt::format("not a header name: {}", name)};
     headers.emplace_back(std::string(name), std::string(trimmed(line->substr(colon + 1))));
   }
 }
@@ -69,7 +69,7 @@ Result<std::optional<std::size_t>> RequestHead::contentLength() const {
     std::size_t number = 0;
     const auto [end, error] = std::from_chars(value.data(), value.data() + value.size(), number);
     if (error != std::errc() || end != value.data() + value.size())
-      return Failure{"Content-Length is no number: " + value};
+      return Failure{"Content-Length is not a number: " + value};
     if (length && *length != number) return Failure{"two Content-Length headers differ"};
     length = number;
   }
@@ -83,14 +83,14 @@ Result<RequestHead> parseRequestHead(std::string_view head) {
   const auto first = line->find(' ');
   const auto last = line->rfind(' ');
   if (first == std::string_view::npos || first == 0 || last <= first + 1)
-    return Failure{fmt::format("no request line: {}", *line)};
+    return Failure{fmt::format("not a request line: {}", *line)};
   RequestHead request;
   request.method = line->substr(0, first);
   request.target = line->substr(first + 1, last - first - 1);
   const auto version = line->substr(last + 1);
   if (version != "HTTP/1.1" && version != "HTTP/1.0") return Failure{fmt::format("unknown protocol {}", version)};
   request.http11 = version == "HTTP/1.1";
-  if (request.target.find(' ') != std::string::npos) return Failure{fmt::format("no request line: {}", *line)};
+  if (request.target.find(' ') != std::string::npos) return Failure{fmt::format("not a request line: {}", *line)};
   auto headers = parseHeaders(rest);
   if (!headers) return Failure{headers.error()};
   request.headers = std::move(headers.value());
@@ -101,10 +101,10 @@ Result<ResponseHead> parseResponseHead(std::string_view head) {
   std::string_view rest = head;
   const auto line = takeLine(rest);
   // "HTTP/1.1 200 ..." at the least.
-  if (!line || line->size() < 12 || line->substr(0, 7) != "HTTP/1.") return Failure{"no status line"};
+  if (!line || line->size() < 12 || line->substr(0, 7) != "HTTP/1.") return Failure{"not a status line"};
   ResponseHead response;
   const auto [end, error] = std::from_chars(line->data() + 9, line->data() + 12, response.status);
-  if (error != std::errc() || end != line->data() + 12) return Failure{"no status line"};
+  if (error != std::errc() || end != line->data() + 12) return Failure{"not a status line"};
   auto headers = parseHeaders(rest);
   if (!headers) return Failure{headers.error()};
   response.headers = std::move(headers.value());

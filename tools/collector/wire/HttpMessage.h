@@ -12,11 +12,11 @@
 
 namespace orvanta::collector {
 
-// Reading HTTP/1 messages as bytes, with the header fields in their order. No I/O.
+// Parsing and writing parts of HTTP/1 messages, with the header fields in their order. Pure; any thread.
 
 using HeaderFields = std::vector<std::pair<std::string, std::string>>;
 
-// The first field of that name, in any case; null when there is none.
+// Returns the first field of that name, in any case; null if there is no such field.
 const std::string* findHeader(const HeaderFields& headers, std::string_view name);
 
 struct RequestHead {
@@ -26,10 +26,10 @@ struct RequestHead {
   HeaderFields headers;
 
   bool chunked() const;
-  // Whether the sender waits for "100 Continue" before it sends the body.
+  // Returns whether the sender waits for "100 Continue" before it sends the body.
   bool expectsContinue() const;
   bool keepsAlive() const;
-  // None where there is no such header; a failure where it is no number or there are two that differ.
+  // Nullopt if the header is absent; a failure if it is not a number or two of them differ.
   Result<std::optional<std::size_t>> contentLength() const;
 };
 
@@ -42,17 +42,19 @@ struct ResponseHead {
 Result<RequestHead> parseRequestHead(std::string_view head);
 Result<ResponseHead> parseResponseHead(std::string_view head);
 
-// One step of the chunked form: the size line of the next chunk, without its line break.
+// Parses the size line of a chunk, given without its line break. Returns nullopt if it is invalid.
 std::optional<std::size_t> parseChunkSize(std::string_view line);
 
 // The path of a request target, percent-decoded.
 std::string pathOfTarget(std::string_view target);
+// Percent-decoded; nullopt if the parameter is absent.
 std::optional<std::string> queryParameter(std::string_view target, std::string_view name);
 
 std::string_view reasonPhrase(int status);
 
 // "Sun, 06 Nov 1994 08:49:37 GMT".
 std::string httpDate(std::int64_t secondsSince1970);
+// Returns nullopt for any other form.
 std::optional<std::int64_t> parseHttpDate(const std::string& text);
 
 }  // namespace orvanta::collector

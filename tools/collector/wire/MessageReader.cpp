@@ -100,7 +100,7 @@ Result<std::string> MessageReader::readChunkedBody(std::size_t maximumBytes) {
     auto line = readLine();
     if (!line) return line;
     const auto size = parseChunkSize(line.value());
-    if (!size) return Failure{"no chunk size: " + line.value()};
+    if (!size) return Failure{"not a chunk size: " + line.value()};
     if (*size == 0) break;
     if (*size > maximumBytes || body.size() + *size > maximumBytes) return Failure{"the chunked body is too long"};
     auto piece = readBody(*size);
@@ -110,7 +110,7 @@ Result<std::string> MessageReader::readChunkedBody(std::size_t maximumBytes) {
     if (!end) return end;
     if (!end->empty()) return Failure{"a chunk does not end where it says"};
   }
-  // Trailers are read and dropped.
+  // Reads and drops the trailers.
   std::size_t trailerBytes = 0;
   while (true) {
     auto line = readLine();

@@ -16,16 +16,17 @@ struct ServerIdentity {
   std::string keyPem;
 };
 
-// What is wrong with the server's certificate, for tests of those who have to notice.
+// What is wrong with the server's certificate, for tests of clients that must refuse it.
 enum class CertificateFlaw { none, wrongHost, expired, selfSigned };
 
-// The collector's own certificate authority: made on first start, kept in two files (ca.pem, ca-key.pem, the latter for
-// its owner's eyes only), made anew when it is about to expire.
+// The collector's own certificate authority: made on first start, kept in two files (ca.pem, and ca-key.pem with mode
+// 0600), made anew when it is about to expire. Immutable.
 class CertificateAuthority {
  public:
+  // Replaces files that are missing, damaged or about to expire. A failure says which file cannot be written.
   static Result<CertificateAuthority> readOrMake(const std::string& directory);
 
-  // What clients have to trust.
+  // For clients to trust.
   const std::string& certificateFile() const { return _certificateFile; }
   // A fresh certificate for localhost, 127.0.0.1 and ::1.
   Result<ServerIdentity> issueServerIdentity(CertificateFlaw flaw) const;
@@ -39,7 +40,7 @@ class CertificateAuthority {
   ServerIdentity _identity;
 };
 
-// The server side of TLS with one certificate. Immutable; accept() may be called from several threads.
+// The server side of TLS with one certificate. Immutable; the threads of a relay share it.
 class TlsServer {
  public:
   static Result<std::shared_ptr<TlsServer>> make(const ServerIdentity& identity);

@@ -44,7 +44,7 @@ Result<BoundSocket> bindSocket(int type, const std::string& address, std::uint16
   sockaddr_in wanted{};
   wanted.sin_family = AF_INET;
   wanted.sin_port = htons(port);
-  if (::inet_pton(AF_INET, address.c_str(), &wanted.sin_addr) != 1) return Failure{"no IPv4 address: " + address};
+  if (::inet_pton(AF_INET, address.c_str(), &wanted.sin_addr) != 1) return Failure{"not an IPv4 address: " + address};
   platform::UniqueFd socket(::socket(AF_INET, type | SOCK_CLOEXEC, 0));
   const int on = 1;
   // A port whose last connections still linger may be used again at once.

@@ -21,7 +21,8 @@ struct BoundSocket {
   std::uint16_t port = 0;
 };
 
-// An IPv4 socket of that type (SOCK_STREAM or SOCK_DGRAM) bound to the address; port 0 takes any free one.
+// Binds an IPv4 socket of that type (SOCK_STREAM or SOCK_DGRAM); port 0 takes any free one. The failure names
+// address and port.
 Result<BoundSocket> bindSocket(int type, const std::string& address, std::uint16_t port);
 
 // "127.0.0.1:4711".
@@ -29,10 +30,11 @@ std::string addressText(const sockaddr_in& address);
 
 // How long a peer may take for one read or write before its connection is given up.
 inline constexpr std::chrono::seconds kStreamTimeout{120};
+// Sets that timeout, and sends without delay.
 void prepareStreamSocket(int descriptor);
 
-// One connected stream, plain or TLS, for a thread that reads and writes in turn. Another thread may call interrupt(),
-// after which everything ends as if the peer had gone.
+// One connected stream, plain or TLS, owned and used by one thread, which reads and writes in turn. Another thread may
+// call interrupt(), after which every call returns as if the peer had closed the connection.
 class Transport {
  public:
   explicit Transport(platform::UniqueFd socket) : _socket(std::move(socket)) {}
@@ -41,21 +43,22 @@ class Transport {
   Transport& operator=(const Transport&) = delete;
 
   static std::unique_ptr<Transport> plain(platform::UniqueFd socket);
-  // A connection to that port of this machine; null when nobody listens there.
+  // Connects to that port of this machine; null if no process listens there.
   static std::unique_ptr<Transport> connectLoopback(std::uint16_t port);
 
-  // Bytes read; 0 when the peer has ended its side, the stream has failed or nothing came in time.
+  // Returns the number of bytes read; 0 if the peer has closed its side, the stream has failed or the timeout is over.
   virtual std::size_t read(char* buffer, std::size_t size) = 0;
-  // False when the stream has failed.
+  // Returns false if the stream has failed.
   virtual bool write(std::string_view bytes) = 0;
   // Tells the peer that nothing more follows.
   virtual void finish() = 0;
 
-  // Both wake-ups end together: the peer has closed, or (with a limit) the time is over. True: the peer has closed.
+  // Waits, with a limit no longer than that. Returns whether the peer has closed the connection; if not,
+  // the time is over.
   bool waitForPeerToClose(std::optional<std::chrono::milliseconds> limit) const;
-  // Whether something waits to be read, an end included.
+  // Returns whether a read would return at once, with bytes or the end of the stream.
   bool readable() const;
-  // The peer sees the connection reset. Nothing may follow.
+  // Makes the peer see a reset connection when this object is destroyed. No other call may follow.
   void reset();
   // Any thread.
   void interrupt() const;
