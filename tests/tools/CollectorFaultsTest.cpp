@@ -54,7 +54,7 @@ TEST_F(CollectorFaultsTest, BreaksAnswersAsAsked) {
 TEST_F(CollectorFaultsTest, StaysSilentUntilItEnds) {
   collector->setFault("/events", ConnectionFault::silent);
   auto waiting = std::async(std::launch::async, [this] { return static_cast<bool>(post("/events", kPost)); });
-  ASSERT_TRUE(collector->waitForRequests(1, kPatience));
+  ASSERT_TRUE(collector->waitForRequests(1, kTimeout));
   EXPECT_EQ(http().Get("/requests")->status, 200) << "others are served meanwhile";
   collector->stop();
   EXPECT_FALSE(waiting.get());
@@ -65,7 +65,7 @@ TEST_F(CollectorFaultsTest, DelaysAndRedirectsAsAsked) {
   ASSERT_EQ(control("/control/paths", settings), 200);
   const auto before = std::chrono::steady_clock::now();
   auto delayed = std::async(std::launch::async, [this] { return post("/old", kPost); });
-  ASSERT_TRUE(collector->waitForRequests(1, kPatience));
+  ASSERT_TRUE(collector->waitForRequests(1, kTimeout));
   EXPECT_EQ(post("/elsewhere", kPost)->status, 200) << "others go ahead";
   const auto answer = delayed.get();
   EXPECT_GE(std::chrono::steady_clock::now() - before, std::chrono::milliseconds(300));

@@ -21,7 +21,7 @@ namespace orvanta::collector {
 // A collector in a directory of its own, and HTTP clients for it.
 class CollectorFixture : public testing::Test {
  protected:
-  static constexpr std::chrono::seconds kPatience{30};
+  static constexpr std::chrono::seconds kTimeout{30};
 
   void SetUp() override { start({}); }
   void start(CollectorOptions options) {
@@ -32,12 +32,12 @@ class CollectorFixture : public testing::Test {
     collector = std::move(*started);
   }
 
-  httplib::Client http() const { return patient(httplib::Client("127.0.0.1", collector->httpPort())); }
+  httplib::Client http() const { return withTimeout(httplib::Client("127.0.0.1", collector->httpPort())); }
   std::unique_ptr<httplib::SSLClient> https() const {
     auto client = std::make_unique<httplib::SSLClient>("localhost", collector->httpsPort());
     client->set_ca_cert_path(collector->caFile().c_str());
     client->enable_server_certificate_verification(true);
-    client->set_read_timeout(kPatience);
+    client->set_read_timeout(kTimeout);
     return client;
   }
   httplib::Result post(const std::string& path, const std::string& body) const {
@@ -73,8 +73,8 @@ class CollectorFixture : public testing::Test {
   std::unique_ptr<Collector> collector;
 
  private:
-  static httplib::Client patient(httplib::Client client) {
-    client.set_read_timeout(kPatience);
+  static httplib::Client withTimeout(httplib::Client client) {
+    client.set_read_timeout(kTimeout);
     client.set_tcp_nodelay(true);
     return client;
   }

@@ -49,7 +49,7 @@ TEST_F(DashboardServerTest, AcknowledgesOnlyWhatAsksForIt) {
   send(datagram(3));
   EXPECT_EQ(receive(), datagram(3).substr(0, 64));
   EXPECT_FALSE(waits());
-  ASSERT_TRUE(collector->waitForDatagrams(4, kPatience));
+  ASSERT_TRUE(collector->waitForDatagrams(4, kTimeout));
   const auto received = collector->datagrams();
   EXPECT_TRUE(received[0].wellFormed && !received[1].wellFormed && !received[2].wellFormed);
   EXPECT_EQ(received[1].bytes, "short");

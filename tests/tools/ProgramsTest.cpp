@@ -4,6 +4,7 @@
 #include <filesystem>
 
 #include "platform/codec/Json.h"
+#include "tests/support/Bytes.h"
 #include "tests/support/ChildProcess.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/TemporaryDirectory.h"
@@ -64,13 +65,12 @@ TEST(StorebagProgramTest, SaysWhatIsWrong) {
   const std::string broken = directory.write("broken.json", "{");
   const std::string list = directory.write("list.plist", "<plist version=\"1.0\"><array/></plist>");
   const std::string good = directory.write("good.json", "{}");
-  const std::string noBag = directory.write("no-bag.plist", "<plist version=\"1.0\"><dict/></plist>");
   const std::vector<std::pair<std::vector<std::string>, std::string>> table{
       {{"sign", broken, "-k", key}, "broken.json"},
       {{"sign", list, "-k", key}, "must be a dictionary"},
       {{"sign", good, "-k", good}, "no private key"},
       {{"sign", good, "-k", key, "-o", directory / "no/such/place"}, "cannot write"},
-      {{"show", noBag}, "no \"signature\""},
+      {{"show", list}, "is not a dictionary"},
       {{"verify", good, "-k", good}, "no property list"},
   };
   for (const auto& [arguments, expected] : table) {
@@ -109,17 +109,22 @@ TEST(OrvantactlProgramTest, TellsByItsStatusWhatWentWrong) {
   }
 }
 
-TEST(StorebagFileTest, RefusesDamagedDocuments) {
-  const auto open = [](const std::string& body) {
-    const std::string text = "<plist version=\"1.0\"><dict>" + body + "</dict></plist>";
-    return openStorebag({reinterpret_cast<const std::uint8_t*>(text.data()), text.size()});
-  };
+TEST(StorebagFileTest, SaysWhatIsWrongWithADocument) {
   const std::string signature = "<key>signature</key><string>AAAA</string>";
-  EXPECT_FALSE(open(signature));
-  EXPECT_FALSE(open(signature + "<key>bag</key><integer>1</integer>"));
-  EXPECT_FALSE(open(signature + "<key>bag</key><string>A</string>"));
-  EXPECT_FALSE(open(signature + "<key>bag</key><string>AAAA</string>"));
-  EXPECT_TRUE(open(signature + "<key>bag</key><string>PHBsaXN0PjxkaWN0Lz48L3BsaXN0Pg==</string>"));
+  const std::pair<std::string, const char*> rows[] = {
+      {"", "has no \"signature\""},
+      {signature, "has no \"bag\""},
+      {signature + "<key>bag</key><integer>1</integer>", "is not a string"},
+      {signature + "<key>bag</key><string>A</string>", "is not base64"},
+      {signature + "<key>bag</key><string>AAAA</string>", "the bag inside"},
+      {signature + "<key>bag</key><string>PHBsaXN0PjxkaWN0Lz48L3BsaXN0Pg==</string>", ""},
+  };
+  for (const auto& [body, reason] : rows) {
+    const std::string text = "<plist version=\"1.0\"><dict>" + body + "</dict></plist>";
+    const auto content = openStorebag(test::bytesOf(text));
+    EXPECT_EQ(content.ok(), *reason == '\0') << body;
+    EXPECT_THAT(content ? std::string() : content.error(), HasSubstr(reason)) << body;
+  }
 }
 
 TEST(CollectorProgramTest, TellsItsPlacesAndEndsOnSigterm) {
