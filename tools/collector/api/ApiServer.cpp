@@ -1,12 +1,13 @@
 #include "tools/collector/api/ApiServer.h"
 
+#include <httplib.h>
+
 #include <charconv>
 #include <limits>
 #include <thread>
 #include <utility>
 
 #include "platform/codec/Json.h"
-#include "tools/collector/api/ApiRoutes.h"
 #include "tools/collector/servers/BackendConnections.h"
 
 namespace orvanta::collector {

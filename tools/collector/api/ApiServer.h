@@ -12,6 +12,12 @@
 #include "tools/collector/store/Exchanges.h"
 #include "tools/collector/store/Inbox.h"
 
+namespace httplib {
+class Server;
+struct Request;
+struct Response;
+}  // namespace httplib
+
 namespace orvanta::collector {
 
 // The parts that the URLs read and change. Each is thread-safe and outlives the server.
@@ -34,5 +40,19 @@ class ApiServer {
   virtual ~ApiServer() = default;
   virtual std::uint16_t port() const = 0;
 };
+
+// --- For the files that add the routes ---
+
+// Adds the routes of one purpose each. Of two routes that match a request, the library takes the one added first, so
+// that ReceivingRoutes, which takes posts to any path, goes last. `context` outlives the server.
+void addListingRoutes(httplib::Server& server, const ApiContext& context);
+void addControlRoutes(httplib::Server& server, const ApiContext& context);
+void addReceivingRoutes(httplib::Server& server, const ApiContext& context);
+
+// Returns the request as the relay read it. Returns null, and answers 403, if it did not come through the relay.
+std::shared_ptr<const ReceivedRequest> requestOf(const httplib::Request& request, httplib::Response& response,
+                                                 const ApiContext& context);
+void answerJson(httplib::Response& response, const Value& value, int status = 200);
+void answerError(httplib::Response& response, int status, const std::string& reason);
 
 }  // namespace orvanta::collector

@@ -1,8 +1,10 @@
+#include <httplib.h>
+
 #include <functional>
 #include <utility>
 
 #include "platform/codec/Json.h"
-#include "tools/collector/api/ApiRoutes.h"
+#include "tools/collector/api/ApiServer.h"
 #include "tools/collector/api/ControlSettings.h"
 
 // The URLs that change how the collector answers.

@@ -1,11 +1,12 @@
 #include <fmt/format.h>
+#include <httplib.h>
 
 #include <charconv>
 #include <optional>
 #include <utility>
 
 #include "platform/core/WholeFile.h"
-#include "tools/collector/api/ApiRoutes.h"
+#include "tools/collector/api/ApiServer.h"
 #include "tools/collector/store/ReceivedRecords.h"
 
 // The URLs that list what has been received.

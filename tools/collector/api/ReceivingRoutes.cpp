@@ -1,8 +1,9 @@
 #include <fmt/format.h>
+#include <httplib.h>
 
 #include <utility>
 
-#include "tools/collector/api/ApiRoutes.h"
+#include "tools/collector/api/ApiServer.h"
 
 // The URLs for daemons: storebags, posts of events, log data, uploads.
 
