@@ -124,7 +124,7 @@ bool RelayConnection::handleOne() {
   if (text && !text.value()) return false;
   if (!text) {
     // If the stream ended inside the head, no client is left to answer.
-    return text.error().find("too long") != std::string::npos && refuse(request, 431, text.error());
+    return text.error() == MessageReader::kHeadTooLong && refuse(request, 431, text.error());
   }
   auto head = parseRequestHead(*text.value());
   if (!head) return refuse(request, 400, head.error());

@@ -53,7 +53,7 @@ Result<std::optional<std::string>> MessageReader::readHead() {
       return head;
     }
     searched = _buffer.size();
-    if (searched > kMaximumHeadBytes) return Failure{"the head is too long"};
+    if (searched > kMaximumHeadBytes) return Failure{kHeadTooLong};
     if (!fill()) {
       if (_buffer.empty()) return std::optional<std::string>();
       return Failure{"the stream ended inside a head"};

@@ -17,6 +17,8 @@ class MessageReader {
   explicit MessageReader(Transport& stream) : _stream(stream) {}
 
   static constexpr std::size_t kMaximumHeadBytes = 64U << 10U;
+  // The error by which callers tell a head that is too long from a stream that has ended.
+  static constexpr const char* kHeadTooLong = "the head is too long";
 
   // The next head with its empty line; nullopt if the stream ended before a head began; a failure if it ended inside
   // the head or the head is too long.
