@@ -9,9 +9,9 @@
 #include <random>
 #include <stdexcept>
 
+#include "interface/RemoteCalls.h"
 #include "platform/codec/MessagePack.h"
 #include "platform/ipc/Connection.h"
-#include "platform/ipc/FrameDecoder.h"
 
 namespace orvanta::bench {
 
@@ -49,7 +49,7 @@ void CallDriver::read(std::size_t length) {
 std::size_t CallDriver::call(const std::vector<std::uint8_t>& message) {
   write(message.data(), message.size());
   std::size_t size = 0;
-  platform::FrameDecoder decoder;
+  platform::FrameDecoder decoder(kFrameLimits);
   for (;;) {
     auto outcome = decoder.next();
     if (const auto* frame = std::get_if<platform::Frame>(&outcome)) {

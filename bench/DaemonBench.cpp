@@ -8,7 +8,7 @@
 #include "bench/CallDriver.h"
 #include "bench/RawPeers.h"
 #include "bench/Stages.h"
-#include "platform/ipc/FrameDecoder.h"
+#include "interface/RemoteCalls.h"
 
 namespace orvanta::bench {
 
@@ -56,7 +56,7 @@ void benchCallPath() {
   echoDriver.pipeline(burst, kNilAnswer, kCalls, kWindow);
   const double echoCpu = figureOf(echoTime, kCalls).cpuPerEvent;
   const auto decode = measure(0.5, [&] {
-    platform::FrameDecoder decoder;
+    platform::FrameDecoder decoder(kFrameLimits);
     decoder.append(call);
     return std::get<platform::Frame>(decoder.next()).params.size();
   });

@@ -19,8 +19,8 @@
 #include "bench/RawPeers.h"
 #include "bench/Stages.h"
 #include "config/MessageLog.h"
+#include "interface/RemoteCalls.h"
 #include "platform/core/UniqueFd.h"
-#include "platform/ipc/FrameDecoder.h"
 #include "tests/support/TestPlatform.h"
 
 // The dashboard path with its message-log line, and that line alone.
@@ -84,7 +84,7 @@ double rawEcho(const std::string& path, const std::vector<std::uint8_t>& call, s
   const Stretch time(echo.pid());
   driver.pipeline(repeated(call, kWindow), answerSize, kCalls, kWindow);
   const auto decode = measure(kSeconds / 2, [&] {
-    platform::FrameDecoder decoder;
+    platform::FrameDecoder decoder(kFrameLimits);
     decoder.append(call);
     return std::get<platform::Frame>(decoder.next()).params.size();
   });

@@ -21,8 +21,8 @@
 #include "bench/CallDriver.h"
 #include "bench/RawPeers.h"
 #include "config/Compression.h"
+#include "interface/RemoteCalls.h"
 #include "platform/codec/Json.h"
-#include "platform/ipc/FrameDecoder.h"
 #include "tests/support/TestPlatform.h"
 
 namespace orvanta::bench {
@@ -60,7 +60,7 @@ double benchDecode() {
   const auto message = encodeCall("sendMessageWithDictionary",
                                   {Dictionary{{"category", 5}, {"type", 6}, {"payload", samplePayload(1)}}});
   const auto figure = measure(kSeconds, [&] {
-    platform::FrameDecoder decoder;
+    platform::FrameDecoder decoder(kFrameLimits);
     decoder.append(message);
     consume(std::get<platform::Frame>(decoder.next()).params.size());
     return 1;

@@ -2,6 +2,7 @@
 
 #include <future>
 #include <tuple>
+#include <type_traits>
 #include <utility>
 
 #include "client/CallChannel.h"
@@ -27,7 +28,11 @@ CallResult<Answer> BlockingCalls::wait(MakeCall makeCall) {
       AnyReply([promise = std::move(promise)](Outcome outcome) mutable { promise.set_value(std::move(outcome)); }));
   auto outcome = answered.get();
   if (!outcome.values) return std::move(outcome.error);
-  return std::apply([](auto&&... values) { return Answer{std::move(values)...}; }, std::move(*outcome.values));
+  if constexpr (std::is_void_v<Answer>) {
+    return {};
+  } else {
+    return std::apply([](auto&&... values) { return Answer{std::move(values)...}; }, std::move(*outcome.values));
+  }
 }
 
 CallResult<BackendNames> BlockingCalls::configure(const SessionInfo& sessionInfo,
@@ -38,9 +43,9 @@ CallResult<BackendNames> BlockingCalls::configure(const SessionInfo& sessionInfo
   return startConfig();
 }
 
-CallResult<Done> BlockingCalls::setSessionInfo(SharedDictionary sessionInfo, SharedDictionary userInfo,
+CallResult<void> BlockingCalls::setSessionInfo(SharedDictionary sessionInfo, SharedDictionary userInfo,
                                                SharedArray frameworksToCheck, bool hasAggregationBlock) {
-  return wait<Done, DoneReply>([&](DoneReply reply) {
+  return wait<void, DoneReply>([&](DoneReply reply) {
     _session.setSessionInfo(std::move(sessionInfo), std::move(userInfo), std::move(frameworksToCheck),
                             hasAggregationBlock, std::move(reply));
   });

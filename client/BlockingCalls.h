@@ -4,7 +4,6 @@
 #include <optional>
 #include <string>
 
-#include "client/CallResult.h"
 #include "client/Records.h"
 #include "interface/ClientSessionInterface.h"
 
@@ -13,20 +12,32 @@ namespace orvanta {
 class CallChannel;
 class ClientSession;
 
+// The answer to a flush. `error` is the daemon's own: what kept it from sending, while the call itself worked.
+struct FlushAnswer {
+  std::optional<std::string> text;
+  std::optional<OrvantaError> error;
+};
+
+struct LogDataAnswer {
+  bool uploaded = false;
+  std::optional<OrvantaError> error;
+};
+
 // The operations of a session in a form that waits for the answer, however long the daemon takes; closing the
-// connection from another thread ends the wait. While too much waits for the daemon they wait for that too.
+// connection from another thread ends the wait. While too many bytes wait for the daemon, they wait for that first.
 //
-// A view of a ClientSession, made by its blocking() and good for as long as its connection. Any thread may call but the
-// library's callback thread: there they fail at once (wrongThread), since the answer could never come.
+// A view of a ClientSession, made by its blocking() and valid as long as its connection. Any thread may call except the
+// library's callback thread: there a call fails at once (wrongThread), since the answer could never come.
 class BlockingCalls {
  public:
   BlockingCalls(ClientSession& session, CallChannel& channel);
 
-  // Setting up in one go: setSessionInfo and startConfig, with the daemon told of the session's aggregation handler if
-  // it has one. The names of the reporting backends; none when the daemon has no storebag for the client type.
+  // Sets the session up: setSessionInfo, which also tells the daemon whether the session has an aggregation handler,
+  // and startConfig. Returns the names of the reporting backends; nullopt when the daemon has no storebag for the
+  // client type.
   CallResult<BackendNames> configure(const SessionInfo& sessionInfo, const std::optional<UserInfo>& userInfo = {});
 
-  CallResult<Done> setSessionInfo(SharedDictionary sessionInfo, SharedDictionary userInfo,
+  CallResult<void> setSessionInfo(SharedDictionary sessionInfo, SharedDictionary userInfo,
                                   SharedArray frameworksToCheck, bool hasAggregationBlock);
   CallResult<BackendNames> startConfig();
   CallResult<BackendNames> fetchStates(SharedDictionary userInfo);

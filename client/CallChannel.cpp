@@ -160,7 +160,7 @@ void CallChannel::received(Frame&& frame) {
         reply = _pending.take(frame.messageID);
       }
       _progress.notify_all();
-      deliverPending(std::move(reply), std::move(frame));
+      deliverResponse(std::move(frame), std::move(reply));
       return;
     }
     case Frame::Kind::notification:

@@ -15,7 +15,7 @@
 #include "client/CallbackThread.h"
 #include "client/PendingReplies.h"
 #include "client/UploadTokens.h"
-#include "interface/AggregatedEvent.h"
+#include "interface/ClientSessionInterface.h"
 #include "platform/core/UniqueFd.h"
 #include "platform/ipc/Connection.h"
 

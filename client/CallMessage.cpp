@@ -3,9 +3,9 @@
 #include <fmt/format.h>
 
 #include <algorithm>
+#include <cassert>
 #include <variant>
 
-#include "interface/WireLimits.h"
 #include "platform/codec/MessagePack.h"
 #include "platform/ipc/Connection.h"
 #include "platform/ipc/FrameDecoder.h"
@@ -32,7 +32,7 @@ std::vector<std::uint8_t>& threadBuffer() {
 bool fits(const Dictionary& value, std::size_t levels);
 bool fits(const Array& value, std::size_t levels);
 
-// Whether a value's containers nest at most `levels` deep.
+// Returns whether a value's containers nest at most `levels` deep.
 bool fits(const Value& value, std::size_t levels) {
   if (const auto* held = value.dictionary()) return fits(*held, levels);
   if (const auto* held = value.array()) return fits(*held, levels);
@@ -49,13 +49,13 @@ bool fits(const Array& value, std::size_t levels) {
 
 }  // namespace
 
-CallMessage::CallMessage(std::string_view method, std::size_t argumentCount, std::optional<std::uint32_t> messageID)
-    : _bytes(threadBuffer()), _method(method) {
+CallMessage::CallMessage(RemoteCallID id, std::optional<std::uint32_t> messageID)
+    : _bytes(threadBuffer()), _call(remoteCall(id)) {
   _bytes.clear();
   if (messageID) {
-    platform::appendRequestHeader(_bytes, *messageID, method, argumentCount);
+    platform::appendRequestHeader(_bytes, *messageID, _call.method, _call.arguments.size());
   } else {
-    platform::appendNotificationHeader(_bytes, method, argumentCount);
+    platform::appendNotificationHeader(_bytes, _call.method, _call.arguments.size());
   }
 }
 
@@ -64,7 +64,7 @@ CallMessage::~CallMessage() {
 }
 
 CallMessage& CallMessage::dictionary(const SharedDictionary& value) {
-  MessagePackWriter out(_bytes);
+  auto out = nextArgument();
   if (!value) {
     out.nil();
   } else if (fits(*value, kArgumentDepth)) {
@@ -76,7 +76,7 @@ CallMessage& CallMessage::dictionary(const SharedDictionary& value) {
 }
 
 CallMessage& CallMessage::array(const SharedArray& value) {
-  MessagePackWriter out(_bytes);
+  auto out = nextArgument();
   if (!value) {
     out.nil();
   } else if (fits(*value, kArgumentDepth)) {
@@ -88,40 +88,47 @@ CallMessage& CallMessage::array(const SharedArray& value) {
 }
 
 CallMessage& CallMessage::boolean(bool value) {
-  MessagePackWriter(_bytes).boolean(value);
+  nextArgument().boolean(value);
   return *this;
 }
 
 CallMessage& CallMessage::number(std::uint16_t value) {
-  MessagePackWriter(_bytes).unsignedInteger(value);
+  nextArgument().unsignedInteger(value);
   return *this;
 }
 
 CallMessage& CallMessage::text(std::string_view value) {
-  MessagePackWriter(_bytes).string(value);
+  nextArgument().string(value);
   return *this;
 }
 
 CallMessage& CallMessage::optionalText(const std::optional<std::string>& value) {
   if (value) return text(*value);
-  MessagePackWriter(_bytes).nil();
+  nextArgument().nil();
   return *this;
 }
 
+MessagePackWriter CallMessage::nextArgument() {
+  assert(_given < _call.arguments.size());
+  ++_given;
+  return MessagePackWriter(_bytes);
+}
+
 std::optional<std::string> CallMessage::problem() const {
+  assert(_given == _call.arguments.size());
   if (_tooDeep) {
-    return fmt::format("{}: the values nest deeper than {} levels", _method, kArgumentDepth);
+    return fmt::format("{}: the values nest deeper than {} levels", _call.method, kArgumentDepth);
   }
   if (_bytes.size() > kMaximumFrameBytes) {
-    return fmt::format("{}: the call takes {} bytes, the limit is {}", _method, _bytes.size(), kMaximumFrameBytes);
+    return fmt::format("{}: the call takes {} bytes, the limit is {}", _call.method, _bytes.size(), kMaximumFrameBytes);
   }
   if (_bytes.size() > kHarmlessBytes) {
-    // Rare enough to let the daemon's own judge decide beforehand.
-    platform::FrameDecoder decoder({kMaximumFrameBytes, kMaximumFrameCharge, kMaximumFrameDepth});
+    // Rare enough to let the decoder that the daemon uses decide beforehand.
+    platform::FrameDecoder decoder(kFrameLimits);
     decoder.append(_bytes);
     const auto outcome = decoder.next();
     if (const auto* error = std::get_if<platform::FrameDecoder::ProtocolError>(&outcome)) {
-      return fmt::format("{}: {}", _method, error->text);
+      return fmt::format("{}: {}", _call.method, error->text);
     }
   }
   return std::nullopt;

@@ -7,18 +7,20 @@
 #include <string_view>
 #include <vector>
 
-#include "interface/ClientSessionInterface.h"
+#include "interface/RemoteCalls.h"
+#include "platform/codec/MessagePack.h"
 
 namespace orvanta {
 
-// One call as it goes over the wire, put together argument by argument in the operation's declared order.
+// One call as it goes over the wire: its name comes from the table of calls, its arguments are appended one by one in
+// the table's order, all of them.
 //
 // Made and used up on the calling thread; the bytes sit in a buffer that the thread's calls share, so that a call costs
 // no allocation: one CallMessage at a time per thread.
 class CallMessage {
  public:
-  // A request under `messageID`, or a notification when nobody waits for the answer.
-  CallMessage(std::string_view method, std::size_t argumentCount, std::optional<std::uint32_t> messageID);
+  // A request under `messageID`, or a notification without one.
+  CallMessage(RemoteCallID id, std::optional<std::uint32_t> messageID);
   CallMessage(const CallMessage&) = delete;
   CallMessage& operator=(const CallMessage&) = delete;
   ~CallMessage();
@@ -31,12 +33,15 @@ class CallMessage {
   CallMessage& optionalText(const std::optional<std::string>& value);
 
   const std::vector<std::uint8_t>& bytes() const { return _bytes; }
-  // Why the daemon would end the connection over this message (too large, too deep); none when it is fine.
+  // Why the daemon would end the connection over this message (too large, too deep); nullopt when it would not.
   std::optional<std::string> problem() const;
 
  private:
+  platform::MessagePackWriter nextArgument();
+
   std::vector<std::uint8_t>& _bytes;
-  const std::string_view _method;
+  const RemoteCall& _call;
+  std::size_t _given = 0;  // arguments appended
   bool _tooDeep = false;
 };
 

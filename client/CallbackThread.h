@@ -3,7 +3,7 @@
 #include <memory>
 #include <thread>
 
-#include "client/CallResult.h"
+#include "interface/Reply.h"
 
 namespace orvanta::platform {
 class WorkPool;

@@ -10,14 +10,14 @@ namespace orvanta {
 
 namespace {
 
-// A call under way: the id under which its answer comes, if anybody waits for that, and its bytes.
+// A call under way: its bytes, and the id under which its answer comes if the caller wants one.
 class Call {
  public:
   template <class AnyReply>
-  Call(CallChannel& channel, std::string_view method, std::size_t argumentCount, AnyReply&& reply)
+  Call(CallChannel& channel, RemoteCallID id, AnyReply&& reply)
       : _channel(channel),
         _messageID(reply ? channel.nextMessageID() : 0),
-        message(method, argumentCount, reply ? std::optional(_messageID) : std::nullopt) {
+        message(id, reply ? std::optional(_messageID) : std::nullopt) {
     if (reply) _reply = std::forward<AnyReply>(reply);
   }
   void send(platform::UniqueFd descriptor = {}) {
@@ -51,48 +51,48 @@ bool ClientSession::hasAggregationHandler() const {
 void ClientSession::setSessionInfo(SharedDictionary sessionInfo, SharedDictionary userInfo,
                                    SharedArray frameworksToCheck, bool hasAggregationBlock, DoneReply done) {
   if (hasAggregationBlock) _channel->expectAggregation();
-  Call call(*_channel, "setSessionInfo", 4, std::move(done));
+  Call call(*_channel, RemoteCallID::setSessionInfo, std::move(done));
   call.message.dictionary(sessionInfo).dictionary(userInfo).array(frameworksToCheck).boolean(hasAggregationBlock);
   call.send();
 }
 
 void ClientSession::startConfigWithCompletionHandler(BackendNamesReply completion) {
-  Call(*_channel, "startConfigWithCompletionHandler", 0, std::move(completion)).send();
+  Call(*_channel, RemoteCallID::startConfigWithCompletionHandler, std::move(completion)).send();
 }
 
 void ClientSession::fetchStatesWithUserInfo(SharedDictionary userInfo, BackendNamesReply completion) {
-  Call call(*_channel, "fetchStatesWithUserInfo", 1, std::move(completion));
+  Call call(*_channel, RemoteCallID::fetchStatesWithUserInfo, std::move(completion));
   call.message.dictionary(userInfo);
   call.send();
 }
 
 void ClientSession::fetchDisplayURL(StringReply reply) {
-  Call(*_channel, "fetchDisplayURL", 0, std::move(reply)).send();
+  Call(*_channel, RemoteCallID::fetchDisplayURL, std::move(reply)).send();
 }
 
 void ClientSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type, SharedDictionary payload,
                                             StringReply reply) {
-  Call call(*_channel, "sendMessageWithCategory", 3, std::move(reply));
+  Call call(*_channel, RemoteCallID::sendMessageWithCategory, std::move(reply));
   call.message.number(category).number(type).dictionary(payload);
   call.send();
 }
 
 void ClientSession::sendMessageWithDictionary(SharedDictionary parameters, StringReply reply) {
-  Call call(*_channel, "sendMessageWithDictionary", 1, std::move(reply));
+  Call call(*_channel, RemoteCallID::sendMessageWithDictionary, std::move(reply));
   call.message.dictionary(parameters);
   call.send();
 }
 
 void ClientSession::flushMessagesWithCompletion(FlushReply completion) {
-  Call(*_channel, "flushMessagesWithCompletion", 0, std::move(completion)).send();
+  Call(*_channel, RemoteCallID::flushMessagesWithCompletion, std::move(completion)).send();
 }
 
 void ClientSession::finishSessionWithReply(StringReply reply) {
-  Call(*_channel, "finishSessionWithReply", 0, std::move(reply)).send();
+  Call(*_channel, RemoteCallID::finishSessionWithReply, std::move(reply)).send();
 }
 
 void ClientSession::uploadLogData(SharedArray logData, LogDataReply completion) {
-  Call call(*_channel, "uploadLogData", 1, std::move(completion));
+  Call call(*_channel, RemoteCallID::uploadLogData, std::move(completion));
   call.message.array(logData);
   call.send();
 }
@@ -100,7 +100,7 @@ void ClientSession::uploadLogData(SharedArray logData, LogDataReply completion) 
 void ClientSession::sendMessageWithSessionInfo(SharedDictionary sessionInfo, SharedDictionary userInfo,
                                                std::uint16_t category, std::uint16_t type, SharedDictionary payload,
                                                StringReply reply) {
-  Call call(*_channel, "sendMessageWithSessionInfo", 5, std::move(reply));
+  Call call(*_channel, RemoteCallID::sendMessageWithSessionInfo, std::move(reply));
   call.message.dictionary(sessionInfo).dictionary(userInfo).number(category).number(type).dictionary(payload);
   call.send();
 }
@@ -108,7 +108,7 @@ void ClientSession::sendMessageWithSessionInfo(SharedDictionary sessionInfo, Sha
 void ClientSession::uploadFileAtPath(std::string fileURL, std::optional<std::string> extensionToken,
                                      UploadReply completion) {
   if (!extensionToken) {
-    Call call(*_channel, "uploadFileAtPath", 2, std::move(completion));
+    Call call(*_channel, RemoteCallID::uploadFileAtPath, std::move(completion));
     call.message.text(fileURL).optionalText(extensionToken);
     call.send();
     return;
@@ -144,7 +144,7 @@ void ClientSession::uploadFile(const std::string& path, std::optional<std::strin
       completion.fail(std::move(outcome.error));
     }
   });
-  Call call(*_channel, "uploadFileAtPath", 2, std::move(ended));
+  Call call(*_channel, RemoteCallID::uploadFileAtPath, std::move(ended));
   call.message.text(fileURLForPath(opened->path)).text(opened->token);
   call.send(std::move(opened->descriptor));
 }

@@ -7,7 +7,6 @@
 #include <string>
 
 #include "client/BlockingCalls.h"
-#include "interface/AggregatedEvent.h"
 #include "interface/ClientSessionInterface.h"
 
 namespace orvanta {

@@ -10,7 +10,7 @@
 
 #include "client/CallChannel.h"
 #include "interface/OrvantaConstants.h"
-#include "interface/WireLimits.h"
+#include "interface/RemoteCalls.h"
 #include "platform/ipc/Connect.h"
 #include "platform/ipc/Connection.h"
 
@@ -58,8 +58,7 @@ CallResult<platform::UniqueFd> connectSocket(const std::string& directory) {
 }
 
 platform::ConnectionLimits limits() {
-  platform::ConnectionLimits limits;
-  limits.frame = {kMaximumFrameBytes, kMaximumFrameCharge, kMaximumFrameDepth};
+  auto limits = kDaemonConnectionLimits;
   // What waits to be sent must not keep answers from being read: a daemon that waits for its answers to be read reads
   // no more calls either. The channel has a limit of its own.
   limits.maximumUnreadReplies = SIZE_MAX;

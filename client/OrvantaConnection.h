@@ -6,9 +6,10 @@
 #include <memory>
 #include <string>
 
-#include "client/CallResult.h"
 #include "client/CallbackThread.h"
 #include "client/ClientSession.h"
+#include "interface/Reply.h"
+#include "interface/WireLimits.h"
 
 namespace orvanta {
 
@@ -19,9 +20,9 @@ struct ConnectionOptions {
   // Null: the connection starts a thread of its own for its callbacks.
   std::shared_ptr<CallbackThread> callbackThread{};
   // Bytes of calls that the daemon has not read yet. Above it a call fails at once, and one that waits waits.
-  std::size_t maximumWaitingBytes = 64U << 20U;
+  std::size_t maximumWaitingBytes = kMaximumUnreadCalls;
   // How long close() and the destructor let calls that were sent go out to a daemon that is slow to read.
-  std::chrono::milliseconds closingTime{2000};
+  std::chrono::milliseconds closingTime = kClosingTime;
 };
 
 // A connection to the daemon, which is one session there: it lives from connect() until close(), the destructor, or the

@@ -3,19 +3,7 @@
 #include <type_traits>
 #include <utility>
 
-#include "interface/RemoteCalls.h"
-
 namespace orvanta {
-
-void deliverPending(PendingReply&& reply, platform::Frame&& response) {
-  std::visit(
-      [&response](auto& held) {
-        if constexpr (!std::is_same_v<std::decay_t<decltype(held)>, std::monostate>) {
-          deliverResponse(std::move(response), std::move(held));
-        }
-      },
-      reply);
-}
 
 void failPending(PendingReply&& reply, const CallError& error) {
   std::visit(

@@ -3,27 +3,21 @@
 #include <cstddef>
 #include <cstdint>
 #include <map>
-#include <variant>
 
-#include "interface/ClientSessionInterface.h"
-#include "platform/ipc/FrameDecoder.h"
+#include "interface/RemoteCalls.h"
 
 namespace orvanta {
 
-// Whoever waits for the answer to one call; monostate: nobody.
-using PendingReply =
-    std::variant<std::monostate, DoneReply, BackendNamesReply, StringReply, FlushReply, UploadReply, LogDataReply>;
-
-// Gives a reply its answer, or the reason why there is none. Calls into the program.
-void deliverPending(PendingReply&& reply, platform::Frame&& response);
+// Fails a reply, whatever its kind. Calls into the program.
 void failPending(PendingReply&& reply, const CallError& error);
 
-// The calls of one connection that have not been answered, by message id. Not thread-safe.
+// The calls of one connection that have not been answered, by message id: the channel adds one before its bytes go out,
+// and takes it when the response comes or fails all when the connection ends. Not thread-safe: the channel locks.
 class PendingReplies {
  public:
-  // False, with nothing taken, when the id is in use.
+  // Returns false, and leaves the reply alone, when the id is in use.
   bool add(std::uint32_t messageID, PendingReply&& reply);
-  // monostate for an id nobody waits for.
+  // Returns monostate for an id under which no reply waits.
   PendingReply take(std::uint32_t messageID);
   // Fails all of them, in the order of their ids.
   void failAll(const CallError& error);

@@ -9,7 +9,7 @@
 #include <optional>
 #include <string>
 
-#include "client/CallResult.h"
+#include "interface/Reply.h"
 #include "interface/WireLimits.h"
 #include "platform/core/UniqueFd.h"
 

@@ -7,6 +7,8 @@
 #include "daemon/StartupChecks.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
+#include "interface/RemoteCalls.h"
+#include "interface/WireLimits.h"
 #include "platform/host/KeepAlive.h"
 #include "platform/host/Process.h"
 #include "platform/listen/Listener.h"
@@ -33,10 +35,11 @@ int main() {
   if (!closeDaemonSandbox(*sandbox)) return -1;
   const auto device = makeDaemonPlatform(files);
   OrvantadAgent agent(*device);
-  auto listener =
-      platform::Listener::create(device->pool(), std::move(*socket), [&agent](platform::OfferedConnection&& offered) {
-        return agent.listenerShouldAcceptNewConnection(std::move(offered));
-      });
+  auto listener = platform::Listener::create(device->pool(), std::move(*socket),
+                                             {kDaemonConnectionLimits, kMaximumConnectionsPerUser},
+                                             [&agent](platform::OfferedConnection&& offered) {
+                                               return agent.listenerShouldAcceptNewConnection(std::move(offered));
+                                             });
   warnOfUselessConfiguration(*device);
   device->pool().start();
   listener->resume();

@@ -17,14 +17,13 @@ using StringReply = Reply<std::optional<std::string>>;
 using FlushReply = Reply<std::optional<std::string>, std::optional<OrvantaError>>;
 using UploadReply = Reply<bool>;
 using LogDataReply = Reply<bool, std::optional<OrvantaError>>;
-using DoneReply =
-    Reply<>;  // for operations without a reply block: tells a waiting client that the call was carried out
+using DoneReply = Reply<>;  // of operations without values: tells a waiting client that the call was carried out
 
 // What a client calls on the daemon: the eleven operations, in their declared order. Implemented by the daemon's
 // session and by the client's proxy; interface/RemoteCalls.h carries calls from one to the other.
 //
-// Calls of one connection are carried out one at a time in the order in which they were made. A reply is an empty
-// object when the client wants none. Dictionaries and arrays are shared and never changed; null is "none".
+// Calls of one connection are carried out one at a time in the order in which they were made. A reply is empty when the
+// client does not want one. Dictionaries and arrays are shared and never changed; a null one was not given.
 class ClientSessionInterface {
  public:
   virtual ~ClientSessionInterface() = default;
@@ -46,6 +45,25 @@ class ClientSessionInterface {
   virtual void sendMessageWithSessionInfo(SharedDictionary sessionInfo, SharedDictionary userInfo,
                                           std::uint16_t category, std::uint16_t type, SharedDictionary payload,
                                           StringReply reply) = 0;
+};
+
+// What the daemon passes on to an aggregating client: one event, or the notice that aggregation has ended.
+struct AggregatedEvent {
+  SharedDictionary sessionInfo;  // of the session where the event entered; null in the end notice
+  double timestamp = 0;          // seconds since 1970
+  std::uint16_t category = 0;
+  std::uint16_t type = 0;
+  SharedDictionary payload;  // with the user info of the session where the event entered; null if there was neither
+  bool isEndNotice() const { return !sessionInfo && timestamp == 0 && category == 0 && type == 0 && !payload; }
+};
+
+// What the daemon calls on its client: one-way, without a reply.
+class ClientSessionReplyInterface {
+ public:
+  virtual ~ClientSessionReplyInterface() = default;
+  // One aggregated event, in the parts of AggregatedEvent. All null or zero: aggregation for the session has ended.
+  virtual void sendMessageToClient(const SharedDictionary& sessionInfo, double timestamp, std::uint16_t category,
+                                   std::uint16_t type, const SharedDictionary& payload) = 0;
 };
 
 }  // namespace orvanta

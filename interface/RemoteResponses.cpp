@@ -1,8 +1,10 @@
+#include <type_traits>
 #include <utility>
 
 #include "interface/RemoteCalls.h"
 
-// The client's side of replies: from a response frame to the values that the caller waits for.
+// The client's side of replies: from a response frame to the values that the caller waits for. Each read() takes one
+// value as RemoteDispatch.cpp wrote it, and returns false for another type.
 
 namespace orvanta {
 using platform::Frame;
@@ -42,19 +44,16 @@ bool read(Value& value, std::optional<OrvantaError>& out) {
   if (value.isNull()) return true;
   const auto* map = value.dictionary();
   if (map == nullptr) return false;
-  const Value* domain = map->find("domain");
+  const auto* domain = map->text("domain");
   const Value* code = map->find("code");
-  const Value* description = map->find("description");
-  if (domain == nullptr || domain->string() == nullptr || code == nullptr || !code->isInteger() ||
-      description == nullptr || description->string() == nullptr) {
-    return false;
-  }
-  out = OrvantaError{*domain->string(), static_cast<std::int32_t>(code->integerValue()), *description->string()};
+  const auto* description = map->text("description");
+  if (domain == nullptr || code == nullptr || !code->isInteger() || description == nullptr) return false;
+  out = OrvantaError{*domain, static_cast<std::int32_t>(code->integerValue()), *description};
   return true;
 }
 
-template <class... Values, std::size_t... Index>
-void deliver(Frame& frame, Reply<Values...>& reply, std::index_sequence<Index...> /*indices*/) {
+template <class... Values>
+void deliver(Frame& frame, Reply<Values...>& reply) {
   if (frame.refusal) return reply.fail({"the daemon's response is malformed: " + *frame.refusal});
   if (!frame.error.isNull()) {
     const auto* text = frame.error.string();
@@ -62,37 +61,24 @@ void deliver(Frame& frame, Reply<Values...>& reply, std::index_sequence<Index...
   }
   auto* results = frame.result.array();
   std::tuple<Values...> values;
-  if (results == nullptr || results->size() != sizeof...(Values) ||
-      !(read((*results)[Index], std::get<Index>(values)) && ...)) {
+  const auto readAll = [results](auto&... value) {
+    [[maybe_unused]] std::size_t next = 0;
+    return (read((*results)[next++], value) && ...);
+  };
+  if (results == nullptr || results->size() != sizeof...(Values) || !std::apply(readAll, values)) {
     return reply.fail({"the daemon's response has an unexpected shape"});
   }
   std::apply([&reply](auto&... value) { reply(std::move(value)...); }, values);
 }
 
-template <class... Values>
-void deliverAny(Frame& frame, Reply<Values...>& reply) {
-  deliver(frame, reply, std::index_sequence_for<Values...>{});
-}
-
 }  // namespace
 
-void deliverResponse(Frame&& frame, BackendNamesReply reply) {
-  deliverAny(frame, reply);
-}
-void deliverResponse(Frame&& frame, StringReply reply) {
-  deliverAny(frame, reply);
-}
-void deliverResponse(Frame&& frame, FlushReply reply) {
-  deliverAny(frame, reply);
-}
-void deliverResponse(Frame&& frame, UploadReply reply) {
-  deliverAny(frame, reply);
-}
-void deliverResponse(Frame&& frame, LogDataReply reply) {
-  deliverAny(frame, reply);
-}
-void deliverResponse(Frame&& frame, DoneReply reply) {
-  deliverAny(frame, reply);
+void deliverResponse(Frame&& frame, PendingReply reply) {
+  std::visit(
+      [&frame]<class Held>(Held& held) {
+        if constexpr (!std::is_same_v<Held, std::monostate>) deliver(frame, held);
+      },
+      reply);
 }
 
 }  // namespace orvanta

@@ -5,14 +5,15 @@
 #include <tuple>
 #include <utility>
 
+#include "interface/Values.h"
 #include "platform/core/UniqueFunction.h"
 
 namespace orvanta {
 
-// Why a call brought no reply, for programs; people read the text.
+// Why a call failed, for programs; people read the text.
 enum class CallErrorKind {
   refused,          // the peer refused the call or dropped its reply; the text is the peer's
-  noSuchService,    // nobody listens on the service's socket
+  noSuchService,    // no process listens on the service's socket
   notEntitled,      // the daemon closed the connection before it answered anything
   connectionLost,   // the connection ended before the answer came
   tooMuchWaiting,   // not sent: what the daemon has not read yet is over the limit
@@ -20,21 +21,25 @@ enum class CallErrorKind {
   wrongThread,      // not sent: a call that waits was made on the thread that brings the replies
 };
 
-// Why a call brought no reply: the transport's own text (connection lost, call refused, reply dropped).
 struct CallError {
   std::string text;
   CallErrorKind kind = CallErrorKind::refused;
 };
 
-// The result of a call: the reply's values, or the reason why there are none.
+// What a call that waits returns: its answer, or the reason why there is none.
+template <class T>
+using CallResult = Result<T, CallError>;
+
+// What a call that does not wait is answered with: the reply's values, or, while they are nullopt, the reason.
 template <class... Values>
 struct ReplyOutcome {
   std::optional<std::tuple<Values...>> values;
   CallError error;
 };
 
-// A reply that somebody waits for. Move-only; called at most once, from any thread; dropped uncalled it reports that as
-// an error, so that no caller waits in silence. Empty when nobody waits; calling an empty reply does nothing.
+// The way back of one call's answer. Move-only; called at most once, from any thread; destroyed uncalled it reports
+// that as an error, so that every caller hears the end of its call. Empty when the caller does not want an answer;
+// calling an empty reply does nothing.
 template <class... Values>
 class Reply {
  public:
@@ -55,13 +60,11 @@ class Reply {
   Reply& operator=(const Reply&) = delete;
   ~Reply() { reportDropped(); }
 
-  // Whether anybody waits: a value nobody wants need not be made.
+  // Returns whether the caller wants an answer: else its values need not be made.
   explicit operator bool() const noexcept { return static_cast<bool>(_receiver); }
 
   void operator()(Values... values) { deliver(Outcome{std::tuple<Values...>(std::move(values)...), {}}); }
   void fail(CallError error) { deliver(Outcome{std::nullopt, std::move(error)}); }
-  // Forgets about the reply without reporting anything.
-  void dismiss() noexcept { _receiver.reset(); }
 
  private:
   void deliver(Outcome outcome) {
@@ -73,7 +76,7 @@ class Reply {
     if (!_receiver) return;
     try {
       fail(CallError{"the reply was dropped without being given"});
-    } catch (...) {  // NOLINT(bugprone-empty-catch): a destructor has nobody to tell
+    } catch (...) {  // NOLINT(bugprone-empty-catch): a destructor cannot report it
     }
   }
 

@@ -4,7 +4,7 @@
 #include <memory>
 #include <string_view>
 
-#include "interface/ClientSessionReplyInterface.h"
+#include "interface/ClientSessionInterface.h"
 #include "interface/Values.h"
 #include "platform/ipc/Connection.h"
 

@@ -6,18 +6,16 @@
 #include "backends/upload/UploadURL.h"
 #include "config/Compression.h"
 #include "interface/OrvantaLogging.h"
+#include "interface/WireLimits.h"
 #include "platform/core/Utf8.h"
 
 namespace orvanta {
 
 namespace {
 
-// Files of /proc and /sys do not tell their size. One is taken up to this.
-constexpr std::uint64_t kUnsizedBytes = 1U << 20U;
-
 // What is read at most. One byte beyond the bound tells a whole file from the start of one.
 std::uint64_t bytesToRead(std::uint64_t size) {
-  return size > 0 ? size : kUnsizedBytes + 1;
+  return size > 0 ? size : kMaximumUnsizedUploadBytes + 1;
 }
 
 std::optional<std::string> textAt(const SharedDictionary& dictionary, std::string_view key) {
@@ -34,9 +32,9 @@ std::optional<std::string> compressedContent(const platform::ExtensionHandle& ha
     ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): Input file is empty");
     return std::nullopt;
   }
-  if (size == 0 && content->size() > kUnsizedBytes) {
+  if (size == 0 && content->size() > kMaximumUnsizedUploadBytes) {
     ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): The file does not tell its size and has more than {} bytes.",
-                kUnsizedBytes);
+                kMaximumUnsizedUploadBytes);
     return std::nullopt;
   }
   return gzipDeflate(*content);

@@ -16,6 +16,9 @@ int main() {
   if (!reply) return std::cerr << reply.error().text << '\n', 1;
   std::cout << reply->value_or("(taken)") << '\n';
 
-  calls.finishSession();
-  calls.flushMessages();
+  if (const auto finished = calls.finishSession(); !finished) return std::cerr << finished.error().text << '\n', 1;
+  const auto flushed = calls.flushMessages();
+  if (!flushed) return std::cerr << flushed.error().text << '\n', 1;
+  // An event that was sent at once leaves nothing to flush, and the daemon says so as an error of its own.
+  if (flushed->error) std::cerr << flushed->error->description << '\n';
 }

@@ -15,8 +15,8 @@ namespace orvanta::platform {
 // What a decoder accepts. Depth counts the outermost array; `maximumCharge` bounds what the decoded values take in
 // memory, so that a small message cannot become a large one.
 struct MessagePackLimits {
-  std::size_t maximumDepth = 64;
-  std::size_t maximumCharge = 256U << 20U;
+  std::size_t maximumDepth = 0;
+  std::size_t maximumCharge = 0;
 };
 
 // Appends MessagePack to a byte buffer. Integers take their shortest form, doubles float64, dates the shortest
@@ -45,6 +45,6 @@ class MessagePackWriter {
 
 // Decodes exactly one value that fills `bytes`. Refuses, with the offset: truncated or trailing bytes, unknown
 // extension types, map keys that are not text, duplicate keys, text that is not UTF-8, anything over the limits.
-Result<Value> decodeMessagePack(std::span<const std::uint8_t> bytes, const MessagePackLimits& limits = {});
+Result<Value> decodeMessagePack(std::span<const std::uint8_t> bytes, const MessagePackLimits& limits);
 
 }  // namespace orvanta::platform

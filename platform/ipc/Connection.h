@@ -15,11 +15,12 @@
 
 namespace orvanta::platform {
 
+// Bytes, and a number of descriptors; nothing unless set.
 struct ConnectionLimits {
   FrameLimits frame;
-  std::size_t maximumUnreadReplies = 1U << 20U;  // above this nothing more is read from the peer
-  std::size_t maximumDroppable = 4U << 20U;      // above this droppable messages are dropped
-  std::size_t maximumWaitingDescriptors = 16;    // above this: protocol error
+  std::size_t maximumUnreadReplies = 0;       // above this nothing more is read from the peer
+  std::size_t maximumDroppable = 0;           // above this droppable messages are dropped
+  std::size_t maximumWaitingDescriptors = 0;  // above this: protocol error
 };
 
 // The sending half of a connection. Shared by the connection and, weakly, by reply handles; outlives neither's need.
@@ -63,7 +64,7 @@ class ConnectionDelegate {
 // get their turn.
 class Connection : public std::enable_shared_from_this<Connection> {
  public:
-  static std::shared_ptr<Connection> create(WorkPool& pool, UniqueFd socket, ConnectionLimits limits = {});
+  static std::shared_ptr<Connection> create(WorkPool& pool, UniqueFd socket, ConnectionLimits limits);
   virtual ~Connection() = default;
 
   // Once.

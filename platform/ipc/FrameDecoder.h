@@ -31,10 +31,11 @@ struct Frame {
   std::size_t charge = 0;    // what its values take in memory, about
 };
 
+// Whoever opens a connection says what it takes; nothing unless set.
 struct FrameLimits {
-  std::size_t maximumFrame = 64U << 20U;  // bytes on the wire
-  std::size_t maximumCharge = 256U << 20U;
-  std::size_t maximumDepth = 64;  // counting the frame's own array
+  std::size_t maximumFrame = 0;   // bytes on the wire
+  std::size_t maximumCharge = 0;  // bytes that the values take in memory
+  std::size_t maximumDepth = 0;   // counting the frame's own array
 };
 
 // Turns a byte stream into frames, without any I/O. Used by one thread at a time.
@@ -44,7 +45,7 @@ struct FrameLimits {
 // before the offending byte are still given out first, then every call returns the error.
 class FrameDecoder {
  public:
-  explicit FrameDecoder(FrameLimits limits = {});
+  explicit FrameDecoder(FrameLimits limits);
 
   void append(std::span<const std::uint8_t> bytes);
 

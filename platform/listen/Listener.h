@@ -19,6 +19,11 @@ struct OfferedConnection {
   PeerIdentity peer;
 };
 
+struct ListenerLimits {
+  ConnectionLimits connection;         // of each accepted one
+  std::size_t connectionsPerUser = 0;  // at a time; further ones of that uid are closed at once, with a log line
+};
+
 // Listens on a named service: a Unix stream socket in the runtime directory, or the one that systemd passed.
 //
 // The handler runs on the pool, possibly on several threads at once. It returns whether it admitted (and resumed) the
@@ -29,12 +34,13 @@ class Listener {
   using Handler = std::function<bool(OfferedConnection&&)>;
 
   // Takes LISTEN_FDS's socket if systemd passed one, else binds `directory`/`service`. A stale socket file is replaced;
-  // a live one fails with a text that says which process listens there. Connections above `maximumPerUser` of one uid
-  // are closed at once, with a log line.
+  // a live one fails with a text that says which process listens there.
   static Result<std::unique_ptr<Listener>> create(WorkPool& pool, const std::string& directory,
-                                                  const std::string& service, Handler handler);
+                                                  const std::string& service, const ListenerLimits& limits,
+                                                  Handler handler);
   // On a socket that was made before, so that its making can come first of all.
-  static std::unique_ptr<Listener> create(WorkPool& pool, ServiceSocket socket, Handler handler);
+  static std::unique_ptr<Listener> create(WorkPool& pool, ServiceSocket socket, const ListenerLimits& limits,
+                                          Handler handler);
   virtual ~Listener() = default;
   virtual void resume() = 0;
   // Accepts no more and removes the socket file that create() made. Returns true once no handler runs any more, false
@@ -42,8 +48,6 @@ class Listener {
   // alone, and the destructor waits for it without limit. Not from a handler.
   virtual bool stop() = 0;
   static constexpr std::chrono::seconds kStopTimeout{2};
-  // The most connections of one uid at a time; see docs/limits-and-log.md.
-  static constexpr std::size_t kMaximumConnectionsPerUser = 4096;
 };
 
 }  // namespace orvanta::platform

@@ -31,14 +31,16 @@ bool isDue(std::optional<std::chrono::steady_clock::time_point>& logged) {
 }  // namespace
 
 Result<std::unique_ptr<Listener>> Listener::create(WorkPool& pool, const std::string& directory,
-                                                   const std::string& service, Handler handler) {
+                                                   const std::string& service, const ListenerLimits& limits,
+                                                   Handler handler) {
   auto socket = openServiceSocket(directory, service);
   if (!socket) return Failure{socket.error()};
-  return create(pool, std::move(*socket), std::move(handler));
+  return create(pool, std::move(*socket), limits, std::move(handler));
 }
 
-std::unique_ptr<Listener> Listener::create(WorkPool& pool, ServiceSocket socket, Handler handler) {
-  return std::make_unique<ServiceListener>(pool, std::move(socket), std::move(handler), kMaximumConnectionsPerUser);
+std::unique_ptr<Listener> Listener::create(WorkPool& pool, ServiceSocket socket, const ListenerLimits& limits,
+                                           Handler handler) {
+  return std::make_unique<ServiceListener>(pool, std::move(socket), limits, std::move(handler));
 }
 
 struct ConnectionQuota::Counts {
@@ -65,13 +67,13 @@ std::shared_ptr<void> ConnectionQuota::take(uid_t user) {
   return {_counts.get(), [counts = _counts, user](void*) { counts->release(user); }};
 }
 
-Acceptor::Acceptor(WorkPool& pool, ServiceSocket socket, Listener::Handler handler, std::size_t maximumPerUser)
+Acceptor::Acceptor(WorkPool& pool, ServiceSocket socket, const ListenerLimits& limits, Listener::Handler handler)
     : _pool(pool),
       _handler(std::move(handler)),
-      _maximumPerUser(maximumPerUser),
+      _limits(limits),
       _queue(pool.makeQueue()),
       _socket(std::move(socket)),
-      _quota(maximumPerUser) {}
+      _quota(limits.connectionsPerUser) {}
 
 void Acceptor::start() {
   _queue->post([self = shared_from_this()] { self->acceptSome(); });
@@ -126,7 +128,8 @@ void Acceptor::admit(UniqueFd socket) {
   auto place = _quota.take(peer->uid);
   if (!place) {
     if (isDue(_refusalLogged)) {
-      PLATFORM_LOG(warning, "Listener: A connection was closed: User {} has {} already", peer->uid, _maximumPerUser);
+      PLATFORM_LOG(warning, "Listener: A connection was closed: User {} has {} already", peer->uid,
+                   _limits.connectionsPerUser);
     }
     return;
   }
@@ -142,7 +145,7 @@ void Acceptor::offer(UniqueFd socket, PeerIdentity peer, std::shared_ptr<void> p
     ++_offering;
   }
   const int fd = socket.get();
-  const auto connection = SocketConnection::create(_pool, std::move(socket), {});
+  const auto connection = SocketConnection::create(_pool, std::move(socket), _limits.connection);
   connection->setDescription(fmt::format("fd {} (pid {}, uid {})", fd, peer.pid, peer.uid));
   connection->hold(std::move(place));
   if (!_handler({connection, std::move(peer)})) connection->cancel(std::chrono::milliseconds(0));

@@ -31,7 +31,7 @@ class ConnectionQuota {
 // offers on any thread of the pool.
 class Acceptor final : public std::enable_shared_from_this<Acceptor> {
  public:
-  Acceptor(WorkPool& pool, ServiceSocket socket, Listener::Handler handler, std::size_t maximumPerUser);
+  Acceptor(WorkPool& pool, ServiceSocket socket, const ListenerLimits& limits, Listener::Handler handler);
 
   void start();
   // Waits for the handlers under way, at most for `limit` if it is given. Returns whether all have ended.
@@ -53,7 +53,7 @@ class Acceptor final : public std::enable_shared_from_this<Acceptor> {
   // Constant after construction.
   WorkPool& _pool;
   const Listener::Handler _handler;
-  const std::size_t _maximumPerUser;
+  const ListenerLimits _limits;
   const std::shared_ptr<WorkQueue> _queue;
 
   // Owned by _queue.
@@ -74,8 +74,8 @@ class Acceptor final : public std::enable_shared_from_this<Acceptor> {
 // The Listener on a service socket.
 class ServiceListener final : public Listener {
  public:
-  ServiceListener(WorkPool& pool, ServiceSocket socket, Handler handler, std::size_t maximumPerUser)
-      : _acceptor(std::make_shared<Acceptor>(pool, std::move(socket), std::move(handler), maximumPerUser)) {}
+  ServiceListener(WorkPool& pool, ServiceSocket socket, const ListenerLimits& limits, Handler handler)
+      : _acceptor(std::make_shared<Acceptor>(pool, std::move(socket), limits, std::move(handler))) {}
   ~ServiceListener() override { _acceptor->stop(std::nullopt); }
 
   void resume() override { _acceptor->start(); }

@@ -11,6 +11,7 @@
 
 #include "daemon/OrvantadAgent.h"
 #include "interface/OrvantaConstants.h"
+#include "interface/RemoteCalls.h"
 #include "platform/codec/PropertyList.h"
 #include "platform/core/LogSink.h"
 #include "tests/support/TestPlatform.h"
@@ -46,11 +47,11 @@ class WholeDaemon {
       return ScriptedHttpClient::status(number % 50 == 0 ? 503 : 200);
     };
     for (std::size_t i = 0; i < _storebags.size(); ++i) _storebags[i] = storebag(i);
-    auto made =
-        platform::Listener::create(device.get().pool(), files.runtimeDirectory, std::string(kOrvantaServiceName),
-                                   [this](platform::OfferedConnection&& offered) {
-                                     return agent.listenerShouldAcceptNewConnection(std::move(offered));
-                                   });
+    auto made = platform::Listener::create(
+        device.get().pool(), files.runtimeDirectory, std::string(kOrvantaServiceName),
+        {kDaemonConnectionLimits, kMaximumConnectionsPerUser}, [this](platform::OfferedConnection&& offered) {
+          return agent.listenerShouldAcceptNewConnection(std::move(offered));
+        });
     if (!made) throw std::runtime_error(made.error());
     _listener = std::move(*made);
     _listener->resume();

@@ -4,7 +4,8 @@
 // A value that can be read is the same when it is written and read again, and takes no more bytes.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
   using namespace orvanta::platform;
-  const Result<Value> parsed = decodeMessagePack({bytes, size}, {64, 1U << 20U});
+  constexpr MessagePackLimits kLimits{64, 1U << 20U};
+  const Result<Value> parsed = decodeMessagePack({bytes, size}, kLimits);
   if (!parsed) {
     REQUIRE(!parsed.error().empty());
     return 0;
@@ -12,7 +13,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t siz
   std::vector<std::uint8_t> written;
   MessagePackWriter(written).value(*parsed);
   REQUIRE(written.size() <= size);
-  const Result<Value> again = decodeMessagePack(written);
+  const Result<Value> again = decodeMessagePack(written, kLimits);
   REQUIRE(again.ok());
   std::vector<std::uint8_t> rewritten;
   MessagePackWriter(rewritten).value(*again);

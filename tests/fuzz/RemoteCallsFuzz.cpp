@@ -14,7 +14,7 @@ using platform::FrameDecoder;
 class Answers final : public platform::Outbox {
  public:
   bool send(std::span<const std::uint8_t> message, Urgency) override {
-    FrameDecoder decoder;
+    FrameDecoder decoder(kFrameLimits);
     decoder.append(message);
     const auto outcome = decoder.next();
     const Frame* frame = std::get_if<Frame>(&outcome);
@@ -51,7 +51,7 @@ void takeAsClient(Frame frame) {
   auto event = decodeSendMessageToClient(frame);
   if (!event) return;
   // Its meaning survives being sent on.
-  FrameDecoder decoder;
+  FrameDecoder decoder(kFrameLimits);
   decoder.append(
       encodeSendMessageToClient(event->sessionInfo, event->timestamp, event->category, event->type, event->payload));
   auto outcome = decoder.next();

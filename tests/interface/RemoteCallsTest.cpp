@@ -2,6 +2,9 @@
 
 #include <gtest/gtest.h>
 
+#include <fstream>
+#include <set>
+
 #include "tests/support/LogCapture.h"
 #include "tests/support/NotedSession.h"
 #include "tests/support/RecordingConnection.h"
@@ -21,7 +24,7 @@ class RemoteCallsTest : public ::testing::Test {
     made.params = std::move(params);
     return dispatchCall(std::move(made), session, outbox);
   }
-  // The one answer; none, with a failure, when it is not one.
+  // The one answer; an empty frame, with a failure, when there is not exactly one.
   Frame answer() {
     EXPECT_EQ(outbox->frames.size(), 1U);
     return outbox->frames.empty() ? Frame() : outbox->frames.front();
@@ -117,6 +120,40 @@ TEST_F(RemoteCallsTest, RepliesOutliveTheirConnection) {
   const std::weak_ptr<platform::Outbox> gone = std::exchange(outbox, nullptr);
   EXPECT_TRUE(gone.expired()) << "a reply keeps its connection's outbox alive";
   session.keptReply("late");
+}
+
+// How docs/protocol.md shows a call, up to what its last column says in words.
+std::string documentedRow(const RemoteCall& call) {
+  std::string row = "| `" + std::string(call.method) + "` | ";
+  const char* separator = "";
+  for (const auto& argument : call.arguments) {
+    const std::string_view type = wireTypeText(argument.type);
+    row += std::exchange(separator, ", ");
+    row += std::string(argument.name) + ": " + std::string(type.substr(type.find(' ') + 1));
+  }
+  row += call.arguments.empty() ? "| " : " | ";
+  return call.reply == nullptr ? row : row + call.reply + " |";
+}
+
+TEST(ProtocolDocument, ShowsTheTablesOfCallsAndNotifications) {
+  std::ifstream document(ORVANTA_DOCS "/protocol.md");
+  std::set<std::string> rows;
+  std::size_t methods = 0;
+  bool inTable = false;
+  for (std::string line; std::getline(document, line);) {
+    if (!line.starts_with('|')) inTable = false;
+    if (line.starts_with("| Method |")) inTable = true;
+    if (!inTable || !line.starts_with("| `")) continue;
+    ++methods;
+    rows.insert(line);
+  }
+  EXPECT_EQ(methods, kRemoteCallCount + kRemoteNotificationCount);
+  for (const auto& call : remoteCalls()) EXPECT_TRUE(rows.count(documentedRow(call))) << documentedRow(call);
+  for (const auto id : {RemoteNotificationID::sendMessageToClient, RemoteNotificationID::removeFile}) {
+    const auto row = documentedRow(remoteNotification(id));
+    const auto found = rows.lower_bound(row);
+    EXPECT_TRUE(found != rows.end() && found->starts_with(row)) << row;
+  }
 }
 
 }  // namespace

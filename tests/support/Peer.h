@@ -14,7 +14,7 @@
 #include <utility>
 #include <vector>
 
-#include "interface/Values.h"
+#include "interface/RemoteCalls.h"
 #include "platform/codec/MessagePack.h"
 #include "platform/core/UniqueFd.h"
 #include "platform/ipc/Connection.h"
@@ -143,7 +143,7 @@ class Peer {
   }
 
   platform::UniqueFd _socket;
-  platform::FrameDecoder _decoder;
+  platform::FrameDecoder _decoder{kFrameLimits};
   std::vector<platform::UniqueFd> _descriptors;
 };
 

@@ -32,10 +32,10 @@ class RecordingConnection : public platform::Connection {
     }
 
     mutable std::mutex mutex;
-    platform::FrameDecoder decoder;       // guarded by mutex
-    std::vector<platform::Frame> frames;  // guarded by mutex
-    bool full = false;                    // guarded by mutex: the client does not read
-    bool closed = false;                  // guarded by mutex: the client has gone
+    platform::FrameDecoder decoder{kFrameLimits};  // guarded by mutex
+    std::vector<platform::Frame> frames;           // guarded by mutex
+    bool full = false;                             // guarded by mutex: the client does not read
+    bool closed = false;                           // guarded by mutex: the client has gone
   };
 
   explicit RecordingConnection(platform::WorkPool& pool) : _queue(pool.makeQueue()) {}

@@ -3,7 +3,7 @@
 #include <cstdint>
 #include <string>
 
-#include "interface/AggregatedEvent.h"
+#include "interface/ClientSessionInterface.h"
 
 namespace orvanta::ctl {
 

@@ -3,7 +3,7 @@
 #include <optional>
 #include <string>
 
-#include "client/CallResult.h"
+#include "client/BlockingCalls.h"
 
 namespace orvanta::ctl {
 

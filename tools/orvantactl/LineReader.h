@@ -5,13 +5,15 @@
 #include <string>
 #include <string_view>
 
+#include "interface/WireLimits.h"
+
 namespace orvanta::ctl {
 
 // Lines from a descriptor, each as soon as it is there. Keeps no more than one line of at most kMaximumLine bytes.
 class LineReader {
  public:
   // No event that the daemon takes is larger.
-  static constexpr std::size_t kMaximumLine = 64U << 20U;
+  static constexpr std::size_t kMaximumLine = kMaximumFrameBytes;
 
   explicit LineReader(int fd) : _fd(fd) {}
 

@@ -11,6 +11,8 @@ namespace {
 
 using namespace orvanta::test;
 
+constexpr MessagePackLimits kLimits{64, 256U << 20U};
+
 std::vector<std::uint8_t> encode(const Value& value) {
   std::vector<std::uint8_t> bytes;
   MessagePackWriter(bytes).value(value);
@@ -18,7 +20,7 @@ std::vector<std::uint8_t> encode(const Value& value) {
 }
 
 Result<Value> decode(const std::string& hex) {
-  return decodeMessagePack(fromHex(hex));
+  return decodeMessagePack(fromHex(hex), kLimits);
 }
 
 // The bytes' beginning; the rest is the text's, the data's or the elements'.
@@ -54,7 +56,7 @@ TEST(MessagePack, WritesTheShortestFormAndReadsIt) {
   for (const auto& [value, hex] : rows) {
     const std::vector<std::uint8_t> bytes = encode(value);
     EXPECT_EQ(toHex({bytes.data(), fromHex(hex).size()}), hex);
-    EXPECT_EQ(*decodeMessagePack(bytes), value) << hex;
+    EXPECT_EQ(*decodeMessagePack(bytes, kLimits), value) << hex;
   }
   std::vector<std::uint8_t> map;
   MessagePackWriter(map).mapHeader(16);
@@ -88,7 +90,7 @@ TEST(MessagePack, BoundsDepthAndMemory) {
     EXPECT_TRUE(decode(deep + "90").ok());
     EXPECT_NE(decode(deep + open + "90").error().find("deeper than 64"), std::string::npos);
   }
-  EXPECT_FALSE(decodeMessagePack(std::vector<std::uint8_t>(1'000'000, 0x91)).ok());
+  EXPECT_FALSE(decodeMessagePack(std::vector<std::uint8_t>(1'000'000, 0x91), kLimits).ok());
   const MessagePackLimits small{64, 10'000};
   EXPECT_TRUE(decodeMessagePack(encode(Array(200)), small).ok());
   for (const Value& large : {Value(Array(300)), Value(Array(20, Array(20))), Value(std::string(10'000, 'x'))}) {
@@ -106,14 +108,14 @@ TEST(MessagePack, DatesOutsideTheTimestampsRangeAreClamped) {
   const std::pair<double, double> rows[] = {
       {1e300, 0x1p63}, {-1e300, -0x1p63}, {std::nan(""), 0}, {0.9999999999, 1}, {-1e-12, 0}};
   for (const auto& [given, expected] : rows) {
-    EXPECT_EQ(*decodeMessagePack(encode(Date{given})), Value(Date{expected})) << given;
+    EXPECT_EQ(*decodeMessagePack(encode(Date{given}), kLimits), Value(Date{expected})) << given;
   }
 }
 
 TEST(MessagePack, RoundTrip) {
   expectRoundTrips(
       2, [](const Value& value) { return Result<std::vector<std::uint8_t>>(encode(value)); },
-      [](const std::vector<std::uint8_t>& bytes) { return decodeMessagePack(bytes); });
+      [](const std::vector<std::uint8_t>& bytes) { return decodeMessagePack(bytes, kLimits); });
 }
 
 }  // namespace

@@ -109,8 +109,9 @@ class ConnectionFixture : public ::testing::Test {
   Made make() {
     int fds[2] = {-1, -1};
     EXPECT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, fds), 0);
-    return {Connection::create(*_pool, UniqueFd(fds[0]), {}), std::make_shared<RecordingDelegate>(),
-            Peer(UniqueFd(fds[1])), std::shared_ptr<void>(nullptr, [this](void*) {
+    return {Connection::create(*_pool, UniqueFd(fds[0]), kDaemonConnectionLimits),
+            std::make_shared<RecordingDelegate>(), Peer(UniqueFd(fds[1])),
+            std::shared_ptr<void>(nullptr, [this](void*) {
               if (_pool) _pool->stop();
             })};
   }

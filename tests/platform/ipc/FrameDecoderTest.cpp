@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <limits>
 
+#include "interface/RemoteCalls.h"
 #include "platform/ipc/Connection.h"
 #include "tests/platform/codec/CodecRows.h"
 #include "tests/support/Bytes.h"
@@ -55,7 +56,7 @@ std::vector<std::string> decode(std::span<const std::uint8_t> stream, std::size_
 }
 
 // The same at once and byte by byte, which take different ways through the decoder.
-std::vector<std::string> decodeBothWays(const Bytes& stream, FrameLimits limits = {}) {
+std::vector<std::string> decodeBothWays(const Bytes& stream, FrameLimits limits = kFrameLimits) {
   std::vector<std::string> atOnce = decode(stream, stream.size(), limits);
   EXPECT_EQ(decode(stream, 1, limits), atOnce);
   return atOnce;

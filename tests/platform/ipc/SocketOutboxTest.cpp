@@ -31,7 +31,7 @@ class OutboxTest : public ConnectionFixture {
 
 TEST_F(OutboxTest, StopsReadingWhileThePeerReadsNoReplies) {
   constexpr int kCalls = 200;
-  const std::size_t limit = ConnectionLimits{}.maximumUnreadReplies;
+  const std::size_t limit = kDaemonConnectionLimits.maximumUnreadReplies;
   const Bytes reply = response(1, std::string(64U << 10U, 'r'));
   std::atomic<std::size_t> mostPending = 0;
   auto made = open([&](Connection& connection, Frame&) {
@@ -107,7 +107,7 @@ TEST_F(OutboxTest, DescriptorsTravelWithTheirMessages) {
     EXPECT_EQ(::eventfd_read(descriptor.get(), &content), 0);
     EXPECT_EQ(content, static_cast<eventfd_t>(taken));
   };
-  const auto sender = Connection::create(*_pool, receiver.peer.takeSocket());
+  const auto sender = Connection::create(*_pool, receiver.peer.takeSocket(), kDaemonConnectionLimits);
   const auto senderDelegate = std::make_shared<RecordingDelegate>();
   sender->resume(senderDelegate);
   for (std::uint8_t i = 1; i <= kUploads; ++i) {

@@ -29,6 +29,7 @@ namespace {
 using ::testing::HasSubstr;
 
 const std::string kService = "test.service";
+const platform::ListenerLimits kLimits{kDaemonConnectionLimits, kMaximumConnectionsPerUser};
 
 class ListenerTest : public ConnectionFixture {
  protected:
@@ -42,7 +43,7 @@ class ListenerTest : public ConnectionFixture {
   }
   static bool refuse(OfferedConnection&& /*offered*/) { return false; }
   Result<std::unique_ptr<Listener>> create(Listener::Handler handler) {
-    return Listener::create(*_pool, _directory.path(), kService, std::move(handler));
+    return Listener::create(*_pool, _directory.path(), kService, kLimits, std::move(handler));
   }
   std::unique_ptr<Listener> listen(Listener::Handler handler) {
     auto listener = create(std::move(handler));
@@ -127,7 +128,7 @@ TEST_F(ListenerTest, SaysWhatStandsInTheWay) {
       {_directory.path(), std::string(120, 'x'), "File name too long"},
   };
   for (const auto& [directory, service, reason] : rows) {
-    const auto listener = Listener::create(*_pool, directory, service, refuse);
+    const auto listener = Listener::create(*_pool, directory, service, kLimits, refuse);
     ASSERT_FALSE(listener.ok()) << service;
     EXPECT_THAT(listener.error(), HasSubstr(reason));
   }
@@ -204,7 +205,7 @@ TEST_F(ListenerTest, OneUserHasOnlySoManyConnectionsAtATime) {
     offered.connection->outbox()->send(notification("welcome"));
     return admit(std::move(offered));
   };
-  ServiceListener listener(*_pool, std::move(*socket), welcoming, 3);
+  ServiceListener listener(*_pool, std::move(*socket), {kDaemonConnectionLimits, 3}, welcoming);
   listener.resume();
   std::vector<Peer> peers;
   for (int i = 0; i < 3; ++i) peers.push_back(connect());
@@ -274,7 +275,7 @@ TEST_F(ListenerTest, RepliesStillGoOutWhenDescriptorsRunOut) {
 TEST_F(ListenerTest, TakesTheSocketOfTheServiceManager) {
   if (std::getenv("LISTEN_FDS") != nullptr) {
     const auto listener =
-        Listener::create(*_pool, "/nonexistent", kService, [admit = admitting()](OfferedConnection&& offered) {
+        Listener::create(*_pool, "/nonexistent", kService, kLimits, [admit = admitting()](OfferedConnection&& offered) {
           offered.connection->outbox()->send(notification("activated"));
           return admit(std::move(offered));
         });
