@@ -15,11 +15,9 @@
 
 #include "tests/client/ClientFixture.h"
 #include "tests/support/TemporaryDirectory.h"
-#include "tools/orvantactl/DefaultsValue.h"
-#include "tools/orvantactl/EventJson.h"
+#include "tools/orvantactl/AnswerLines.h"
 #include "tools/orvantactl/EventLine.h"
 #include "tools/orvantactl/EventPipeline.h"
-#include "tools/orvantactl/FlushVerdict.h"
 #include "tools/orvantactl/JsonValues.h"
 #include "tools/orvantactl/LineReader.h"
 
@@ -67,7 +65,7 @@ TEST(EventLine, saysWhatIsWrong) {
        {R"({"category":1,"type":2,"payload":[]})", R"({"category":1,"type":2,"payload":{"$date":1}})"}},
       {"\"flag\" must be", {R"({"category":1,"type":2,"flag":4294967296})"}},
       {"\"realtime\" must be true or false", {R"({"category":1,"type":2,"realtime":1})"}},
-      {"\"realtme\" is no key", {R"({"category":1,"type":2,"realtme":true})"}},
+      {"\"realtme\" is not a key", {R"({"category":1,"type":2,"realtme":true})"}},
       {"$date", {R"({"category":1,"type":2,"payload":{"a":{"$date":"x"}}})"}},
       {"alone", {R"({"category":1,"type":2,"payload":{"a":{"$date":1,"b":2}}})"}},
       {"$data", {R"({"category":1,"type":2,"payload":{"a":[{"$data":"A"}]}})"}},

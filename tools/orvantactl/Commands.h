@@ -5,7 +5,7 @@
 namespace orvanta::ctl {
 
 // Each adds one subcommand to `app`. When the command line names it, it runs from the parser's callback and leaves its
-// exit status (ExitStatus.h) in `status`, which outlives the parser.
+// exit status (Output.h) in `status`, which outlives the parser.
 void addSessionCommand(CLI::App& app, int& status);
 void addSendCommand(CLI::App& app, int& status);
 void addStatesCommand(CLI::App& app, int& status);

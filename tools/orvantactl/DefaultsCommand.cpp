@@ -12,17 +12,15 @@
 #include "interface/OrvantaConstants.h"
 #include "platform/core/LogSink.h"
 #include "platform/host/UserDefaults.h"
-#include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
-#include "tools/orvantactl/DefaultsValue.h"
-#include "tools/orvantactl/ExitStatus.h"
 #include "tools/orvantactl/JsonValues.h"
+#include "tools/orvantactl/Output.h"
 
 namespace orvanta::ctl {
 
 namespace {
 
-// What the store has to say about its file is said to the person who asked.
+// Passes the store's log lines about its file on to the person who asked.
 class ComplainingLog final : public platform::LogSink {
  public:
   ComplainingLog() {
@@ -34,7 +32,7 @@ class ComplainingLog final : public platform::LogSink {
     _failed = _failed || level <= platform::LogLevel::error;
     complain(std::string(line));
   }
-  // Whether the file could not be read or makes no sense, so that what the store gave is not what lies there.
+  // Returns whether the file could not be read or is invalid, so that the store returned something else.
   bool failed() const { return _failed; }
 
  private:
@@ -57,7 +55,7 @@ struct DefaultsOptions {
   platform::UserDefaults open() const { return {directory(), std::string(kOrvantaUserDefaultsDomain)}; }
 };
 
-// A store takes a missing directory for an empty one, or makes it; here it is a typing error, or the daemon has never
+// The store takes a missing directory for an empty one, or makes it; here it is a typing error, or the daemon has never
 // run.
 bool directoryIsThere(const DefaultsOptions& options) {
   std::error_code error;

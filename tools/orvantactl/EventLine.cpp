@@ -44,7 +44,7 @@ std::optional<std::string> readPayload(Value& value, std::optional<Dictionary>& 
   return std::nullopt;
 }
 
-// What is wrong with one entry of the line; none when it has been taken.
+// What is wrong with one entry of the line; nullopt when it has been taken.
 std::optional<std::string> readEntry(const std::string& key, Value& value, MessageParameters& event) {
   if (key == kOrvantaMessageParametersCategory) return readNumber(value, key, event.category);
   if (key == kOrvantaMessageParametersType) return readNumber(value, key, event.type);
@@ -52,7 +52,7 @@ std::optional<std::string> readEntry(const std::string& key, Value& value, Messa
   if (key == kOrvantaMessageParametersFlag) return readNumber(value, key, event.flag);
   if (key == kRealtime) return readFlag(value, key, event.realtime);
   if (key == kPromote) return readFlag(value, key, event.promote);
-  return fmt::format("\"{}\" is no key of an event; there are category, type, payload, flag, realtime and promote",
+  return fmt::format("\"{}\" is not a key of an event; there are category, type, payload, flag, realtime and promote",
                      key);
 }
 

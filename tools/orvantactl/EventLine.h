@@ -7,14 +7,14 @@
 
 namespace orvanta::ctl {
 
-// What options set for all events; a line's own "realtime" and "promote" decide for that line.
+// Set by options for all events; a line's own "realtime" and "promote" decide for that line.
 struct EventDefaults {
   bool realtime = false;
   bool promote = false;
 };
 
 // One event from a line of JSON: {"category": 1, "type": 2, "payload": {…}, "flag": 1, "realtime": true, "promote":
-// true}, of which category and type must be there. A failure says what is wrong with which key; an unknown key is one.
+// true}, of which category and type are required. Fails for an unknown key, too; the failure names the key.
 Result<MessageParameters> parseEventLine(std::string_view line, const EventDefaults& defaults);
 
 }  // namespace orvanta::ctl

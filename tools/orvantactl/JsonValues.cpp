@@ -1,6 +1,10 @@
 #include "tools/orvantactl/JsonValues.h"
 
+#include <charconv>
+#include <cmath>
+#include <cstdint>
 #include <optional>
+#include <system_error>
 #include <utility>
 
 #include "platform/codec/Json.h"
@@ -15,7 +19,7 @@ namespace {
 constexpr std::string_view kDate = "$date";
 constexpr std::string_view kData = "$data";
 
-// The value that a tagged object stands for; null for an object without a tag.
+// The value that a tagged object stands for; nullopt for an object without a tag.
 Result<std::optional<Value>> taggedValue(const Dictionary& object) {
   const Value* date = object.find(kDate);
   const Value* data = object.find(kData);
@@ -30,7 +34,7 @@ Result<std::optional<Value>> taggedValue(const Dictionary& object) {
   return std::optional<Value>(Data{std::move(*bytes)});
 }
 
-// The parser bounds the depth.
+// Puts values in place of tagged objects. Returns what is wrong, if anything. The parser bounds the depth.
 std::optional<std::string> resolveTags(Value& value) {
   if (auto* array = value.array()) {
     for (auto& element : *array) {
@@ -78,6 +82,56 @@ Result<Value> parseTaggedJson(std::string_view text) {
 
 std::string writeTaggedJson(const Value& value, bool pretty) {
   return platform::writeJson(withTags(value), pretty);
+}
+
+namespace {
+
+template <class Number>
+bool parseWhole(std::string_view text, Number& out) {
+  const auto result = std::from_chars(text.data(), text.data() + text.size(), out);
+  return result.ec == std::errc() && result.ptr == text.data() + text.size();
+}
+
+// The value that a text on the command line stands for, before it is known whether it can be stored.
+Result<Value> typedValue(const std::string& text, const std::string& type) {
+  if (type == "string") return Value(text);
+  if (type == "int") {
+    std::int64_t number = 0;
+    if (!parseWhole(text, number)) return Failure{"'" + text + "' is not a whole number"};
+    return Value(number);
+  }
+  if (type == "float") {
+    double number = 0;
+    if (!parseWhole(text, number) || !std::isfinite(number)) return Failure{"'" + text + "' is not a number"};
+    return Value(number);
+  }
+  if (type == "bool") {
+    if (text == "true" || text == "yes" || text == "1") return Value(true);
+    if (text == "false" || text == "no" || text == "0") return Value(false);
+    return Failure{"'" + text + "' is neither true nor false"};
+  }
+  if (type == "json") {
+    auto parsed = parseTaggedJson(text);
+    if (parsed && parsed->isNull()) return Failure{"null is not a value; use 'defaults delete' to remove a key"};
+    return parsed;
+  }
+  return Failure{"'" + type + "' is not a type; there are string, int, float, bool and json"};
+}
+
+}  // namespace
+
+Result<Value> parseDefaultsValue(const std::string& text, const std::string& type) {
+  auto value = typedValue(text, type);
+  if (!value) return value;
+  // Tried in the form in which it will be stored, which has none for null inside, say.
+  const auto written = platform::writeXmlPropertyList(*value);
+  if (!written) return Failure{"the value cannot be stored: " + written.error()};
+  return value;
+}
+
+std::string showDefaultsValue(const Value& value) {
+  if (const auto* text = value.string()) return *text;
+  return writeTaggedJson(value);
 }
 
 }  // namespace orvanta::ctl

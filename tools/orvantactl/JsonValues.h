@@ -15,4 +15,9 @@ Result<Value> parseTaggedJson(std::string_view text);
 // One line of JSON with those two forms.
 std::string writeTaggedJson(const Value& value, bool pretty = false);
 
+// A user default on the command line. The value that a text stands for; `type` is string, int, float, bool or json.
+Result<Value> parseDefaultsValue(const std::string& text, const std::string& type);
+// As `defaults read KEY` shows it: a text as it is, anything else as JSON.
+std::string showDefaultsValue(const Value& value);
+
 }  // namespace orvanta::ctl

@@ -9,7 +9,8 @@
 
 namespace orvanta::ctl {
 
-// Lines from a descriptor, each as soon as it is there. Keeps no more than one line of at most kMaximumLine bytes.
+// Lines from a descriptor, each as soon as it has arrived. Keeps at most one line of kMaximumLine bytes. Used by one
+// thread.
 class LineReader {
  public:
   // No event that the daemon takes is larger.
@@ -18,10 +19,10 @@ class LineReader {
   explicit LineReader(int fd) : _fd(fd) {}
 
   enum class Outcome { line, tooLong, end, failed };
-  // The next line without its end; good until the next call. Of a line that is too long nothing is kept.
+  // The next line without its end; valid until the next call. A line that is too long is skipped.
   Outcome next(std::string_view& line);
 
-  std::uint64_t lineNumber() const { return _lineNumber; }  // of the line given out last, from 1
+  std::uint64_t lineNumber() const { return _lineNumber; }  // of the last line returned, from 1
   std::uint64_t bytesRead() const { return _bytesRead; }
   int error() const { return _error; }  // errno, after `failed`
 

@@ -11,7 +11,7 @@ namespace orvanta::ctl {
 struct Progress {
   std::uint64_t events = 0;
   std::uint64_t bytes = 0;
-  std::optional<std::uint64_t> totalBytes;  // none: the input's length is not known
+  std::optional<std::uint64_t> totalBytes;  // nullopt: the input's length is not known
   double seconds = 0;                       // since the beginning
 };
 

@@ -4,10 +4,10 @@
 #include <utility>
 
 #include "platform/codec/Json.h"
-#include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
-#include "tools/orvantactl/ExitStatus.h"
+#include "tools/orvantactl/ConfiguredSession.h"
 #include "tools/orvantactl/JsonValues.h"
+#include "tools/orvantactl/Output.h"
 
 namespace orvanta::ctl {
 
@@ -20,11 +20,9 @@ struct SendOptions : ClientOptions {
 };
 
 int send(const SendOptions& options) {
-  const auto userInfo = options.userInfo();
-  if (!userInfo) {
-    complain(userInfo.error());
-    return kUsage;
-  }
+  int status = kAllTaken;
+  const auto records = recordsOrComplain(options, status);
+  if (!records) return status;
   SharedDictionary payload;
   if (!options.payloadJson.empty()) {
     auto parsed = parseTaggedJson(options.payloadJson);
@@ -36,12 +34,10 @@ int send(const SendOptions& options) {
     }
     payload = std::make_shared<const Dictionary>(std::move(*object));
   }
-  int status = kAllTaken;
   const auto connection = connectOrComplain(options, status);
   if (!connection) return status;
-  const auto reply = connection->session().blocking().sendMessage(options.sessionInfo().dictionary(),
-                                                                  *userInfo ? (*userInfo)->dictionary() : nullptr,
-                                                                  options.category, options.type, payload);
+  const auto reply = connection->session().blocking().sendMessage(
+      records->sessionInfo.dictionary(), records->userInfoDictionary(), options.category, options.type, payload);
   if (!reply) return complain(reply.error());
   printLine(platform::writeJson(Dictionary{{"reply", *reply ? Value(**reply) : nullptr}}));
   if (*reply == "finished") return kAllTaken;
@@ -56,10 +52,8 @@ int send(const SendOptions& options) {
 void addSendCommand(CLI::App& app, int& status) {
   auto options = std::make_shared<SendOptions>();
   auto& command = *app.add_subcommand("send", "Reports one event without a session");
-  command.footer("Writes {\"reply\":\"finished\"} when the event has been handed to its backends.");
-  options->addConnectionTo(command);
-  options->addSessionTo(command);
-  options->addUserInfoTo(command);
+  command.footer("Writes {\"reply\":\"finished\"} when the event has been passed to its backends.");
+  options->addTo(command);
   options->addHierarchyTo(command, "--hierarchy-token");
   command.add_option("--category", options->category, "The event's category, 0 to 65535")->required()->type_name("N");
   command.add_option("--type", options->type, "The event's type, 0 to 65535")->required()->type_name("N");

@@ -5,21 +5,22 @@
 
 #include <cerrno>
 #include <cstdio>
-#include <cstring>
 #include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 
 #include "platform/codec/Json.h"
+#include "platform/core/Text.h"
 #include "platform/core/UniqueFd.h"
-#include "tools/orvantactl/ClientOptions.h"
+#include "tools/orvantactl/AnswerLines.h"
 #include "tools/orvantactl/Commands.h"
+#include "tools/orvantactl/ConfiguredSession.h"
 #include "tools/orvantactl/EventLine.h"
 #include "tools/orvantactl/EventPipeline.h"
-#include "tools/orvantactl/ExitStatus.h"
-#include "tools/orvantactl/FlushVerdict.h"
 #include "tools/orvantactl/LineReader.h"
+#include "tools/orvantactl/Output.h"
 #include "tools/orvantactl/ProgressBar.h"
 
 namespace orvanta::ctl {
@@ -36,12 +37,13 @@ constexpr const char* kFooter =
     "\n"
     "Written to standard output, one JSON object a line:\n"
     "  {\"backends\":[…]}                     the reporting backends; null: the daemon has no storebag for the type\n"
-    "  {\"event\":LINE,\"reply\":…}             for each event in order, by its line; null: nothing to tell\n"
+    "  {\"event\":LINE,\"reply\":…}             for each event in order, by its line; null: the daemon had nothing to "
+    "say\n"
     "  {\"event\":LINE,\"error\":\"…\"}           the event was not taken\n"
     "  {\"finish\":…}                         the answer to finishing the session\n"
-    "  {\"flush\":{\"result\":…,\"error\":…}}     what was sent at last; \"Nothing to flush\" is no failure\n"
+    "  {\"flush\":{\"result\":…,\"error\":…}}     what the last flush sent; \"Nothing to flush\" is not a failure\n"
     "\n"
-    "Whether the device has an internal build is no option: \"ReleaseType\" in the daemon's device.plist says so.";
+    "There is no option for an internal build: \"ReleaseType\" in the daemon's device.plist decides.";
 
 struct SessionOptions : ClientOptions {
   std::string file;
@@ -52,27 +54,18 @@ struct SessionOptions : ClientOptions {
   bool quiet = false;
 };
 
-std::string optionalJson(const std::optional<std::string>& text) {
-  if (!text) return "null";
-  std::string json;
-  platform::appendJsonString(json, *text);
-  return json;
-}
-
 // One run of the command, from connecting to the exit status.
 class SessionRun {
  public:
   explicit SessionRun(const SessionOptions& options) : _options(options) {}
 
   int run() {
-    const auto userInfo = _options.userInfo();
-    if (!userInfo) {
-      complain(userInfo.error());
-      return kUsage;
-    }
     if (!openInput()) return _status;
-    _connection = connectOrComplain(_options, _status);
-    if (!_connection || !configure(*userInfo)) return _status;
+    // Without a storebag the events are sent all the same: their answers say what the daemon makes of them.
+    auto session = configureOrComplain(_options, _status);
+    if (!session.connection) return _status;
+    _connection = std::move(session.connection);
+    showBackends(session.backends);
     sendEvents();
     if (_connection->isOpen()) finish();
     return _status;
@@ -84,36 +77,23 @@ class SessionRun {
     _file.reset(::open(_options.file.c_str(), O_RDONLY | O_CLOEXEC));
     struct stat facts {};
     if (_file && ::fstat(_file.get(), &facts) == 0 && !S_ISDIR(facts.st_mode)) return true;
-    complain(fmt::format("cannot read {}: {}", _options.file, std::strerror(_file ? EISDIR : errno)));
+    complain(fmt::format("cannot read {}: {}", _options.file, platform::errnoText(_file ? EISDIR : errno)));
     _status = kUsage;
     return false;
   }
 
-  bool configure(const std::optional<UserInfo>& userInfo) {
-    const auto backends = _connection->session().blocking().configure(_options.sessionInfo(), userInfo);
-    if (!backends) {
-      _status = complain(backends.error());
-      return false;
-    }
-    if (!*backends) {
-      complain(
-          fmt::format("the daemon has no storebag for client type {}, so nothing will be reported: is the storebag "
-                      "server up, and does it serve this type? The daemon's log says more.",
-                      _options.clientType));
-      _status = kSomethingNotTaken;
-    }
-    if (_options.quiet) return true;
+  void showBackends(const BackendNames& backends) const {
+    if (_options.quiet) return;
     Array names;
-    if (*backends) names.assign((*backends)->begin(), (*backends)->end());
-    printLine("{\"backends\":" + platform::writeJson(*backends ? Value(std::move(names)) : nullptr) + "}");
-    return true;
+    if (backends) names.assign(backends->begin(), backends->end());
+    printLine("{\"backends\":" + platform::writeJson(backends ? Value(std::move(names)) : nullptr) + "}");
   }
 
   void sendEvents() {
     const int input = _file ? _file.get() : STDIN_FILENO;
     LineReader reader(input);
     EventPipeline pipeline(_connection->session(), _options.window, _options.quiet ? nullptr : stdout);
-    // Answers on the same terminal show the progress by themselves.
+    // On a terminal the answers themselves show the progress.
     ProgressBar bar(::isatty(STDERR_FILENO) == 1 && (_options.quiet || ::isatty(STDOUT_FILENO) == 0), inputSize(input));
     std::uint64_t events = 0;
     std::string_view line;
@@ -122,7 +102,7 @@ class SessionRun {
       if (outcome == LineReader::Outcome::end) break;
       if (outcome == LineReader::Outcome::failed) {
         bar.clear();
-        notTaken(fmt::format("reading the events failed: {}", std::strerror(reader.error())));
+        notTaken(fmt::format("reading the events failed: {}", platform::errnoText(reader.error())));
         break;
       }
       if (outcome == LineReader::Outcome::tooLong) {
@@ -190,19 +170,18 @@ void addSessionCommand(CLI::App& app, int& status) {
   auto options = std::make_shared<SessionOptions>();
   auto& command = *app.add_subcommand("session", "Reports events from standard input or a file in one session");
   command.footer(kFooter);
-  options->addConnectionTo(command);
-  options->addSessionTo(command);
-  options->addUserInfoTo(command);
+  options->addTo(command);
   options->addHierarchyTo(command, "--hierarchy-token");
   command.add_option("--file", options->file, "Read the events from this file; default: standard input")
       ->type_name("F");
   command.add_flag("--realtime", options->realtime, "Every event goes out at once, unless its line says otherwise");
   command.add_flag("--promote", options->promote,
                    "Every event makes a session that is sampled out report after all, unless its line says otherwise");
-  command.add_option("--window", options->window, "Events on their way without an answer at a time; default: 256")
+  command.add_option("--window", options->window, "Unanswered events at a time; default: 256")
       ->check(CLI::Range(1, 100'000))
       ->type_name("N");
-  command.add_flag("--no-flush", options->noFlush, "Do not flush at the end; what is batched goes out in its own time");
+  command.add_flag("--no-flush", options->noFlush,
+                   "Do not flush at the end; batched events go out later by themselves");
   command.add_flag("--quiet", options->quiet, "Write no answers to events; finish and flush are still written");
   command.callback([options, &status] { status = SessionRun(*options).run(); });
 }

@@ -3,10 +3,9 @@
 #include <utility>
 
 #include "platform/codec/Json.h"
-#include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
 #include "tools/orvantactl/ConfiguredSession.h"
-#include "tools/orvantactl/ExitStatus.h"
+#include "tools/orvantactl/Output.h"
 
 namespace orvanta::ctl {
 
@@ -15,7 +14,7 @@ namespace {
 int showStates(const ClientOptions& options) {
   int status = kAllTaken;
   const auto session = configureOrComplain(options, status);
-  if (!session.connection) return status;
+  if (!session.backends) return status;
   Array names(session.backends->begin(), session.backends->end());
   printLine(platform::writeJson(Dictionary{{"backends", std::move(names)}}));
   return kAllTaken;
@@ -24,7 +23,7 @@ int showStates(const ClientOptions& options) {
 int showDisplayURL(const ClientOptions& options) {
   int status = kAllTaken;
   const auto session = configureOrComplain(options, status);
-  if (!session.connection) return status;
+  if (!session.backends) return status;
   const auto url = session.connection->session().blocking().fetchDisplayURL();
   if (!url) return complain(url.error());
   if (!*url || **url == "URL not available") {
@@ -35,12 +34,6 @@ int showDisplayURL(const ClientOptions& options) {
   return kAllTaken;
 }
 
-void addOptions(CLI::App& command, ClientOptions& options) {
-  options.addConnectionTo(command);
-  options.addSessionTo(command);
-  options.addUserInfoTo(command);
-}
-
 }  // namespace
 
 void addStatesCommand(CLI::App& app, int& status) {
@@ -48,14 +41,14 @@ void addStatesCommand(CLI::App& app, int& status) {
   auto& command = *app.add_subcommand("states", "Shows which backends report, or hold events, for such a session");
   command.footer(
       "Writes {\"backends\":[…]}: those enabled and those sampled out, which hold events until one promotes.");
-  addOptions(command, *options);
+  options->addTo(command);
   command.callback([options, &status] { status = showStates(*options); });
 }
 
 void addDisplayURLCommand(CLI::App& app, int& status) {
   auto options = std::make_shared<ClientOptions>();
-  auto& command = *app.add_subcommand("display-url", "Shows where what a session reports can be looked at");
-  addOptions(command, *options);
+  auto& command = *app.add_subcommand("display-url", "Shows the URL at which a session's reports can be looked at");
+  options->addTo(command);
   command.callback([options, &status] { status = showDisplayURL(*options); });
 }
 

@@ -2,7 +2,6 @@
 #include <sys/stat.h>
 
 #include <cerrno>
-#include <cstring>
 #include <fstream>
 #include <memory>
 #include <string>
@@ -12,12 +11,12 @@
 #include "interface/WireLimits.h"
 #include "platform/codec/Json.h"
 #include "platform/codec/PropertyList.h"
+#include "platform/core/Text.h"
 #include "platform/core/WholeFile.h"
-#include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
 #include "tools/orvantactl/ConfiguredSession.h"
-#include "tools/orvantactl/ExitStatus.h"
 #include "tools/orvantactl/JsonValues.h"
+#include "tools/orvantactl/Output.h"
 
 namespace orvanta::ctl {
 
@@ -30,10 +29,11 @@ struct UploadOptions : ClientOptions {
 // The values travel in one frame; their JSON may be twice as long.
 constexpr std::size_t kMaximumLogBytes = 2 * kMaximumFrameBytes;
 
-// The daemon answers no more than no. What can be seen from here is looked at; what is left is the daemon's side.
+// The daemon's answer is only false. Checks the reasons that can be seen from here; the others are on the daemon's
+// side.
 std::string reasonNotTaken(const std::string& file) {
   struct stat facts {};
-  if (::stat(file.c_str(), &facts) != 0) return std::strerror(errno);
+  if (::stat(file.c_str(), &facts) != 0) return platform::errnoText(errno);
   if (!S_ISREG(facts.st_mode)) return "it is not a regular file";
   if (static_cast<std::uint64_t>(facts.st_size) > kMaximumUploadBytes) {
     return fmt::format("it has {} bytes, and the daemon takes at most {} MiB", facts.st_size,
@@ -47,7 +47,7 @@ std::string reasonNotTaken(const std::string& file) {
 int upload(const UploadOptions& options) {
   int status = kAllTaken;
   const auto session = configureOrComplain(options, status);
-  if (!session.connection) return status;
+  if (!session.backends) return status;
   auto calls = session.connection->session().blocking();
   for (const auto& file : options.files) {
     const auto uploaded = calls.uploadFile(file);
@@ -77,14 +77,14 @@ int uploadLog(const UploadOptions& options) {
     complain(fmt::format("{} must hold a JSON array{}", file, parsed ? "" : ": " + parsed.error()));
     return kUsage;
   }
-  // The daemon archives the values as a property list, and of one that it cannot write says no more than no.
+  // The daemon archives the values as a property list, and only answers false when it cannot.
   if (const auto archived = platform::writeBinaryPropertyList(*parsed); !archived) {
     complain(fmt::format("{} holds a value that cannot be archived: {}", file, archived.error()));
     return kUsage;
   }
   int status = kAllTaken;
   const auto session = configureOrComplain(options, status);
-  if (!session.connection) return status;
+  if (!session.backends) return status;
   const auto answer = session.connection->session().blocking().uploadLogData(
       std::make_shared<const Array>(std::move(*parsed->array())));
   if (!answer) return complain(answer.error());
@@ -98,12 +98,6 @@ int uploadLog(const UploadOptions& options) {
   return kSomethingNotTaken;
 }
 
-void addOptions(CLI::App& command, UploadOptions& options) {
-  options.addConnectionTo(command);
-  options.addSessionTo(command);
-  options.addUserInfoTo(command);
-}
-
 }  // namespace
 
 void addUploadCommand(CLI::App& app, int& status) {
@@ -112,7 +106,7 @@ void addUploadCommand(CLI::App& app, int& status) {
   command.footer(
       "Writes {\"file\":…,\"uploaded\":true} for each. A file whose upload the server does not confirm stays.");
   command.add_option("FILE", options->files, "Regular files that this user can read")->required();
-  addOptions(command, *options);
+  options->addTo(command);
   command.callback([options, &status] { status = upload(*options); });
 }
 
@@ -121,7 +115,7 @@ void addUploadLogCommand(CLI::App& app, int& status) {
   auto& command = *app.add_subcommand("upload-log", "Uploads log data: the values of a JSON array");
   command.footer("{\"$date\": SECONDS} and {\"$data\": \"BASE64\"} in it stand for a date and for data.");
   command.add_option("FILE", options->files, "File with the JSON array")->required()->expected(1);
-  addOptions(command, *options);
+  options->addTo(command);
   command.callback([options, &status] { status = uploadLog(*options); });
 }
 

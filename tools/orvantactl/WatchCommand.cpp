@@ -12,16 +12,17 @@
 #include <string>
 
 #include "platform/core/UniqueFd.h"
-#include "tools/orvantactl/ClientOptions.h"
+#include "tools/orvantactl/AnswerLines.h"
 #include "tools/orvantactl/Commands.h"
-#include "tools/orvantactl/EventJson.h"
-#include "tools/orvantactl/ExitStatus.h"
+#include "tools/orvantactl/ConfiguredSession.h"
+#include "tools/orvantactl/Output.h"
 
 namespace orvanta::ctl {
 
 namespace {
 
-// Waits for whichever comes first: SIGINT or SIGTERM, or finish() from the library's thread.
+// Waits until SIGINT or SIGTERM arrives or the library's thread calls finish(), whichever comes first. Made before the
+// library's thread, which inherits the blocked signals.
 class EndOfWatch {
  public:
   EndOfWatch() : _finished(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
@@ -34,7 +35,7 @@ class EndOfWatch {
   }
   bool usable() const { return _finished && _signals; }
 
-  // Gives whether it was the first to end it; the status of later ones does not count.
+  // Any thread. Returns whether it came first; the status of later calls does not count.
   bool finish(int status) {
     int undecided = kUndecided;
     if (!_status.compare_exchange_strong(undecided, status)) return false;
@@ -59,17 +60,14 @@ class EndOfWatch {
 };
 
 int watch(const ClientOptions& options) {
-  const auto userInfo = options.userInfo();
-  if (!userInfo) {
-    complain(userInfo.error());
-    return kUsage;
-  }
+  int status = kAllTaken;
+  const auto records = recordsOrComplain(options, status);
+  if (!records) return status;
   EndOfWatch end;  // outlives the connection, whose handlers use it
   if (!end.usable()) {
-    complain("the system gives no descriptors to wait with");
+    complain("the system has no descriptors left to wait with");
     return kSomethingNotTaken;
   }
-  int status = kAllTaken;
   const auto connection = connectOrComplain(options, status);
   if (!connection) return status;
   auto& session = connection->session();
@@ -81,8 +79,8 @@ int watch(const ClientOptions& options) {
         printLine("{\"end\":true}");
         end.finish(kAllTaken);
       });
-  const auto set = session.blocking().setSessionInfo(options.sessionInfo().dictionary(),
-                                                     *userInfo ? (*userInfo)->dictionary() : nullptr, nullptr, true);
+  const auto set = session.blocking().setSessionInfo(records->sessionInfo.dictionary(), records->userInfoDictionary(),
+                                                     nullptr, true);
   if (!set) return complain(set.error());
   if (!printLine(watchingLine(options.hierarchyToken, options.level))) return kAllTaken;  // main says what was lost
   // The daemon closes the connection soon after the end notice, too.
@@ -102,9 +100,7 @@ void addWatchCommand(CLI::App& app, int& status) {
       "  {\"timestamp\":…,\"category\":…,\"type\":…,\"payload\":…,\"session\":{…}}\n"
       "and {\"end\":true} when the daemon ends the aggregation. Ctrl-C leaves.\n"
       "Events come from sessions that give the same token with a higher level and have user info.");
-  options->addConnectionTo(command);
-  options->addSessionTo(command);
-  options->addUserInfoTo(command);
+  options->addTo(command);
   options->addHierarchyTo(command, "--token");
   command.get_option("--token")->required();
   command.callback([options, &status] { status = watch(*options); });

@@ -1,14 +1,13 @@
 #include <CLI/CLI.hpp>
 
 #include "platform/host/Process.h"
-#include "tools/orvantactl/ClientOptions.h"
 #include "tools/orvantactl/Commands.h"
-#include "tools/orvantactl/ExitStatus.h"
+#include "tools/orvantactl/Output.h"
 
 namespace {
 
 constexpr const char* kDescription =
-    "Speaks to orvantad as a client does: reports events, uploads files, watches what others report, and edits the "
+    "Speaks to orvantad as a client does: reports events, uploads files, watches the events of others, and edits the "
     "daemon's user defaults.";
 
 constexpr const char* kFooter =
@@ -18,7 +17,7 @@ constexpr const char* kFooter =
     "  orvantactl COMMAND --help\n"
     "\n"
     "Exit status: 0 the daemon took everything, 1 something was not taken or there is no answer to show,\n"
-    "2 the command line makes no sense, 3 no daemon is there or it turned this user away, 4 the daemon took\n"
+    "2 the command line is invalid, 3 the daemon does not run or refused this user, 4 the daemon took\n"
     "everything, but standard output did not take all answers.";
 
 }  // namespace
