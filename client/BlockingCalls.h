@@ -48,10 +48,10 @@ class BlockingCalls {
   CallResult<std::optional<std::string>> sendMessage(const MessageParameters& parameters);
   CallResult<FlushAnswer> flushMessages();
   CallResult<std::optional<std::string>> finishSession();
-  // While 16 files are being uploaded, waits for one to end.
+  // While kMaximumWaitingDescriptors files are being uploaded, waits for one to end.
   CallResult<bool> uploadFile(const std::string& path);
   CallResult<LogDataAnswer> uploadLogData(SharedArray logData);
-  // One event without a session: "finished" or "storebag not available".
+  // One event without a session. Returns "finished" or "storebag not available".
   CallResult<std::optional<std::string>> sendMessage(SharedDictionary sessionInfo, SharedDictionary userInfo,
                                                      std::uint16_t category, std::uint16_t type,
                                                      SharedDictionary payload);

@@ -13,10 +13,11 @@
 namespace orvanta {
 
 using platform::Frame;
+using platform::MutexLock;
 
 namespace {
 
-// Nothing tells when the daemon has read more; an answer does, and in between a look from time to time must do.
+// The socket does not report that the daemon has read more. An answer implies it; in between we look from time to time.
 constexpr std::chrono::milliseconds kRoomInterval{10};
 
 }  // namespace
@@ -41,7 +42,7 @@ void CallChannel::submit(std::uint32_t messageID, const CallMessage& message, Pe
   const auto waiting = outbox->pending();
   std::optional<CallError> error;
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     if (_refusal) {
       error = _refusal;
     } else if (waiting > 0 && waiting + message.bytes().size() > _maximumWaitingBytes) {
@@ -57,7 +58,7 @@ void CallChannel::submit(std::uint32_t messageID, const CallMessage& message, Pe
     failLater(std::move(reply), std::move(*error));  // NOLINT(bugprone-use-after-move): add() takes it only on success
     return;
   }
-  // Refused by the outbox means that the connection is about to end, which fails all that wait.
+  // When the outbox refuses the bytes, the connection is about to end, and that fails every unanswered call.
   if (descriptor) {
     outbox->sendWithDescriptor(message.bytes(), std::move(descriptor));
   } else {
@@ -72,30 +73,30 @@ void CallChannel::failLater(PendingReply reply, CallError error) {
 }
 
 void CallChannel::waitForRoom() {
-  std::unique_lock lock(_mutex);
-  while (!_refusal && _connection->outbox()->pending() > _maximumWaitingBytes) _progress.wait_for(lock, kRoomInterval);
+  MutexLock lock(_mutex);
+  while (!_refusal && _connection->outbox()->pending() > _maximumWaitingBytes) _progress.waitFor(lock, kRoomInterval);
 }
 
 void CallChannel::setHandlers(Handlers handlers) {
   auto fresh = handlers.aggregatedEvent || handlers.aggregationEnded
                    ? std::make_shared<const Handlers>(std::move(handlers))
                    : nullptr;
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   _handlers.swap(fresh);
 }
 
 bool CallChannel::hasAggregationHandler() const {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   return _handlers != nullptr;
 }
 
 void CallChannel::expectAggregation() {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   _aggregationOver = false;
 }
 
 void CallChannel::setLostHandler(LostHandler handler) {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   if (!_lost) {
     _lostHandler = std::move(handler);
   } else if (handler) {
@@ -105,20 +106,20 @@ void CallChannel::setLostHandler(LostHandler handler) {
 
 void CallChannel::close(std::chrono::milliseconds drain) {
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     if (std::exchange(_closing, true)) return;
     if (!_refusal) _refusal = CallError{"the program has closed the connection", CallErrorKind::connectionLost};
-    _progress.notify_all();
+    _progress.notifyAll();
   }
   _connection->cancel(drain);
 }
 
 void CallChannel::waitUntilQuiet() {
   {
-    std::unique_lock lock(_mutex);
-    _progress.wait(lock, [this] { return _ended; });
+    MutexLock lock(_mutex);
+    while (!_ended) _progress.wait(lock);
   }
-  // What was put off for the callback thread before now has run when this has.
+  // The jobs posted to the callback thread before this one have run when it has.
   std::promise<void> reached;
   auto quiet = reached.get_future();
   _connection->queue()->post([reached = std::move(reached)]() mutable { reached.set_value(); });
@@ -131,7 +132,7 @@ void CallChannel::abandon() {
   LostHandler lostHandler;
   CallError reason;
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     std::swap(waiting, _pending);
     handlers.swap(_handlers);
     lostHandler.swap(_lostHandler);
@@ -141,12 +142,12 @@ void CallChannel::abandon() {
 }
 
 bool CallChannel::isOpen() const {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   return !_refusal;
 }
 
 std::size_t CallChannel::unanswered() const {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   return _pending.size();
 }
 
@@ -156,10 +157,10 @@ void CallChannel::received(Frame&& frame) {
     case Frame::Kind::response: {
       PendingReply reply;
       {
-        const std::lock_guard lock(_mutex);
+        const MutexLock lock(_mutex);
         reply = _pending.take(frame.messageID);
       }
-      _progress.notify_all();
+      _progress.notifyAll();
       deliverResponse(std::move(frame), std::move(reply));
       return;
     }
@@ -167,7 +168,7 @@ void CallChannel::received(Frame&& frame) {
       receivedNotification(frame);
       return;
     case Frame::Kind::request:
-      return;  // The daemon asks nothing; a later one that does learns nothing from this library.
+      return;  // Today's daemon sends no requests; one of a later daemon stays unanswered.
   }
 }
 
@@ -180,7 +181,7 @@ void CallChannel::receivedNotification(Frame& frame) {
   if (!event) return;
   std::shared_ptr<const Handlers> handlers;
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     if (_aggregationOver) return;
     _aggregationOver = event->isEndNotice();
     handlers = _handlers;
@@ -194,7 +195,7 @@ void CallChannel::receivedNotification(Frame& frame) {
 }
 
 void CallChannel::interrupted() {
-  // A daemon that will say nothing more answers nothing more.
+  // A daemon that has shut down its sending side will not answer any more.
   _connection->cancel();
 }
 
@@ -203,14 +204,14 @@ void CallChannel::invalidated(const std::optional<std::string>& protocolError) {
   LostHandler lostHandler;
   CallError reason;
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     if (!_refusal) _refusal = endReason(protocolError);
     reason = *_refusal;
     _ended = true;
     _lost = !_closing;
     std::swap(waiting, _pending);
     if (_lost) lostHandler.swap(_lostHandler);
-    _progress.notify_all();
+    _progress.notifyAll();
   }
   _uploads.close(reason);
   waiting.failAll(reason);

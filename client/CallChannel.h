@@ -2,12 +2,10 @@
 
 #include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 
@@ -16,17 +14,22 @@
 #include "client/PendingReplies.h"
 #include "client/UploadTokens.h"
 #include "interface/ClientSessionInterface.h"
+#include "platform/core/Mutex.h"
 #include "platform/core/UniqueFd.h"
 #include "platform/ipc/Connection.h"
 
 namespace orvanta {
 
-// The client's end of one connection: sends calls, brings each its answer exactly once, and passes on what the daemon
-// says of its own accord.
+// The client's end of one connection: sends calls, brings each its answer exactly once, and passes the daemon's
+// notifications on.
 //
 // Shared by the OrvantaConnection, its session, and, until it has ended, the platform's connection. Calls may be made
-// on any thread; replies and handlers are called on the callback thread, one at a time. When the connection ends, every
-// call not answered fails with the reason, and so does every later one.
+// on any thread; replies and handlers are called on the callback thread, one at a time.
+//
+//   open ──close()──► closing ──┐
+//     └───────────────────────► ended (invalidated(): lost, unless close() came first)
+//
+// From the first step away from open every new call fails with _refusal; in the second every unanswered one does.
 class CallChannel final : public platform::ConnectionDelegate, public std::enable_shared_from_this<CallChannel> {
  public:
   struct Handlers {
@@ -46,17 +49,18 @@ class CallChannel final : public platform::ConnectionDelegate, public std::enabl
   void start();
 
   std::uint32_t nextMessageID() { return _nextMessageID++; }
-  // Sends a call that was made under `messageID`. What cannot be sent fails its reply, on the callback thread too.
+  // Sends a call that was made under `messageID`. If it cannot be sent, its reply fails, on the callback thread too.
   void submit(std::uint32_t messageID, const CallMessage& message, PendingReply reply,
               platform::UniqueFd descriptor = {});
   // Fails a reply on the callback thread, for a call that never came to be sent.
   void failLater(PendingReply reply, CallError error);
 
-  // For callers that may block: waits while the limit on waiting bytes is exceeded. Returns at once when the connection
-  // has ended. Not on the callback thread.
+  // For callers that may block: waits while more bytes than the limit wait to be sent. Returns at once when the
+  // connection has ended. Not on the callback thread.
   void waitForRoom();
 
-  // Called from now on; empty functions end that. An event already being delivered may still come to the earlier one.
+  // Replaces the handlers; empty functions remove them. An event already being delivered may still reach the earlier
+  // one.
   void setHandlers(Handlers handlers);
   bool hasAggregationHandler() const;
   // A session may be configured anew after aggregation has ended: then events count again.
@@ -64,17 +68,18 @@ class CallChannel final : public platform::ConnectionDelegate, public std::enabl
   // Called once when the connection ends without close(), or now if it has.
   void setLostHandler(LostHandler handler);
 
-  // Ends the connection; what has been sent gets up to `drain` to be taken by the daemon. Idempotent.
+  // Ends the connection; the daemon gets up to `drain` to read the calls already sent. Idempotent.
   void close(std::chrono::milliseconds drain);
-  // Waits until the connection has ended after close() and nothing will be called any more. Not on the callback thread.
+  // After close(): waits until the connection has ended and the last callback has run. Not on the callback thread.
   void waitUntilQuiet();
-  // Drops all handlers and fails what waits, here and now: for an owner that goes away on the callback thread itself.
+  // Drops all handlers and fails all unanswered calls on the spot: for an owner that is destroyed on the callback
+  // thread.
   void abandon();
   bool isOpen() const;
 
   UploadTokens& uploads() { return _uploads; }
   const CallbackThread& thread() const { return _thread; }
-  // How many calls have not been answered.
+  // The number of unanswered calls.
   std::size_t unanswered() const;
 
   void received(platform::Frame&& frame) override;
@@ -91,20 +96,21 @@ class CallChannel final : public platform::ConnectionDelegate, public std::enabl
   const std::size_t _maximumWaitingBytes;
 
   std::atomic<std::uint32_t> _nextMessageID{1};
-  UploadTokens _uploads;
+  UploadTokens _uploads;  // locks by itself
 
-  bool _heardAnything = false;  // touched on the callback thread only
+  // Owned by the callback thread.
+  bool _heardAnything = false;
 
-  mutable std::mutex _mutex;
-  std::condition_variable _progress;          // an answer came, or the connection ended
-  PendingReplies _pending;                    // guarded by _mutex
-  std::shared_ptr<const Handlers> _handlers;  // guarded by _mutex; null: none
-  LostHandler _lostHandler;                   // guarded by _mutex
-  bool _aggregationOver = false;              // guarded by _mutex: the end notice came
-  bool _closing = false;                      // guarded by _mutex: close() was called
-  bool _ended = false;                        // guarded by _mutex: invalidated() came
-  bool _lost = false;                         // guarded by _mutex: it came without close()
-  std::optional<CallError> _refusal;          // guarded by _mutex: why no call is taken any more
+  mutable platform::Mutex _mutex;
+  platform::Condition _progress;  // an answer came, or the connection ended
+  PendingReplies _pending GUARDED_BY(_mutex);
+  std::shared_ptr<const Handlers> _handlers GUARDED_BY(_mutex);  // null when none is set
+  LostHandler _lostHandler GUARDED_BY(_mutex);
+  bool _aggregationOver GUARDED_BY(_mutex) = false;      // the end notice came
+  bool _closing GUARDED_BY(_mutex) = false;              // close() was called
+  bool _ended GUARDED_BY(_mutex) = false;                // invalidated() came
+  bool _lost GUARDED_BY(_mutex) = false;                 // it came without close()
+  std::optional<CallError> _refusal GUARDED_BY(_mutex);  // why no call is taken any more; nullopt while open
 };
 
 }  // namespace orvanta

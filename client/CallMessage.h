@@ -15,8 +15,8 @@ namespace orvanta {
 // One call as it goes over the wire: its name comes from the table of calls, its arguments are appended one by one in
 // the table's order, all of them.
 //
-// Made and used up on the calling thread; the bytes sit in a buffer that the thread's calls share, so that a call costs
-// no allocation: one CallMessage at a time per thread.
+// Made and sent on the calling thread. The bytes are in a buffer that the calls of the thread share, so that a call
+// does not allocate: one CallMessage at a time per thread.
 class CallMessage {
  public:
   // A request under `messageID`, or a notification without one.

@@ -18,17 +18,17 @@ namespace orvanta {
 // that the program's handlers run on the program's own threads.
 class CallbackThread {
  public:
-  // Fails when the system gives no thread or descriptor.
+  // Fails when the system is out of threads or descriptors.
   static CallResult<std::shared_ptr<CallbackThread>> start();
   CallbackThread(const CallbackThread&) = delete;
   CallbackThread& operator=(const CallbackThread&) = delete;
-  // Joins the thread; never the last thing to go on the thread itself, which a connection sees to.
+  // Joins the thread, so it must not run on the thread itself: a connection that is destroyed there sees to that.
   ~CallbackThread();
 
-  // Whether the caller runs on this thread, where waiting for an answer would wait for ever.
+  // Returns whether the caller runs on this thread, where waiting for an answer would never end.
   bool isCurrent() const { return std::this_thread::get_id() == _id; }
 
-  // The library's own business.
+  // For the library alone.
   platform::WorkPool& pool() { return *_pool; }
 
  private:

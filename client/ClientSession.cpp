@@ -130,11 +130,11 @@ void ClientSession::uploadFile(const std::string& path, std::optional<std::strin
                                UploadReply completion) {
   auto opened = _channel->uploads().open(path, std::move(token), wait);
   if (!opened) {
-    // failLater ignores a reply that is there but empty, as nobody waits for it.
+    // An empty reply is not monostate, but failing it does nothing.
     _channel->failLater(std::move(completion), opened.error());
     return;
   }
-  // Answered even when the program does not care, since only the answer tells that the token has had its day.
+  // A request even when the program does not want an answer, since only the answer tells that the token is used up.
   UploadReply ended([channel = std::weak_ptr(_channel), token = opened->token,
                      completion = std::move(completion)](UploadReply::Outcome outcome) mutable {
     if (const auto live = channel.lock()) live->uploads().forget(token);

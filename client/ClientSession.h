@@ -17,10 +17,10 @@ class CallChannel;
 // them in a form that waits.
 //
 // Owned by the OrvantaConnection. Any thread may call. A reply is called on the library's callback thread, exactly
-// once, with the answer or with the reason why there is none; it must not throw, and should not take long, since the
-// other replies and events wait behind it. An empty reply asks for none: then nobody hears of a failure either.
+// once, with the answer or with the reason why there is none; it must not throw, and should return soon, since the
+// other replies and events wait behind it. With an empty reply the program does not learn of a failure either.
 //
-// Dictionaries and arrays must not be changed after they have been handed over.
+// Dictionaries and arrays must not be changed once they have been passed in.
 class ClientSession final : public ClientSessionInterface {
  public:
   explicit ClientSession(std::shared_ptr<CallChannel> channel);
@@ -30,9 +30,9 @@ class ClientSession final : public ClientSessionInterface {
 
   BlockingCalls blocking() { return BlockingCalls(*this, *_channel); }
 
-  // Events of this session and of those below it in its hierarchy come to `event`; after `ended` none will. Set before
-  // setSessionInfo, which tells the daemon (hasAggregationBlock). A handler that falls behind loses events: the daemon
-  // keeps 4 MiB of them.
+  // `event` is called with the events of this session and of those below it in its hierarchy; `ended` once, after the
+  // last. Set them before setSessionInfo, which tells the daemon (hasAggregationBlock). A handler that falls behind
+  // loses events: the daemon keeps kMaximumWaitingAggregatedEvents bytes of them.
   void setAggregationHandler(std::function<void(const AggregatedEvent&)> event, std::function<void()> ended);
   bool hasAggregationHandler() const;
 
@@ -46,8 +46,8 @@ class ClientSession final : public ClientSessionInterface {
   void sendMessageWithDictionary(SharedDictionary parameters, StringReply reply) override;
   void flushMessagesWithCompletion(FlushReply completion) override;
   void finishSessionWithReply(StringReply reply) override;
-  // Opens the file behind the URL and passes the descriptor under the given token; without a token the daemon has
-  // nothing to read and answers false.
+  // Opens the file behind the URL and passes the descriptor under the given token. Without a token no descriptor goes
+  // out, so the daemon cannot read the file and answers false.
   void uploadFileAtPath(std::string fileURL, std::optional<std::string> extensionToken,
                         UploadReply completion) override;
   void uploadLogData(SharedArray logData, LogDataReply completion) override;
@@ -55,7 +55,7 @@ class ClientSession final : public ClientSessionInterface {
                                   std::uint16_t type, SharedDictionary payload, StringReply reply) override;
 
   // The usual form: opens the file, makes up the token, and removes the file when the daemon says that the server has
-  // it (only if the path still leads to the very file that was opened). At most 16 files at a time.
+  // it (only if the path still leads to the very file that was opened). At most kMaximumWaitingDescriptors at a time.
   void uploadFileAtPath(const std::string& path, UploadReply completion);
 
  private:

@@ -18,7 +18,7 @@ namespace orvanta {
 
 namespace {
 
-// A daemon that is busy accepting others is asked again so often before giving up.
+// A daemon whose queue of connections is full is asked again this often before connect() fails.
 constexpr int kConnectAttempts = 300;
 constexpr std::chrono::milliseconds kConnectInterval{10};
 
@@ -59,8 +59,8 @@ CallResult<platform::UniqueFd> connectSocket(const std::string& directory) {
 
 platform::ConnectionLimits limits() {
   auto limits = kDaemonConnectionLimits;
-  // What waits to be sent must not keep answers from being read: a daemon that waits for its answers to be read reads
-  // no more calls either. The channel has a limit of its own.
+  // Calls that wait to be sent must not keep answers from being read: a daemon that waits for its answers to be read
+  // does not read calls either. The channel has a limit of its own.
   limits.maximumUnreadReplies = SIZE_MAX;
   return limits;
 }
@@ -94,7 +94,7 @@ OrvantaConnection::~OrvantaConnection() {
     return;
   }
   _channel->abandon();
-  // A thread cannot join itself: another waits for it to be done with the connection.
+  // A thread cannot join itself: another waits until it has finished with the connection.
   std::thread([channel = std::move(_channel), thread = std::move(_thread)]() mutable {
     channel->waitUntilQuiet();
     channel.reset();

@@ -19,21 +19,21 @@ struct ConnectionOptions {
   std::string socketDirectory{};
   // Null: the connection starts a thread of its own for its callbacks.
   std::shared_ptr<CallbackThread> callbackThread{};
-  // Bytes of calls that the daemon has not read yet. Above it a call fails at once, and one that waits waits.
+  // Bytes of calls that the daemon has not read yet. Above it an asynchronous call fails at once, a blocking one waits.
   std::size_t maximumWaitingBytes = kMaximumUnreadCalls;
-  // How long close() and the destructor let calls that were sent go out to a daemon that is slow to read.
+  // How long close() and the destructor give a daemon that is slow to read the calls already sent.
   std::chrono::milliseconds closingTime = kClosingTime;
 };
 
 // A connection to the daemon, which is one session there: it lives from connect() until close(), the destructor, or the
-// daemon's end.
+// end of the daemon.
 //
-// Owned by the program. Any thread may call, but not while another destroys it. Destroying it closes it: calls not yet
-// answered fail with connectionLost on the callback thread first, and no callback runs after that. Destroyed in one of
-// its own callbacks it does not wait: those calls fail on the spot, and the thread ends by itself soon after.
+// Owned by the program. Any thread may call, but not while another destroys it. Destroying it closes it: unanswered
+// calls first fail with connectionLost on the callback thread, and no callback runs after that. Destroyed in one of its
+// own callbacks it does not wait: those calls fail on the spot, and the thread ends by itself soon after.
 class OrvantaConnection {
  public:
-  // Does not wait for the daemon to answer, which admits or turns away only after this: the first call will tell.
+  // Does not wait for the daemon, which admits or refuses the program only after this: the first call will tell.
   static CallResult<std::unique_ptr<OrvantaConnection>> connect(ConnectionOptions options = {});
   OrvantaConnection(const OrvantaConnection&) = delete;
   OrvantaConnection& operator=(const OrvantaConnection&) = delete;
@@ -41,12 +41,12 @@ class OrvantaConnection {
 
   ClientSession& session() { return _session; }
 
-  // Called once, on the callback thread, when the connection ends without close(); at once if it has. The calls that
-  // were waiting have failed by then.
+  // Called once, on the callback thread, when the connection ends without close(); at once if it has ended so already.
+  // The unanswered calls have failed by then.
   void setConnectionLostHandler(std::function<void(const CallError&)> handler);
-  // Whether calls are still taken.
+  // Returns whether calls are still taken.
   bool isOpen() const;
-  // Ends the connection; what was sent still goes out (closingTime). Does not wait. Idempotent.
+  // Ends the connection; calls already sent still go out (closingTime). Does not wait. Idempotent.
   void close();
 
  private:

@@ -8,7 +8,7 @@
 
 namespace orvanta {
 
-// The records that a client hands to the daemon, as plain structs; dictionary() gives them the keys of
+// The records that a client sends to the daemon, as plain structs; dictionary() gives them the keys of
 // OrvantaConstants.h.
 
 // Links the session to related ones of other clients.
@@ -40,9 +40,9 @@ struct MessageParameters {
   std::uint16_t category = 0;
   std::uint16_t type = 0;
   std::optional<Dictionary> payload = std::nullopt;
-  // Shorthand for the two bits that flags have; joined with `flag`.
-  bool realtime = false;  // goes out at once, by way of the realtime URL
-  bool promote = false;   // makes a session that holds its events back report from now on
+  // The two bits of a flag by name; joined with `flag`.
+  bool realtime = false;  // goes out at once, to the realtime URL
+  bool promote = false;   // a session that holds its events back reports from now on
   std::uint32_t flag = 0;
 
   SharedDictionary dictionary() const;

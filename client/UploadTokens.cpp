@@ -14,28 +14,28 @@
 #include <system_error>
 #include <utility>
 
+#include "platform/core/Text.h"
+
 namespace orvanta {
 
+using platform::MutexLock;
 using platform::UniqueFd;
 
 namespace {
 
 CallError notReadable(const std::string& path, int error) {
-  return {fmt::format("cannot open {}: {}", path, std::generic_category().message(error)),
-          CallErrorKind::fileNotReadable};
+  return {fmt::format("cannot open {}: {}", path, platform::errnoText(error)), CallErrorKind::fileNotReadable};
 }
 
-// 128 random bits as hexadecimal digits; none when the system has none to give.
+// 128 random bits as hexadecimal digits; nullopt when the system does not give any.
 std::optional<std::string> makeToken() {
-  std::array<unsigned char, 16> bytes{};
+  std::array<char, 16> bytes{};
   if (::getrandom(bytes.data(), bytes.size(), 0) != static_cast<ssize_t>(bytes.size())) return std::nullopt;
-  std::string token;
-  for (const auto byte : bytes) token += fmt::format("{:02x}", byte);
-  return token;
+  return platform::hexText(std::string_view(bytes.data(), bytes.size()));
 }
 
-// What is no regular file is not opened but only referred to, since the daemon refuses it by its type alone: opening a
-// FIFO would wake its writer and lose what waits in it, and some devices act when they are opened.
+// Anything but a regular file is only referred to, not opened, since the daemon refuses it by its type alone: opening a
+// FIFO would wake its writer and lose the data in it, and some devices act when they are opened.
 UniqueFd openForDaemon(const std::string& path) {
   UniqueFd reference(::open(path.c_str(), O_PATH | O_CLOEXEC));
   struct stat attributes {};
@@ -73,8 +73,8 @@ CallResult<UploadTokens::Opened> UploadTokens::open(const std::string& path, std
   if (!token) token = makeToken();
   if (!token) return CallError{"no random bytes for an upload token", CallErrorKind::fileNotReadable};
 
-  std::unique_lock lock(_mutex);
-  if (wait) _ended.wait(lock, [this] { return _closed || _entries.size() < kMaximumInFlight; });
+  MutexLock lock(_mutex);
+  while (wait && !_closed && _entries.size() >= kMaximumInFlight) _ended.wait(lock);
   if (_closed) return *_closed;
   if (_entries.size() >= kMaximumInFlight) {
     return CallError{fmt::format("{} files are being uploaded, and no more may wait: go on when one has been answered",
@@ -88,16 +88,16 @@ CallResult<UploadTokens::Opened> UploadTokens::open(const std::string& path, std
 }
 
 void UploadTokens::forget(const std::string& token) {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   _entries.erase(token);
-  _ended.notify_all();
+  _ended.notifyAll();
 }
 
 void UploadTokens::removeFile(const std::string& token) {
   std::string path;
   struct stat opened {};
   {
-    const std::lock_guard lock(_mutex);
+    const MutexLock lock(_mutex);
     const auto found = _entries.find(token);
     if (found == _entries.end() || ::fstat(found->second.file.get(), &opened) != 0) return;
     path = found->second.path;
@@ -106,14 +106,14 @@ void UploadTokens::removeFile(const std::string& token) {
 }
 
 void UploadTokens::close(const CallError& reason) {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   _closed = reason;
   _entries.clear();
-  _ended.notify_all();
+  _ended.notifyAll();
 }
 
 std::size_t UploadTokens::inFlight() const {
-  const std::lock_guard lock(_mutex);
+  const MutexLock lock(_mutex);
   return _entries.size();
 }
 

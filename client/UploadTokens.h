@@ -2,15 +2,14 @@
 
 #include <sys/types.h>
 
-#include <condition_variable>
 #include <cstddef>
 #include <map>
-#include <mutex>
 #include <optional>
 #include <string>
 
 #include "interface/Reply.h"
 #include "interface/WireLimits.h"
+#include "platform/core/Mutex.h"
 #include "platform/core/UniqueFd.h"
 
 namespace orvanta {
@@ -21,7 +20,7 @@ namespace orvanta {
 // Owned by the connection's channel. Thread-safe.
 class UploadTokens {
  public:
-  // More descriptors than this may not wait at the daemon, or it ends the connection.
+  // With more descriptors waiting the daemon would end the connection.
   static constexpr std::size_t kMaximumInFlight = kMaximumWaitingDescriptors;
 
   struct Opened {
@@ -29,17 +28,17 @@ class UploadTokens {
     std::string token;
     platform::UniqueFd descriptor;  // for the daemon, which reads the file through it alone
   };
-  // Opens the file for reading; of anything but a regular file the descriptor only says what it is, so that nothing is
-  // woken or read by opening it (a FIFO, a device). Never waits for the file. A token is made up when none is given.
-  // While kMaximumInFlight files are being uploaded: waits for one to end if `wait`, else fails. The entry stays until
+  // Opens the file for reading; for anything but a regular file the descriptor only says what it is, so that opening it
+  // wakes and reads nothing (a FIFO, a device). Never waits for the file. Makes up a token if not given one. While
+  // kMaximumInFlight files are being uploaded: waits for one to end if `wait`, else fails. The entry stays until
   // forget().
   CallResult<Opened> open(const std::string& path, std::optional<std::string> token, bool wait);
-  // The upload has ended, whatever came of it.
+  // The upload has ended, well or not.
   void forget(const std::string& token);
   // Removes the token's file. Does nothing for an unknown token, or when the path leads to another file by now; a file
-  // that cannot be removed stays. Of a symbolic link the file behind it goes, and the link stays.
+  // that cannot be removed stays. For a symbolic link the file behind it is removed, and the link stays.
   void removeFile(const std::string& token);
-  // The connection has ended: forgets all tokens, wakes those who wait and fails whatever is opened from now on.
+  // The connection has ended: forgets all tokens, wakes the callers that wait in open(), and fails later ones.
   void close(const CallError& reason);
 
   std::size_t inFlight() const;
@@ -51,10 +50,10 @@ class UploadTokens {
     platform::UniqueFd file;
   };
 
-  mutable std::mutex _mutex;
-  std::condition_variable _ended;
-  std::map<std::string, Entry, std::less<>> _entries;  // guarded by _mutex
-  std::optional<CallError> _closed;                    // guarded by _mutex
+  mutable platform::Mutex _mutex;
+  platform::Condition _ended;  // an upload has, or the connection
+  std::map<std::string, Entry, std::less<>> _entries GUARDED_BY(_mutex);
+  std::optional<CallError> _closed GUARDED_BY(_mutex);  // why no upload is taken any more
 };
 
 }  // namespace orvanta

@@ -1,38 +1,35 @@
 #include "interface/FileURL.h"
 
+#include "platform/core/Text.h"
+
 namespace orvanta {
 
 namespace {
 
-bool isUnreserved(char c) {
-  return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '-' || c == '.' ||
-         c == '_' || c == '~';
+bool isDigitOrLetter(char c) {
+  return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9');
 }
 
-int hexDigit(char c) {
-  if (c >= '0' && c <= '9') return c - '0';
-  if (c >= 'a' && c <= 'f') return c - 'a' + 10;
-  if (c >= 'A' && c <= 'F') return c - 'A' + 10;
-  return -1;
+// The unreserved characters and the slash.
+bool isKept(char c) {
+  return isDigitOrLetter(c) || c == '-' || c == '.' || c == '_' || c == '~' || c == '/';
+}
+
+bool isHexDigit(char c) {
+  return (c >= '0' && c <= '9') || (c >= 'a' && c <= 'f') || (c >= 'A' && c <= 'F');
+}
+
+bool isWellEncoded(std::string_view text) {
+  for (auto at = text.find('%'); at != std::string_view::npos; at = text.find('%', at + 1)) {
+    if (at + 2 >= text.size() || !isHexDigit(text[at + 1]) || !isHexDigit(text[at + 2])) return false;
+  }
+  return true;
 }
 
 }  // namespace
 
 std::string fileURLForPath(std::string_view absolutePath) {
-  constexpr char kHex[] = "0123456789ABCDEF";
-  std::string url = "file://";
-  url.reserve(url.size() + absolutePath.size());
-  for (const char c : absolutePath) {
-    if (isUnreserved(c) || c == '/') {
-      url += c;
-    } else {
-      const auto byte = static_cast<unsigned char>(c);
-      url += '%';
-      url += kHex[byte >> 4U];
-      url += kHex[byte & 0xFU];
-    }
-  }
-  return url;
+  return "file://" + platform::percentEncode(absolutePath, isKept);
 }
 
 std::optional<std::string> pathForFileURL(std::string_view url) {
@@ -41,22 +38,9 @@ std::optional<std::string> pathForFileURL(std::string_view url) {
   if (!url.starts_with(kScheme)) return std::nullopt;
   url.remove_prefix(kScheme.size());
   if (url.starts_with(kLocalHost)) url.remove_prefix(kLocalHost.size());
-  if (!url.starts_with('/')) return std::nullopt;
-  std::string path;
-  path.reserve(url.size());
-  for (std::size_t i = 0; i < url.size(); ++i) {
-    char c = url[i];
-    if (c == '%') {
-      if (i + 2 >= url.size()) return std::nullopt;
-      const int high = hexDigit(url[i + 1]);
-      const int low = hexDigit(url[i + 2]);
-      if (high < 0 || low < 0) return std::nullopt;
-      c = static_cast<char>(high * 16 + low);
-      i += 2;
-    }
-    if (c == '\0') return std::nullopt;
-    path += c;
-  }
+  if (!url.starts_with('/') || !isWellEncoded(url)) return std::nullopt;
+  auto path = platform::percentDecode(url);
+  if (path.find('\0') != std::string::npos) return std::nullopt;
   return path;
 }
 

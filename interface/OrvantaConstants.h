@@ -20,7 +20,7 @@ inline constexpr std::string_view kOrvantaSessionInfoHierarchyToken = "hierarchy
 inline constexpr std::string_view kOrvantaHierarchyTokenTokenID = "tokenID";               // string
 inline constexpr std::string_view kOrvantaHierarchyTokenLevel = "level";                   // number, 0 is the root
 
-// User info; whatever else it holds is merged into the events.
+// User info; its other entries are merged into the events.
 inline constexpr std::string_view kOrvantaUserInfoClientName = "clientName";    // string
 inline constexpr std::string_view kOrvantaUserInfoServiceName = "serviceName";  // string
 

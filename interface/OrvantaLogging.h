@@ -13,8 +13,8 @@ namespace orvanta {
 // each line then written as "<level>text". ORVANTA_LOG_LEVEL (3 to 7, default 6) is the highest level written.
 class OrvantaLogging {
  public:
-  // Once per process, before other threads log. Takes both variables from the environment; a value that makes no sense
-  // is logged and the default used.
+  // Once per process, before other threads log. Takes both variables from the environment; an invalid value is logged
+  // and the default used.
   static void startLogging(const std::string& sender, const std::string& facility);
   static void close();
 };

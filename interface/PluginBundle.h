@@ -15,12 +15,12 @@
  * directory, its class "BriskAdaptor", the operation "sendMessageWithMethod:respCode:dict:". One instance is made for
  * each reporting session of a supported client type and gets every event of that session.
  *
- * Threads: the calls on one instance come one at a time, from create() to destroy(), on any thread of the daemon; calls
- * on different instances come at the same time. The session's client waits meanwhile: return soon. No exception may
+ * Threads: calls on one instance come one at a time, from create() to destroy(), on any thread of the daemon; calls on
+ * different instances may run at the same time. The session's client waits meanwhile: return soon. No exception may
  * leave a call.
  *
- * Pointers that the daemon passes are valid for the length of the call. What the plug-in returns (class, operation)
- * stays valid for as long as the process lives.
+ * Pointers that the daemon passes are valid during the call. The classes and operations that the plug-in returns must
+ * stay valid for as long as the process lives.
  */
 
 #include <stddef.h> /* NOLINT(modernize-deprecated-headers): this header is C */
@@ -50,22 +50,22 @@ typedef void (*OrvantaPluginOperation)(void* instance, uint16_t method, uint16_t
                                        size_t payloadLength);
 
 typedef struct OrvantaPluginClass {
-  /* A new instance; null when there can be none, and then nothing is called on it. */
+  /* A new instance, or null on failure: then nothing is called on it. */
   void* (*create)(void);
-  /* The end of an instance. May be null when nothing is to be done. */
+  /* Destroys an instance. May be null when there is nothing to do. */
   void (*destroy)(void* instance);
-  /* The operation of that name; null when the class has none. */
+  /* The operation of that name, or null when the class does not have it. */
   OrvantaPluginOperation (*findOperation)(const char* name);
 } OrvantaPluginClass;
 
 typedef struct OrvantaPluginBundle {
   /* ORVANTA_PLUGIN_ABI_VERSION; first in every version. */
   uint32_t abiVersion;
-  /* The class of that name; null when the bundle has none. */
+  /* The class of that name, or null when the bundle does not have it. */
   const OrvantaPluginClass* (*findClass)(const char* name);
 } OrvantaPluginBundle;
 
-/* What the plug-in defines. */
+/* Defined by the plug-in. */
 extern ORVANTA_PLUGIN_EXPORT const OrvantaPluginBundle orvantaPluginBundle;
 
 #ifdef __cplusplus
