@@ -104,7 +104,7 @@ class CallChannel final : public platform::ConnectionDelegate, public std::enabl
   mutable platform::Mutex _mutex;
   platform::Condition _progress;  // an answer came, or the connection ended
   PendingReplies _pending GUARDED_BY(_mutex);
-  std::shared_ptr<const Handlers> _handlers GUARDED_BY(_mutex);  // null when none is set
+  std::shared_ptr<const Handlers> _handlers GUARDED_BY(_mutex);  // null while not set
   LostHandler _lostHandler GUARDED_BY(_mutex);
   bool _aggregationOver GUARDED_BY(_mutex) = false;      // the end notice came
   bool _closing GUARDED_BY(_mutex) = false;              // close() was called

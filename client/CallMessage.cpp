@@ -18,8 +18,8 @@ namespace {
 // The frame's own array and that of its arguments stand around every argument.
 constexpr std::size_t kArgumentDepth = kMaximumFrameDepth - 2;
 
-// Below this no message can be charged more than kMaximumFrameCharge: one byte on the wire becomes at most one Value in
-// memory, whatever else is accounted for it.
+// Below this no message can be charged more than kMaximumFrameCharge: a byte on the wire is charged at most one Value,
+// everything included.
 constexpr std::size_t kHarmlessBytes = kMaximumFrameCharge / 128;
 
 constexpr std::size_t kBufferKept = 1U << 20U;

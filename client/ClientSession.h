@@ -17,7 +17,7 @@ class CallChannel;
 // them in a form that waits.
 //
 // Owned by the OrvantaConnection. Any thread may call. A reply is called on the library's callback thread, exactly
-// once, with the answer or with the reason why there is none; it must not throw, and should return soon, since the
+// once, with the answer or with the reason why it failed; it must not throw, and should return soon, since the
 // other replies and events wait behind it. With an empty reply the program does not learn of a failure either.
 //
 // Dictionaries and arrays must not be changed once they have been passed in.

@@ -8,7 +8,7 @@
 
 namespace orvanta {
 
-// Fails a reply, whatever its kind. Calls into the program.
+// Fails a reply of any kind. Calls into the program.
 void failPending(PendingReply&& reply, const CallError& error);
 
 // The calls of one connection that have not been answered, by message id: the channel adds one before its bytes go out,

@@ -19,7 +19,7 @@ using UploadReply = Reply<bool>;
 using LogDataReply = Reply<bool, std::optional<OrvantaError>>;
 using DoneReply = Reply<>;  // of operations without values: tells a waiting client that the call was carried out
 
-// What a client calls on the daemon: the eleven operations, in their declared order. Implemented by the daemon's
+// The eleven operations that a client calls on the daemon, in their declared order. Implemented by the daemon's
 // session and by the client's proxy; interface/RemoteCalls.h carries calls from one to the other.
 //
 // Calls of one connection are carried out one at a time in the order in which they were made. A reply is empty when the
@@ -47,7 +47,7 @@ class ClientSessionInterface {
                                           StringReply reply) = 0;
 };
 
-// What the daemon passes on to an aggregating client: one event, or the notice that aggregation has ended.
+// The content of one notification to an aggregating client: one event, or the notice that aggregation has ended.
 struct AggregatedEvent {
   SharedDictionary sessionInfo;  // of the session where the event entered; null in the end notice
   double timestamp = 0;          // seconds since 1970
@@ -57,7 +57,7 @@ struct AggregatedEvent {
   bool isEndNotice() const { return !sessionInfo && timestamp == 0 && category == 0 && type == 0 && !payload; }
 };
 
-// What the daemon calls on its client: one-way, without a reply.
+// The operation that the daemon calls on its client: one-way, without a reply.
 class ClientSessionReplyInterface {
  public:
   virtual ~ClientSessionReplyInterface() = default;

@@ -32,7 +32,7 @@ inline constexpr platform::FrameLimits kFrameLimits{kMaximumFrameBytes, kMaximum
 inline constexpr platform::ConnectionLimits kDaemonConnectionLimits{
     kFrameLimits, kMaximumUnreadReplies, kMaximumWaitingAggregatedEvents, kMaximumWaitingDescriptors};
 
-// What an argument must be. "OrNil" marks an optional one.
+// The type that an argument must have. "OrNil" marks an optional one.
 enum class ArgumentType {
   dictionary,
   dictionaryOrNil,
@@ -56,7 +56,7 @@ struct RemoteCall {
   const char* reply;  // the values that come back, in words; null for a notification
 };
 
-// What a client calls on the daemon, in the order of ClientSessionInterface.
+// A client's calls on the daemon, in the order of ClientSessionInterface.
 enum class RemoteCallID : std::uint8_t {
   setSessionInfo,
   startConfigWithCompletionHandler,
@@ -72,7 +72,7 @@ enum class RemoteCallID : std::uint8_t {
 };
 inline constexpr std::size_t kRemoteCallCount = 11;
 
-// What the daemon calls on its client; never answered.
+// The daemon's calls on its client; never answered.
 enum class RemoteNotificationID : std::uint8_t { sendMessageToClient, removeFile };
 inline constexpr std::size_t kRemoteNotificationCount = 2;
 
@@ -101,7 +101,7 @@ std::vector<std::uint8_t> encodeRemoveFile(std::string_view token);
 std::optional<AggregatedEvent> decodeSendMessageToClient(platform::Frame& frame);
 std::optional<std::string> decodeRemoveFile(const platform::Frame& frame);
 
-// The reply that a client's call waits for; monostate when the caller wants none.
+// The reply that a client's call waits for; monostate when the caller does not want an answer.
 using PendingReply =
     std::variant<std::monostate, DoneReply, BackendNamesReply, StringReply, FlushReply, UploadReply, LogDataReply>;
 

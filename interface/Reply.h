@@ -26,11 +26,11 @@ struct CallError {
   CallErrorKind kind = CallErrorKind::refused;
 };
 
-// What a call that waits returns: its answer, or the reason why there is none.
+// The result of a call that waits: its answer, or the reason why it failed.
 template <class T>
 using CallResult = Result<T, CallError>;
 
-// What a call that does not wait is answered with: the reply's values, or, while they are nullopt, the reason.
+// The result of a call that does not wait: the reply's values, or, when they are nullopt, the reason why it failed.
 template <class... Values>
 struct ReplyOutcome {
   std::optional<std::tuple<Values...>> values;

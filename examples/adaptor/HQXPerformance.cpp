@@ -17,7 +17,7 @@ namespace {
 
 // Where the daemon may write: its STATE_DIRECTORY, of several the first.
 std::string logPath() {
-  const char* const directories = std::getenv("STATE_DIRECTORY");  // NOLINT(concurrency-mt-unsafe): nobody sets it
+  const char* const directories = std::getenv("STATE_DIRECTORY");  // NOLINT(concurrency-mt-unsafe): never set
   std::string directory = directories == nullptr ? "/var/lib/orvanta" : directories;
   directory.resize(std::min(directory.find(':'), directory.size()));
   return directory + "/adaptor.log";
@@ -57,7 +57,7 @@ void sendMessage(void* instance, std::uint16_t method, std::uint16_t respCode, c
                  std::size_t payloadLength) {
   try {
     static_cast<const BriskAdaptor*>(instance)->sendMessage(method, respCode, payload, payloadLength);
-  } catch (const std::exception& error) {  // none may reach the daemon
+  } catch (const std::exception& error) {  // must not reach the daemon
     std::fprintf(stderr, "BriskAdaptor: %s\n", error.what());
   }
 }

@@ -18,7 +18,7 @@ class Aggregation : public ClientFixture {
     peer->notify("sendMessageToClient", {Dictionary{{"sessionID", 5}}, 12.5, category, 2, Dictionary{{"a", 1}}});
   }
   void sendEnd() { peer->notify("sendMessageToClient", {nullptr, 0.0, 0, 0, nullptr}); }
-  // What the handlers have seen by now; waits for all that the daemon has sent.
+  // The handlers' calls so far; waits for those of everything that the daemon has sent.
   std::vector<std::string> seen() {
     std::promise<std::vector<std::string>> promise;
     session().fetchDisplayURL(StringReply([&](StringReply::Outcome) { promise.set_value(_seen); }));

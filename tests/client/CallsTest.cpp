@@ -1,4 +1,4 @@
-// What each operation looks like on the wire, and how answers find their way back.
+// Operations on the wire, and the way back of their answers.
 
 #include <tuple>
 
@@ -10,7 +10,7 @@ namespace {
 
 using Calls = ClientFixture;
 
-// What else the calls carry reaches the real daemon in the integration tests.
+// The integration tests show the other calls to the real daemon.
 TEST_F(Calls, goOutAsRequestsOrNotificationsWithAllTheirArguments) {
   const auto list = std::make_shared<const Array>(Array{"x", platform::Date{5}, platform::Data{{1, 2}}});
   session().setSessionInfo(shared({{"sessionID", 7}}), nullptr, list, true, {});
@@ -37,10 +37,10 @@ TEST_F(Calls, malformedAnswersFailTheCallAndNothingElse) {
       {"too many values", nullptr, Array{"sent", nullptr, nullptr}},
       {"number for a text", nullptr, Array{5, nullptr}},
       {"error without a code", nullptr, Array{nullptr, noCode}},
-      {"result that is no array", nullptr, "sent"},
+      {"result that is not an array", nullptr, "sent"},
       {"neither error nor result", nullptr, nullptr},
       {"transport's error", "reply dropped", nullptr},
-      {"error that is no text", 17, Array{"sent", nullptr}},
+      {"error that is not a text", 17, Array{"sent", nullptr}},
   };
   for (const auto& [flaw, error, result] : rows) {
     Awaited<FlushReply> flushed;
@@ -56,16 +56,16 @@ TEST_F(Calls, whatTheDaemonSaysUnaskedIsIgnored) {
   Awaited<StringReply> reply;
   session().fetchDisplayURL(reply.reply());
   const Frame call = peer->next();
-  peer->respond(call.messageID + 1000, nullptr, Array{"for nobody"});
+  peer->respond(call.messageID + 1000, nullptr, Array{"for no call"});
   peer->notify("brewCoffee", {1});
-  peer->notify("removeFile", {"a token of nobody's"});
+  peer->notify("removeFile", {"an unknown token"});
   peer->notify("removeFile", {});
   peer->notify("sendMessageToClient", {1, 2, 3});
   peer->write(request(1, "x"));
   EXPECT_FALSE(reply.isReady());
   peer->answer(call, {"at last"});
   EXPECT_EQ(textOf(reply.get()), "at last");
-  // The same id again finds nobody.
+  // Under the same id no call waits any more.
   peer->answer(call, {"twice"});
   exchangeOneCall();
 }

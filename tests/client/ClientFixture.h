@@ -18,11 +18,11 @@
 namespace orvanta::test {
 using platform::Frame;
 
-constexpr std::chrono::seconds kPatience{30};
+constexpr std::chrono::seconds kTimeout{30};
 
 template <class T>
 T within(std::future<T>& future) {
-  if (future.wait_for(kPatience) != std::future_status::ready) throw std::runtime_error("waited in vain");
+  if (future.wait_for(kTimeout) != std::future_status::ready) throw std::runtime_error("waited in vain");
   return future.get();
 }
 

@@ -70,7 +70,7 @@ TEST_F(Upload, removesNoOtherFileThanTheOneItOpened) {
   const auto path = files.write("f", "mine");
   uploadAndRemove(path, [&] {
     std::filesystem::remove(path);
-    files.write("f", "somebody else's");
+    files.write("f", "another file");
   });
   EXPECT_TRUE(std::filesystem::exists(path));
 }
@@ -139,15 +139,15 @@ TEST_F(Upload, keepsNoMoreDescriptorsWaitingThanTheDaemonAllows) {
   session().uploadFileAtPath(path, tooMany.reply());
   EXPECT_EQ(tooMany.get().error.kind, CallErrorKind::tooMuchWaiting);
 
-  auto patient = std::async(std::launch::async, [&] { return session().blocking().uploadFile(path); });
+  auto waiting = std::async(std::launch::async, [&] { return session().blocking().uploadFile(path); });
   peer->answer(calls[7].frame, {true});
   peer->answer(nextUpload().frame, {true});
-  EXPECT_TRUE(within(patient).value());
+  EXPECT_TRUE(within(waiting).value());
 
   session().uploadFileAtPath(path, {});  // takes the free place again
-  patient = std::async(std::launch::async, [&] { return session().blocking().uploadFile(path); });
+  waiting = std::async(std::launch::async, [&] { return session().blocking().uploadFile(path); });
   peer->close();
-  EXPECT_FALSE(within(patient)) << "waiting for a place ends with the connection";
+  EXPECT_FALSE(within(waiting)) << "waiting for a place ends with the connection";
 }
 
 TEST(FileURLs, readBackAsThePathsTheyCameFrom) {

@@ -17,7 +17,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// What leaves the daemon by other ways than the network, and what it tells its service manager.
+// Reports that leave the daemon other than by the network, and its messages to the service manager.
 class AdaptorTest : public IntegrationFixture {
  protected:
   void SetUp() override {
@@ -59,7 +59,7 @@ TEST_F(AdaptorTest, EventsOfItsClientTypesReachTheAdaptorWithTheServerUpAndDown)
   }
 }
 
-TEST_F(AdaptorTest, OtherClientTypesAndDesktopDevicesHaveNone) {
+TEST_F(AdaptorTest, OtherClientTypesAndDesktopDevicesHaveNoAdaptor) {
   startDaemon();
   sendBoth(*sessionOfType(12));
   EXPECT_EQ(daemon->count("<3>BriskBackend(initWithName): No matching bundle found for client type 12"), 1U);

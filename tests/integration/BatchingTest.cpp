@@ -17,7 +17,7 @@ class BatchingTest : public IntegrationFixture {
   }
   static UserInfo user() { return {"client", "service", {}}; }
   std::vector<collector::ReceivedRequest> posts() { return server->requests(RequestKind::events); }
-  bool waitForPosts(std::size_t count) { return server->waitForRequests(RequestKind::events, count, kPatience); }
+  bool waitForPosts(std::size_t count) { return server->waitForRequests(RequestKind::events, count, kTimeout); }
 };
 
 TEST_F(BatchingTest, ARealtimeEventIsPrecededByWhatWaited) {

@@ -33,7 +33,7 @@ TEST_F(ConnectionTest, AThousandPipelinedSendsAreAnsweredOnceEachInOrder) {
                                                    if (i == kCalls - 1) done.set_value();
                                                  }));
   }
-  ASSERT_EQ(done.get_future().wait_for(kPatience), std::future_status::ready);
+  ASSERT_EQ(done.get_future().wait_for(kTimeout), std::future_status::ready);
   ASSERT_EQ(order.size(), static_cast<std::size_t>(kCalls));
   for (int i = 0; i < kCalls; ++i) EXPECT_EQ(order[i], i);
 }
@@ -159,7 +159,7 @@ TEST_F(ConnectionTest, SIGTERMEndsAFetchAndLeavesNoRequestThatWasReadWithoutAnAn
   EXPECT_FALSE(client.answer());
 }
 
-TEST_F(ConnectionTest, AClientThatNeverReadsStopsBeingReadAndHarmsNobody) {
+TEST_F(ConnectionTest, AClientThatNeverReadsStopsBeingReadAndHarmsNoOther) {
   auto bystander = openSession({.sessionID = 1, .batchEvent = true});
   const auto residentBefore = daemon->residentKiB();
   auto silent = rawClient();
@@ -178,7 +178,7 @@ TEST_F(ConnectionTest, AClientThatNeverReadsStopsBeingReadAndHarmsNobody) {
   writer.join();
 }
 
-TEST_F(ConnectionTest, AnAggregatorThatDoesNotReadDelaysNobodyAndHearsOfItsEnd) {
+TEST_F(ConnectionTest, AnAggregatorThatDoesNotReadDelaysNoOtherAndHearsOfItsEnd) {
   auto aggregator = rawClient();
   SessionInfo info{.sessionID = 1, .clientType = 5, .batchEvent = true};
   info.hierarchyToken = HierarchyToken{"t", 0};
@@ -192,7 +192,7 @@ TEST_F(ConnectionTest, AnAggregatorThatDoesNotReadDelaysNobodyAndHearsOfItsEnd) 
   EXPECT_TRUE(daemon->logged("<4>sendMessageToClient: Dropping aggregated events: ", 1));
   EXPECT_EQ(daemon->count("Dropping aggregated events"), 1U);
 
-  // Once it reads, it hears the oldest in order, whatever came in between is lost, and in the end that it has ended.
+  // Once it reads, it hears the oldest in order, loses those in between, and hears of the end last.
   daemon->process().signal(SIGTERM);
   std::vector<AggregatedEvent> heard;
   while (auto frame = aggregator.answer()) {
@@ -237,7 +237,7 @@ TEST_F(StartedLaterTest, OneSessionsFetchHoldsUpNoOtherSessionsEventsAndEndsAtIt
   }
   EXPECT_GT(sent, 100) << "events went on during the 15 seconds of the fetch";
   EXPECT_EQ(outcome.get(), std::nullopt);
-  EXPECT_EQ(server->requests(RequestKind::storebag).size(), 2U) << "after a failure nobody asks again at once";
+  EXPECT_EQ(server->requests(RequestKind::storebag).size(), 2U) << "after a failure no session asks again at once";
 }
 
 }  // namespace

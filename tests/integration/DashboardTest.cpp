@@ -30,7 +30,7 @@ class DashboardTest : public IntegrationFixture {
   Dictionary dashboard(int period, std::uint16_t port) const {
     return {{"dashboard", Dictionary{{"ip", "127.0.0.1"}, {"port", port}, {"reliable", period}}}};
   }
-  // What the collector has received, by event number.
+  // The datagrams that the collector has received, by event number.
   std::map<std::uint16_t, std::vector<collector::ReceivedDatagram>> transmissions() {
     std::map<std::uint16_t, std::vector<collector::ReceivedDatagram>> found;
     for (auto& datagram : server->datagrams()) found[datagram.eventNumber].push_back(std::move(datagram));
@@ -67,7 +67,7 @@ TEST_F(DashboardTest, NothingIsLostOrAcknowledgedTwiceWhenAcknowledgementsAreLos
              return each.second.back().acknowledgements > 0 || each.second.size() == 5;
            });
   };
-  ASSERT_TRUE(server->inbox().waitUntil(settled, kPatience));
+  ASSERT_TRUE(server->inbox().waitUntil(settled, kTimeout));
   EXPECT_TRUE(daemon->settles([this] { return daemon->descriptorCount(); }, descriptors));
   EXPECT_TRUE(settled()) << "nothing was sent again after its acknowledgement";
 
@@ -110,7 +110,7 @@ TEST_F(DashboardTest, AThousandSessionsLeaveNothingBehind) {
 }
 
 // The dashboard server, and a stranger, flood the daemon with everything but the right acknowledgement.
-TEST_F(DashboardTest, AMillionWrongAcknowledgementsRemoveNothingAndHarmNobody) {
+TEST_F(DashboardTest, AMillionWrongAcknowledgementsRemoveNothingAndDoNoHarm) {
   constexpr unsigned kFlood = 1'000'000;
   UdpServer dashboardServer, stranger;
   const auto numberOf = [](const std::optional<std::vector<std::uint8_t>>& datagram) {

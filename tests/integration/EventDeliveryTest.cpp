@@ -68,7 +68,7 @@ TEST_F(EventDeliveryTest, ATamperedStorebagIsRefused) {
   EXPECT_TRUE(daemon->logged("<3>fetchAndCacheStorebag: Unable to fetch storebag for client type 5"));
 }
 
-// Whoever stands at the other end without a good certificate sees no byte of payload.
+// A server without a valid certificate does not see a byte of payload.
 TEST_F(EventDeliveryTest, WithoutAGoodCertificateNoPayloadLeavesAndTheReasonIsLogged) {
   const std::pair<collector::CertificateFlaw, const char*> rows[] = {
       {collector::CertificateFlaw::wrongHost, "subject name"},

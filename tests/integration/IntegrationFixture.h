@@ -25,7 +25,7 @@ using collector::RequestKind;
 // section, then calls startDaemon().
 class IntegrationFixture : public ::testing::Test {
  protected:
-  static constexpr std::chrono::seconds kPatience{60};
+  static constexpr std::chrono::seconds kTimeout{60};
 
   // A device with consent, so that nothing but what a test changes keeps events back.
   IntegrationFixture() {
@@ -130,7 +130,7 @@ class IntegrationFixture : public ::testing::Test {
     return found;
   }
   bool waitForClientEvents(std::size_t count) {
-    return server->inbox().waitUntil([this, count] { return clientEvents().size() >= count; }, kPatience);
+    return server->inbox().waitUntil([this, count] { return clientEvents().size() >= count; }, kTimeout);
   }
   static std::vector<std::uint8_t> fileBytes(const std::string& path) {
     std::ifstream in(path, std::ios::binary);

@@ -26,7 +26,7 @@ TEST_F(LifecycleTest, SessionsSendTheirStartFinishAndEnd) {
   auto session = openSession({.sessionID = 1});
   ASSERT_TRUE(session->session().blocking().finishSession());
   session.reset();
-  ASSERT_TRUE(server->waitForEvents(3, kPatience));
+  ASSERT_TRUE(server->waitForEvents(3, kTimeout));
   EXPECT_EQ(records(0), 1U);
   EXPECT_EQ(records(2), 1U);
   EXPECT_EQ(records(1), 1U);
@@ -46,7 +46,7 @@ TEST_F(LifecycleTest, SIGTERMEndsSessionsWhileTheirClientsAreConnected) {
   EXPECT_EQ(daemon->terminate(), 0) << daemon->process().allLines();
   EXPECT_EQ(records(1), 5U);
   EXPECT_EQ(clientEvents().size(), 1U) << "what was batched went out with the last flush";
-  ASSERT_TRUE(server->waitForDatagrams(11, kPatience));  // five starts, five ends, one event
+  ASSERT_TRUE(server->waitForDatagrams(11, kTimeout));  // five starts, five ends, one event
   const auto datagrams = server->datagrams();
   EXPECT_EQ(std::count_if(datagrams.begin(), datagrams.end(), [](auto& d) { return d.method == 0 && d.respCode == 1; }),
             5);

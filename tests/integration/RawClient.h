@@ -13,7 +13,7 @@ namespace orvanta::test {
 struct RawClient : Peer {
   explicit RawClient(const std::string& directory)
       : Peer(std::move(platform::connectToService(directory, "com.kovalt.orvantad").value())) {}
-  // The next answer; none at the end.
+  // The next answer; nullopt at the end.
   std::optional<platform::Frame> answer() { return nextFrame(); }
 };
 

@@ -59,7 +59,7 @@ TEST_F(RelatedSessionsTest, FiveProgramsFollowTheirHierarchy) {
   EXPECT_EQ(postedSessionID(104).substr(0, 2 * kOwn + 2), leftID + ".") << "the first of level 1 is the parent";
   EXPECT_EQ(postedSessionID(104).size(), 3 * kOwn + 2);
 
-  // What the root hears comes in the order in which it was sent: with the last event all have come.
+  // The root hears events in the order in which they were sent: with the last one all have come.
   ASSERT_TRUE(root->waitForLine("received 20/4 marker 104 who 4 from 4")) << root->allLines();
   EXPECT_EQ(receivedBy(*root), (std::vector<std::string>{
                                    "received 20/1 marker 100 who 1 from 1", "received 20/2 marker 101 who 2 from 2",

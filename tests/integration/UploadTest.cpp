@@ -106,7 +106,7 @@ TEST_F(UploadTest, AFileIsReadAndRemovedAsItWasOpened) {
   EXPECT_TRUE(fs::is_symlink(path));
 }
 
-TEST_F(UploadTest, FilesThatChangeWhileTheyAreReadHarmNobody) {
+TEST_F(UploadTest, FilesThatChangeWhileTheyAreReadDoNoHarm) {
   answerWith("kept");
   const auto growing = files.write("growing", std::string(1'000'000, 'g'));
   const auto shrinking = files.write("shrinking", std::string(1'000'000, 's'));
@@ -219,7 +219,7 @@ TEST_F(LogDataTest, LogDataIsArchivedAndAnnounced) {
       {reinterpret_cast<const std::uint8_t*>(posts[0].body.data()), posts[0].body.size()});
   ASSERT_TRUE(archive) << archive.error();
   EXPECT_EQ(*archive, Dictionary({{"archiver", "OrvantaArchiver"}, {"version", 1}, {"root", logData}}));
-  ASSERT_TRUE(server->waitForDatagrams(2, kPatience)) << "the start of the session, and the announcement";
+  ASSERT_TRUE(server->waitForDatagrams(2, kTimeout)) << "the start of the session, and the announcement";
   const auto announcement = server->datagrams()[1];
   EXPECT_EQ(announcement.method, 0);
   EXPECT_EQ(announcement.respCode, 2);

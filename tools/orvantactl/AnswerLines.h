@@ -16,8 +16,8 @@ std::string answerLine(std::uint64_t line, const StringReply::Outcome& outcome);
 
 // {"flush":{"result":…,"error":null}}, with an error as {"code":…,"description":…}.
 std::string flushLine(const FlushAnswer& answer);
-// What the last flush did not send; nullopt when nothing is amiss. That there was nothing to flush is fine: unbatched
-// events went out one by one, and what the storebag filters out is meant to stay.
+// The problem that the last flush had; nullopt when it had none. That there was nothing to flush is fine: unbatched
+// events went out one by one, and the storebag means filtered ones to stay.
 std::optional<std::string> flushProblem(const FlushAnswer& answer);
 
 // Of `orvantactl watch`.

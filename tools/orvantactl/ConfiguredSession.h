@@ -11,7 +11,7 @@ namespace orvanta::ctl {
 // The ways from options to a session, for every command. Each says on standard error why it fails, and sets `status`
 // then.
 
-// What the session options describe. Fails with kUsage.
+// The two records that the options describe. Fails with kUsage.
 struct SessionRecords {
   SessionInfo sessionInfo;
   std::optional<UserInfo> userInfo;

@@ -44,7 +44,7 @@ std::optional<std::string> readPayload(Value& value, std::optional<Dictionary>& 
   return std::nullopt;
 }
 
-// What is wrong with one entry of the line; nullopt when it has been taken.
+// Takes one entry of the line. Returns what is wrong with it, or nullopt.
 std::optional<std::string> readEntry(const std::string& key, Value& value, MessageParameters& event) {
   if (key == kOrvantaMessageParametersCategory) return readNumber(value, key, event.category);
   if (key == kOrvantaMessageParametersType) return readNumber(value, key, event.type);

@@ -123,7 +123,7 @@ Result<Value> typedValue(const std::string& text, const std::string& type) {
 Result<Value> parseDefaultsValue(const std::string& text, const std::string& type) {
   auto value = typedValue(text, type);
   if (!value) return value;
-  // Tried in the form in which it will be stored, which has none for null inside, say.
+  // Tried in the form in which it will be stored: that has no null, for example.
   const auto written = platform::writeXmlPropertyList(*value);
   if (!written) return Failure{"the value cannot be stored: " + written.error()};
   return value;

@@ -22,7 +22,7 @@ ExitStatus exitStatusFor(const CallError& error) {
 }
 
 void complain(const std::string& text) {
-  // fwrite does not throw: a closed standard error is no reason to abort.
+  // fwrite does not throw: a closed standard error must not abort the program.
   const auto line = fmt::format("orvantactl: {}\n", text);
   std::fwrite(line.data(), 1, line.size(), stderr);
 }

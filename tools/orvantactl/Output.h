@@ -6,7 +6,7 @@
 
 namespace orvanta::ctl {
 
-// What orvantactl writes, and its exit status. Answers go to standard output, complaints to standard error.
+// The output and the exit status of orvantactl. Answers go to standard output, complaints to standard error.
 
 // docs/client.md, the manual page and the help text list these.
 enum ExitStatus : int {
