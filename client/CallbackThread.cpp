@@ -1,7 +1,5 @@
 #include "client/CallbackThread.h"
 
-#include <signal.h>
-
 #include <exception>
 #include <future>
 #include <string>
@@ -10,31 +8,10 @@
 
 namespace orvanta {
 
-namespace {
-
-// Threads inherit the mask of the one that starts them.
-class AllSignalsBlocked {
- public:
-  AllSignalsBlocked() {
-    sigset_t all;
-    sigfillset(&all);
-    ::pthread_sigmask(SIG_SETMASK, &all, &_before);
-  }
-  ~AllSignalsBlocked() { ::pthread_sigmask(SIG_SETMASK, &_before, nullptr); }
-  AllSignalsBlocked(const AllSignalsBlocked&) = delete;
-  AllSignalsBlocked& operator=(const AllSignalsBlocked&) = delete;
-
- private:
-  sigset_t _before{};
-};
-
-}  // namespace
-
 CallResult<std::shared_ptr<CallbackThread>> CallbackThread::start() {
   try {
-    // One thread and never another, so that callbacks run one at a time.
+    // One thread and never another, so that callbacks run one at a time. The pool blocks all signals on it.
     auto pool = std::make_unique<platform::WorkPool>(1, 0);
-    const AllSignalsBlocked blocked;
     pool->start();
     return std::shared_ptr<CallbackThread>(new CallbackThread(std::move(pool)));
   } catch (const std::exception& failure) {
