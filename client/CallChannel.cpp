@@ -4,11 +4,11 @@
 #include <unistd.h>
 
 #include <future>
+#include <type_traits>
 #include <utility>
 #include <variant>
 
 #include "interface/OrvantaConstants.h"
-#include "interface/RemoteCalls.h"
 
 namespace orvanta {
 
@@ -20,7 +20,29 @@ namespace {
 // The socket does not report that the daemon has read more. An answer implies it; in between we look from time to time.
 constexpr std::chrono::milliseconds kRoomInterval{10};
 
+// Fails a reply of any kind. Calls into the program.
+void failReply(PendingReply&& reply, const CallError& error) {
+  std::visit(
+      [&error](auto& held) {
+        if constexpr (!std::is_same_v<std::decay_t<decltype(held)>, std::monostate>) held.fail(error);
+      },
+      reply);
+}
+
 }  // namespace
+
+bool PendingReplies::add(std::uint32_t messageID, PendingReply&& reply) {
+  return _replies.try_emplace(messageID, std::move(reply)).second;
+}
+
+PendingReply PendingReplies::take(std::uint32_t messageID) {
+  const auto node = _replies.extract(messageID);
+  return node.empty() ? PendingReply{} : std::move(node.mapped());
+}
+
+void PendingReplies::failAll(const CallError& error) {
+  while (!_replies.empty()) failReply(std::move(_replies.extract(_replies.begin()).mapped()), error);
+}
 
 CallChannel::CallChannel(std::shared_ptr<platform::Connection> connection, const CallbackThread& thread,
                          std::size_t maximumWaitingBytes)
@@ -69,7 +91,7 @@ void CallChannel::submit(std::uint32_t messageID, const CallMessage& message, Pe
 void CallChannel::failLater(PendingReply reply, CallError error) {
   if (std::holds_alternative<std::monostate>(reply)) return;
   _connection->queue()->post(
-      [reply = std::move(reply), error = std::move(error)]() mutable { failPending(std::move(reply), error); });
+      [reply = std::move(reply), error = std::move(error)]() mutable { failReply(std::move(reply), error); });
 }
 
 void CallChannel::waitForRoom() {

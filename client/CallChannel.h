@@ -5,20 +5,36 @@
 #include <cstddef>
 #include <cstdint>
 #include <functional>
+#include <map>
 #include <memory>
 #include <optional>
 #include <string>
 
 #include "client/CallMessage.h"
 #include "client/CallbackThread.h"
-#include "client/PendingReplies.h"
 #include "client/UploadTokens.h"
-#include "interface/ClientSessionInterface.h"
+#include "interface/RemoteCalls.h"
 #include "platform/core/Mutex.h"
 #include "platform/core/UniqueFd.h"
 #include "platform/ipc/Connection.h"
 
 namespace orvanta {
+
+// The calls of one connection that have not been answered, by message id: the channel adds one before its bytes go out,
+// and takes it when the response comes or fails all when the connection ends. Not thread-safe: the channel locks.
+class PendingReplies {
+ public:
+  // Returns false, and leaves the reply alone, when the id is in use.
+  bool add(std::uint32_t messageID, PendingReply&& reply);
+  // Returns monostate for an id under which no reply waits.
+  PendingReply take(std::uint32_t messageID);
+  // Fails all of them, in the order of their ids.
+  void failAll(const CallError& error);
+  std::size_t size() const { return _replies.size(); }
+
+ private:
+  std::map<std::uint32_t, PendingReply> _replies;
+};
 
 // The client's end of one connection: sends calls, brings each its answer exactly once, and passes the daemon's
 // notifications on.

@@ -18,8 +18,8 @@ struct Progress {
 // "[=====>    ]  52 %  1234 events  5678/s", or without the bar when the total is not known.
 std::string renderProgress(const Progress& progress);
 
-// Shows progress on standard error once the input turns out to be long: after a second or a thousand events. Used by
-// one thread.
+// Shows progress on standard error once the input turns out to be long: after a second or a thousand events, and then
+// at most ten times a second. Owned by the command and used on its thread; without `enabled` it shows nothing.
 class ProgressBar {
  public:
   ProgressBar(bool enabled, std::optional<std::uint64_t> totalBytes)
