@@ -26,9 +26,9 @@ bool holdsCategory(const std::vector<std::int32_t>& list, std::uint16_t category
 
 }  // namespace
 
-OrvantaBackend::OrvantaBackend(Platform& platform, std::string name, SharedDictionary profile,
+OrvantaBackend::OrvantaBackend(BackendServices& services, std::string name, SharedDictionary profile,
                                const BackendSetup& setup)
-    : _platform(platform),
+    : _services(services),
       _name(std::move(name)),
       _profile(std::move(profile)),
       _identity(setup.identity),

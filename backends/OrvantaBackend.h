@@ -10,10 +10,10 @@
 #include <string_view>
 #include <vector>
 
+#include "backends/BackendServices.h"
 #include "backends/BackendSetup.h"
 #include "backends/Event.h"
 #include "config/DeviceInfo.h"
-#include "config/Platform.h"
 #include "interface/OrvantaError.h"
 #include "interface/Values.h"
 #include "platform/core/Clock.h"
@@ -41,7 +41,7 @@ using FlushCompletion = platform::UniqueFunction<void(std::optional<std::string>
 class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
  public:
   // Draws the sampling factor: one draw per backend constructed, from the process's drand48 sequence.
-  OrvantaBackend(Platform& platform, std::string name, SharedDictionary profile, const BackendSetup& setup);
+  OrvantaBackend(BackendServices& services, std::string name, SharedDictionary profile, const BackendSetup& setup);
   virtual ~OrvantaBackend();
   OrvantaBackend(const OrvantaBackend&) = delete;
   OrvantaBackend& operator=(const OrvantaBackend&) = delete;
@@ -101,7 +101,8 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
   // What sendMessage() does with the event once it has its number.
   virtual std::optional<std::string> sendNumbered(const Event& event);
 
-  Platform& platform() const { return _platform; }
+  BackendServices& services() const { return _services; }
+  Platform& platform() const { return _services.platform(); }
   const SharedDictionary& profile() const { return _profile; }
   void setDisplayURL(std::optional<std::string> url) { _displayURL = std::move(url); }
   void setEventWhitelist(std::optional<std::vector<std::int32_t>> list) { _eventWhitelist = std::move(list); }
@@ -111,7 +112,7 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
   std::mutex& mutex() const { return _mutex; }
 
  private:
-  Platform& _platform;
+  BackendServices& _services;
   // Constant after construction (the sampling factor and display URL: after set-up).
   const std::string _name;
   const SharedDictionary _profile;

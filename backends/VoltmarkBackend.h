@@ -13,9 +13,9 @@ namespace orvanta {
 class VoltmarkBackend final : public OrvantaBackend {
  public:
   using OrvantaBackend::OrvantaBackend;
-  static std::shared_ptr<VoltmarkBackend> create(Platform& platform, std::string name, SharedDictionary profile,
+  static std::shared_ptr<VoltmarkBackend> create(BackendServices& services, std::string name, SharedDictionary profile,
                                                  const BackendSetup& setup) {
-    return std::make_shared<VoltmarkBackend>(platform, std::move(name), std::move(profile), setup);
+    return std::make_shared<VoltmarkBackend>(services, std::move(name), std::move(profile), setup);
   }
 
  protected:

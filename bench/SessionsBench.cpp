@@ -108,7 +108,7 @@ struct GroupCost {
 
 GroupCost costInGroupOf(std::size_t size) {
   platform::setLogLevel(platform::LogLevel::error);
-  test::TestPlatform device;
+  test::TestServices<DaemonServices> device;
   OrvantadAgent agent(device, [](std::int32_t, StorebagFetch&) { return nullptr; });
   std::vector<std::shared_ptr<OrvantadSession>> sessions;
   const auto configure = [](OrvantadSession& session, std::size_t number) {

@@ -79,7 +79,7 @@ struct Encoded {
   std::vector<std::string> singles;  // of one
 };
 
-Encoded benchEncode(test::TestPlatform& device) {
+Encoded benchEncode(test::TestServices<BackendServices>& device) {
   BackendIdentity identity;
   identity.clientType = 5;
   identity.productFamily = "Parva";
@@ -254,7 +254,7 @@ double benchPost(const std::string& body) {
 
 RawLimits benchStages() {
   printHeading("Stages");
-  test::TestPlatform device;
+  test::TestServices<BackendServices> device;
   RawLimits limits;
   limits.decode = benchDecode();
   const auto encoded = benchEncode(device);

@@ -12,10 +12,6 @@ namespace orvanta {
 
 namespace {
 
-struct InternalBuild {
-  bool value = false;
-};
-
 // The longest beginning of `text` that fits `limit` bytes and does not cut a UTF-8 sequence.
 std::string_view cutWhole(std::string_view text, std::size_t limit) {
   if (text.size() <= limit) return text;
@@ -36,11 +32,6 @@ void copyUniqueDeviceID(Platform& platform, DeviceIDBuffer& buffer) {
 
 std::string_view deviceIDText(const DeviceIDBuffer& buffer) {
   return {buffer.data(), ::strnlen(buffer.data(), buffer.size())};
-}
-
-bool isInternalBuild(Platform& platform) {
-  return platform.once<InternalBuild>([&] { return InternalBuild{platform.device().releaseType() == "Internal"}; })
-      .value;
 }
 
 std::string getPersistentIdentifierForCustomClientIDSuffix(Platform& platform, const std::optional<std::string>& first,

@@ -17,9 +17,6 @@ using DeviceIDBuffer = std::array<char, 41>;
 void copyUniqueDeviceID(Platform& platform, DeviceIDBuffer& buffer);
 std::string_view deviceIDText(const DeviceIDBuffer& buffer);
 
-// Whether the device's release type is "Internal". Decided once per platform. Thread-safe.
-bool isInternalBuild(Platform& platform);
-
 // An identifier that stays the same across restarts, per pair of suffix parts (absent counts as empty): made on first
 // request, kept in the user defaults under "uuid:FIRST:SECOND". Never fails; one that cannot be stored is logged.
 std::string getPersistentIdentifierForCustomClientIDSuffix(Platform& platform, const std::optional<std::string>& first,

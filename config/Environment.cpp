@@ -1,6 +1,6 @@
 #include "config/Environment.h"
 
-#include "config/DeviceInfo.h"
+#include "config/ConfigServices.h"
 #include "config/UserDefaultKeys.h"
 #include "interface/OrvantaLogging.h"
 
@@ -10,13 +10,11 @@ namespace {
 
 constexpr std::int64_t kEnvironmentTypeCount = 5;
 
-struct Environment {
-  EnvironmentType type;
-};
+}  // namespace
 
-EnvironmentType userDefaultsEnvironment(Platform& platform) {
+EnvironmentType userDefaultsEnvironment(ConfigServices& services) {
   EnvironmentType type = EnvironmentType::none;
-  if (const auto setting = platform.defaults().value(kEnvironmentTypeKey)) {
+  if (const auto setting = services.platform().defaults().value(kEnvironmentTypeKey)) {
     const std::int64_t number = setting->integerValue();
     if (number >= 0 && number < kEnvironmentTypeCount) {
       type = static_cast<EnvironmentType>(number);
@@ -27,13 +25,11 @@ EnvironmentType userDefaultsEnvironment(Platform& platform) {
       type = EnvironmentType::internal;
     }
   } else {
-    type = isInternalBuild(platform) ? EnvironmentType::internal : EnvironmentType::seed;
+    type = services.isInternalBuild() ? EnvironmentType::internal : EnvironmentType::seed;
   }
   ORVANTA_LOG(info, "userDefaultsEnvironment: Environment type {}", static_cast<std::uint32_t>(type));
   return type;
 }
-
-}  // namespace
 
 const char* environmentSectionName(EnvironmentType type) {
   switch (type) {
@@ -50,9 +46,4 @@ const char* environmentSectionName(EnvironmentType type) {
   }
   return nullptr;
 }
-
-EnvironmentType currentEnvironmentType(Platform& platform) {
-  return platform.once<Environment>([&] { return Environment{userDefaultsEnvironment(platform)}; }).type;
-}
-
 }  // namespace orvanta

@@ -23,11 +23,6 @@ namespace {
 constexpr const char* kVersionWithoutBundle = "8.0";
 constexpr std::size_t kLargestKeyFile = 64U << 10U;  // a 16,384-bit key takes 2 KiB
 
-// Not the object itself, which cannot be moved into the platform's keeping.
-struct OrvantaOfPlatform {
-  std::unique_ptr<Orvanta> orvanta;
-};
-
 std::string readVersion(const std::string& frameworkDirectory) {
   const std::string path = frameworkDirectory + "/framework.plist";
   if (::access(path.c_str(), F_OK) != 0 && errno == ENOENT) return kVersionWithoutBundle;
@@ -65,11 +60,6 @@ Result<std::vector<std::uint8_t>> readKeyFile(const std::string& path) {
 }
 
 }  // namespace
-
-Orvanta& Orvanta::of(Platform& platform) {
-  return *platform.once<OrvantaOfPlatform>([&] { return OrvantaOfPlatform{std::make_unique<Orvanta>(platform)}; })
-              .orvanta;
-}
 
 Orvanta::Orvanta(Platform& platform)
     : _platform(platform), _version(readVersion(platform.files().frameworkDirectory)) {}

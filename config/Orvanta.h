@@ -10,11 +10,10 @@
 namespace orvanta {
 
 // The client framework as installed on the device: its version, its verification key and the persistent identifiers
-// that it hands out. One per platform, made on first use; reads its files then, the key on each request for it until it
-// has one. Thread-safe.
+// that it hands out. Owned by ConfigServices, which makes it on first use; reads its files then, the key on each
+// request for it until it has one. Thread-safe.
 class Orvanta {
  public:
-  static Orvanta& of(Platform& platform);
   explicit Orvanta(Platform& platform);
 
   // framework.plist's "version", or "8.0" when it has none.

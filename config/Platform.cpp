@@ -35,12 +35,14 @@ FileLocations FileLocations::fromEnvironment() {
   return locations;
 }
 
-// Nothing new comes in, then nobody runs any more, then what the once-values hold of the client and the pool (lanes,
-// queues) goes while both are still there.
-Platform::~Platform() {
+void Platform::stop() {
+  if (std::exchange(_stopped, true)) return;
   if (_parts.http) _parts.http->shutdown(std::chrono::milliseconds(0));
   if (_parts.pool) _parts.pool->stop();
-  _onceValues.clear();
+}
+
+Platform::~Platform() {
+  stop();
   _parts.http.reset();
   _parts.pool.reset();
 }

@@ -1,10 +1,7 @@
 #pragma once
 
 #include <memory>
-#include <mutex>
 #include <string>
-#include <typeindex>
-#include <unordered_map>
 
 #include "platform/core/Clock.h"
 #include "platform/host/DeviceProperties.h"
@@ -29,9 +26,9 @@ struct FileLocations {
   static FileLocations fromEnvironment();
 };
 
-// The device as the daemon sees it. main makes the Linux one, tests make one of the parts that they want; everything
-// that is "once per process" is once per Platform. It outlives all that was made from it. The members are constant
-// after construction and each is thread-safe.
+// The device as the daemon sees it. main makes the Linux one, tests make one of the parts that they want. It outlives
+// all that was made from it, the services of the layers (DaemonServices) included. The members are constant after
+// construction and each is thread-safe.
 class Platform {
  public:
   struct Parts {
@@ -46,7 +43,7 @@ class Platform {
   explicit Platform(Parts parts) : _parts(std::move(parts)) {}
   Platform(const Platform&) = delete;
   Platform& operator=(const Platform&) = delete;
-  ~Platform();  // http first, then the pool, then the rest
+  ~Platform();  // stops; then destroys http first, then the pool, then the rest
 
   const FileLocations& files() const { return _parts.files; }
   platform::Clock& clock() const { return *_parts.clock; }
@@ -57,21 +54,15 @@ class Platform {
   platform::PowerLog& powerLog() const { return *_parts.powerLog; }
   platform::KeepAlive& keepAlive() { return _keepAlive; }
 
-  // The one T of this platform, made by `make` on first use; later calls give the same object. `make` runs under a lock
-  // (it may ask for another once-value of the same platform). T lives as long as the platform.
-  template <class T, class Make>
-  T& once(Make make) {
-    const std::lock_guard lock(_onceMutex);
-    auto& slot = _onceValues[std::type_index(typeid(T))];
-    if (!slot) slot = std::make_shared<T>(make());
-    return *static_cast<T*>(slot.get());
-  }
+  // Nothing new comes in, then no job runs any more: afterwards what jobs and completions use can be destroyed, while
+  // the client and the pool are still there for what it holds of them. On the owner's thread; a second call does
+  // nothing.
+  void stop();
 
  private:
   Parts _parts;
   platform::KeepAlive _keepAlive;
-  std::recursive_mutex _onceMutex;
-  std::unordered_map<std::type_index, std::shared_ptr<void>> _onceValues;  // guarded by _onceMutex
+  bool _stopped = false;  // the owner's thread only
 };
 
 }  // namespace orvanta

@@ -8,10 +8,6 @@
 #include <vector>
 
 #include "config/ClientTypes.h"
-#include "config/DeviceInfo.h"
-#include "config/Environment.h"
-#include "config/Orvanta.h"
-#include "config/UserDefaultKeys.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/codec/PropertyList.h"
 
@@ -20,19 +16,9 @@ using platform::HttpResponse;
 
 namespace {
 
-constexpr const char* kInternalServer = "https://internal-bags.kovalt.com/storebags/tamrel";
-constexpr const char* kPublicServer = "https://bags.kovalt.com/bags/tamrel";
 constexpr std::chrono::seconds kRequestTimeout{15};
 constexpr std::int32_t kLongestMaxAge = 86400;
 constexpr std::string_view kNameWithFallback = "confluo";
-
-struct StorebagServer {
-  std::string url;
-};
-
-struct StorebagLane {
-  std::shared_ptr<platform::HttpLane> lane;
-};
 
 std::span<const std::uint8_t> bytesOf(std::string_view text) {
   return {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()};
@@ -70,7 +56,7 @@ std::optional<std::vector<std::uint8_t>> decodedMember(const Dictionary& documen
 }
 
 // The inner bag of a downloaded document, once its signature has been verified; null for anything else.
-SharedDictionary openDocument(Platform& platform, std::string_view body) {
+SharedDictionary openDocument(Orvanta& orvanta, std::string_view body) {
   const platform::BlockingScope blocking;  // a document of megabytes takes a while
   const auto document = platform::parsePropertyList(bytesOf(body));
   if (!document) ORVANTA_LOG(error, "fetchStorebagWithName: propertyListWithData error {}", document.error());
@@ -79,7 +65,7 @@ SharedDictionary openDocument(Platform& platform, std::string_view body) {
     ORVANTA_LOG(error, "fetchStorebagWithName: Signature is missing");
     return nullptr;
   }
-  const auto key = Orvanta::of(platform).publicKey();
+  const auto key = orvanta.publicKey();
   if (!key) return nullptr;
   const auto signature = decodedMember(*content, "signature");
   if (!signature) return nullptr;
@@ -98,16 +84,6 @@ SharedDictionary openDocument(Platform& platform, std::string_view body) {
 
 std::optional<std::string> userDefaultStringForKey(Platform& platform, std::string_view key) {
   return platform.defaults().text(key);
-}
-
-const std::string& storebagServerURL(Platform& platform) {
-  return platform
-      .once<StorebagServer>([&] {
-        auto url = userDefaultStringForKey(platform, kStorebagURLKey);
-        if (!url) url = isInternalBuild(platform) ? kInternalServer : kPublicServer;
-        return StorebagServer{std::move(*url)};
-      })
-      .url;
 }
 
 bool verifyStorebagSignature(const platform::RsaPublicKey& key, std::span<const std::uint8_t> bag,
@@ -133,9 +109,9 @@ std::int32_t maxAgeFromCacheControl(std::optional<std::string_view> cacheControl
   }
 }
 
-SharedDictionary fetchStorebagWithName(Platform& platform, const std::string& name, StorebagFetch& fetch) {
+SharedDictionary fetchStorebagWithName(ConfigServices& services, const std::string& name, StorebagFetch& fetch) {
   platform::HttpRequest request;
-  request.url = storebagServerURL(platform) + "/" + name + "?version=" + Orvanta::of(platform).bundleVersion();
+  request.url = services.storebagServerURL() + "/" + name + "?version=" + services.orvanta().bundleVersion();
   request.timeout = kRequestTimeout;
   const std::string url = request.url;
   ORVANTA_LOG(debug, "fetchStorebagWithName: Storebag Server URL: {}", url);
@@ -143,12 +119,7 @@ SharedDictionary fetchStorebagWithName(Platform& platform, const std::string& na
     ORVANTA_LOG(debug, "fetchStorebagWithName: Adding 'Last-Modified: {}' to the header", *fetch.lastModified);
     request.headers.push_back({"If-Modified-Since", *fetch.lastModified});
   }
-  const auto& lane = platform
-                         .once<StorebagLane>([&] {
-                           return StorebagLane{platform.http().makeLane(platform::HttpClient::LaneKind::unrefused)};
-                         })
-                         .lane;
-  const platform::HttpResult result = platform.http().perform(lane, std::move(request));
+  const platform::HttpResult result = services.platform().http().perform(services.storebagLane(), std::move(request));
   if (!result.response) {
     ORVANTA_LOG(info, "fetchStorebagWithName: Error resolving with lookup server {}, sendSynchronousRequest error {}",
                 url, result.error);
@@ -167,10 +138,10 @@ SharedDictionary fetchStorebagWithName(Platform& platform, const std::string& na
     fetch.lastModified = *stamp;
     ORVANTA_LOG(debug, "fetchStorebagWithName: New 'Last-Modified: {}' received", *stamp);
   }
-  return openDocument(platform, response.body);
+  return openDocument(services.orvanta(), response.body);
 }
 
-SharedDictionary fetchStorebagForEnvironmentAndClientType(Platform& platform, std::int32_t clientType,
+SharedDictionary fetchStorebagForEnvironmentAndClientType(ConfigServices& services, std::int32_t clientType,
                                                           StorebagFetch& fetch) {
   const auto name = storebagNameForClientType(clientType);
   if (!name) {
@@ -178,7 +149,7 @@ SharedDictionary fetchStorebagForEnvironmentAndClientType(Platform& platform, st
                 clientType);
     return nullptr;
   }
-  const SharedDictionary bag = fetchStorebagWithName(platform, std::string(*name), fetch);
+  const SharedDictionary bag = fetchStorebagWithName(services, std::string(*name), fetch);
   if (!bag) {
     if (!fetch.notModified) {
       ORVANTA_LOG(error, "fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type {}",
@@ -190,7 +161,7 @@ SharedDictionary fetchStorebagForEnvironmentAndClientType(Platform& platform, st
     const Value* section = sectionName == nullptr ? nullptr : bag->find(sectionName);
     return section == nullptr ? nullptr : section->dictionary();
   };
-  const EnvironmentType environment = currentEnvironmentType(platform);
+  const EnvironmentType environment = services.currentEnvironmentType();
   const char* sectionName = environmentSectionName(environment);
   const Dictionary* section = sectionNamed(sectionName);
   if (section == nullptr && environment == EnvironmentType::seed) {

@@ -7,7 +7,7 @@
 #include <string>
 #include <string_view>
 
-#include "config/Platform.h"
+#include "config/ConfigServices.h"
 #include "interface/Values.h"
 #include "platform/host/Digest.h"
 
@@ -17,9 +17,6 @@ namespace orvanta {
 
 // The text of a key of the daemon's user defaults; none when it has no value.
 std::optional<std::string> userDefaultStringForKey(Platform& platform, std::string_view key);
-
-// Base URL of the storebag server; the override "orvanta_storebag_url" is read once per platform.
-const std::string& storebagServerURL(Platform& platform);
 
 bool verifyStorebagSignature(const platform::RsaPublicKey& key, std::span<const std::uint8_t> bag,
                              std::span<const std::uint8_t> signature);
@@ -39,11 +36,11 @@ struct StorebagFetch {
 
 // One attempt to get the bag of that name: the inner bag, or null. Blocks for the network, at most 15 seconds. Does not
 // write `version`.
-SharedDictionary fetchStorebagWithName(Platform& platform, const std::string& name, StorebagFetch& fetch);
+SharedDictionary fetchStorebagWithName(ConfigServices& services, const std::string& name, StorebagFetch& fetch);
 
 // The section of the current environment from the bag of that client type: backend name to profile, or null. A client
 // type without a storebag is refused with a log line and no request.
-SharedDictionary fetchStorebagForEnvironmentAndClientType(Platform& platform, std::int32_t clientType,
+SharedDictionary fetchStorebagForEnvironmentAndClientType(ConfigServices& services, std::int32_t clientType,
                                                           StorebagFetch& fetch);
 
 }  // namespace orvanta

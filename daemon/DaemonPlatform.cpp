@@ -37,12 +37,6 @@ std::unique_ptr<Platform> makeDaemonPlatform(FileLocations files) {
   return std::make_unique<Platform>(std::move(parts));
 }
 
-platform::Entitlements& entitlementsOf(Platform& platform) {
-  return *platform.once<std::unique_ptr<platform::Entitlements>>([&platform] {
-    return std::make_unique<platform::Entitlements>(platform.files().configurationDirectory + "/entitlements.d");
-  });
-}
-
 std::map<std::string, std::string> sandboxVariables(const FileLocations& files) {
   std::string caDirectory;
   if (!files.caFile.empty()) {

@@ -5,16 +5,12 @@
 #include <string>
 
 #include "config/Platform.h"
-#include "platform/listen/Entitlements.h"
 #include "platform/sandbox/Sandbox.h"
 
 namespace orvanta {
 
 // The Linux device that orvantad runs on. Starts no thread but the HTTP client's; the pool is started by main.
 std::unique_ptr<Platform> makeDaemonPlatform(FileLocations files);
-
-// Who may connect: entitlements.d of the configuration directory, one object per platform.
-platform::Entitlements& entitlementsOf(Platform& platform);
 
 // What the sandbox profile's ${NAME} places stand for.
 std::map<std::string, std::string> sandboxVariables(const FileLocations& files);

@@ -2,8 +2,6 @@
 
 #include <chrono>
 
-#include "backends/https/PendingPosts.h"
-#include "backends/upload/UploadBudget.h"
 #include "interface/OrvantaLogging.h"
 
 namespace orvanta {
@@ -11,10 +9,10 @@ namespace orvanta {
 namespace {
 
 // Calls that wait for a server or for memory get their errors, now and from now on.
-void endWaiting(Platform& platform) {
-  platform.http().abortBlockingRequests();
-  UploadBudget::of(platform).close();
-  PendingPosts::of(platform)->stopWaiting();
+void endWaiting(DaemonServices& services) {
+  services.platform.http().abortBlockingRequests();
+  services.backends.uploadBudget.close();
+  services.backends.pendingPosts->stopWaiting();
 }
 
 void finishDeliveries(Platform& platform) {
@@ -27,12 +25,12 @@ void finishDeliveries(Platform& platform) {
 
 }  // namespace
 
-bool endService(platform::Listener& listener, Platform& platform, OrvantadAgent& agent) {
+bool endService(platform::Listener& listener, DaemonServices& services, OrvantadAgent& agent) {
   const bool admissionStopped = listener.stop();
   if (!admissionStopped) ORVANTA_LOG(error, "main: A connection is still being admitted and is left behind");
-  endWaiting(platform);
+  endWaiting(services);
   const bool sessionsEnded = agent.sessions().endAll();
-  finishDeliveries(platform);
+  finishDeliveries(services.platform);
   agent.sessions().waitForClients();
   return admissionStopped && sessionsEnded;
 }

@@ -1,6 +1,5 @@
 #include "daemon/OrvantadAgent.h"
 
-#include "daemon/DaemonPlatform.h"
 #include "daemon/SessionConnection.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
@@ -12,20 +11,17 @@ namespace {
 constexpr std::size_t kLargeGroup = 64;
 }  // namespace
 
-OrvantadAgent::OrvantadAgent(Platform& platform)
-    : OrvantadAgent(platform, [&platform](std::int32_t clientType, StorebagFetch& fetch) {
-        return fetchStorebagForEnvironmentAndClientType(platform, clientType, fetch);
+OrvantadAgent::OrvantadAgent(DaemonServices& services)
+    : OrvantadAgent(services, [&services](std::int32_t clientType, StorebagFetch& fetch) {
+        return fetchStorebagForEnvironmentAndClientType(services.config(), clientType, fetch);
       }) {}
 
-OrvantadAgent::OrvantadAgent(Platform& platform, StorebagCache::Fetch fetch)
-    : _platform(platform),
-      _entitlements(entitlementsOf(platform)),
-      _sessionList(platform),
-      _storebags(platform.clock(), std::move(fetch)) {}
+OrvantadAgent::OrvantadAgent(DaemonServices& services, StorebagCache::Fetch fetch)
+    : _services(services), _sessionList(services.platform), _storebags(services.platform.clock(), std::move(fetch)) {}
 
 bool OrvantadAgent::listenerShouldAcceptNewConnection(platform::OfferedConnection&& offered) {
   const auto& connection = offered.connection;
-  if (!_entitlements.holds(offered.peer, kOrvantaEntitlement)) {
+  if (!_services.entitlements.holds(offered.peer, kOrvantaEntitlement)) {
     ORVANTA_LOG(debug,
                 "listener: new Vyx connection {} does not have required orvanta entitlement. Closing connection...",
                 connection->description());
@@ -33,7 +29,7 @@ bool OrvantadAgent::listenerShouldAcceptNewConnection(platform::OfferedConnectio
   }
   ORVANTA_LOG(debug, "listener: Accepting new Vyx connection {} as it has proper entitlement, {}({}) connections.",
               connection->description(), _sessionList.openCount(), _tokenCount.load(std::memory_order_relaxed));
-  const auto session = OrvantadSession::create(_platform, *this, connection);
+  const auto session = OrvantadSession::create(_services, *this, connection);
   const auto handler = std::make_shared<SessionConnection>(*this, session, connection);
   if (!_sessionList.admit(*session, handler)) {
     session->end();

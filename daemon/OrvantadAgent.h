@@ -4,13 +4,12 @@
 #include <cstddef>
 #include <memory>
 
-#include "config/Platform.h"
 #include "daemon/SessionList.h"
 #include "daemon/SessionRegistry.h"
 #include "daemon/StorebagCache.h"
 #include "interface/Values.h"
-#include "platform/listen/Entitlements.h"
 #include "platform/listen/Listener.h"
+#include "session/DaemonServices.h"
 #include "session/OrvantadSession.h"
 #include "session/OrvantadSessionDelegate.h"
 
@@ -24,9 +23,9 @@ namespace orvanta {
 // A peer that may not connect is refused with a log line.
 class OrvantadAgent final : public OrvantadSessionDelegate {
  public:
-  explicit OrvantadAgent(Platform& platform);
+  explicit OrvantadAgent(DaemonServices& services);
   // `fetch` stands for the storebag server.
-  OrvantadAgent(Platform& platform, StorebagCache::Fetch fetch);
+  OrvantadAgent(DaemonServices& services, StorebagCache::Fetch fetch);
 
   // The listener's handler: returns whether the peer was admitted. Only peers that hold the entitlement are.
   bool listenerShouldAcceptNewConnection(platform::OfferedConnection&& offered);
@@ -48,8 +47,7 @@ class OrvantadAgent final : public OrvantadSessionDelegate {
       REQUIRES(_lock);
 
  private:
-  Platform& _platform;
-  platform::Entitlements& _entitlements;
+  DaemonServices& _services;
 
   SessionList _sessionList;
   std::atomic<std::size_t> _tokenCount{0};  // the registry's; admission reads it without the lock

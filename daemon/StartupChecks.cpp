@@ -1,8 +1,6 @@
 #include "daemon/StartupChecks.h"
 
-#include "config/Orvanta.h"
 #include "config/UserDefaultKeys.h"
-#include "daemon/DaemonPlatform.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/core/NearestWord.h"
@@ -27,7 +25,8 @@ void warnOfUnknownUserDefaults(Platform& platform) {
 
 }  // namespace
 
-void warnOfUselessConfiguration(Platform& platform) {
+void warnOfUselessConfiguration(DaemonServices& services) {
+  Platform& platform = services.platform;
   // Whoever reads a file logs the keys in it that nothing reads: the device and the framework read theirs here.
   platform.device().productVersion();
   warnOfUnknownUserDefaults(platform);
@@ -35,11 +34,11 @@ void warnOfUselessConfiguration(Platform& platform) {
     ORVANTA_LOG(warning, "main: The device has no \"DeviceName\" in {}/device.plist, no session will report by https",
                 platform.files().configurationDirectory);
   }
-  if (const auto key = Orvanta::of(platform).readPublicKey(); !key) {
+  if (const auto key = services.config().orvanta().readPublicKey(); !key) {
     ORVANTA_LOG(warning, "main: The framework bundle has no usable verification key, no storebag will be accepted: {}",
                 key.error());
   }
-  if (!entitlementsOf(platform).isHeldByAnybody(kOrvantaEntitlement)) {
+  if (!services.entitlements.isHeldByAnybody(kOrvantaEntitlement)) {
     ORVANTA_LOG(warning,
                 "main: The entitlement {} is granted to nobody in {}/entitlements.d, no client will be admitted",
                 kOrvantaEntitlement, platform.files().configurationDirectory);

@@ -1,12 +1,12 @@
 #pragma once
 
-#include "config/Platform.h"
+#include "session/DaemonServices.h"
 
 namespace orvanta {
 
 // Warns of what in the configuration keeps the daemon from being of use, or is not read at all: a framework bundle
 // without a usable verification key, an entitlement that nobody holds, keys that mean nothing. For main, once: what is
 // noticed later, where it is used, is often noticed too late.
-void warnOfUselessConfiguration(Platform& platform);
+void warnOfUselessConfiguration(DaemonServices& services);
 
 }  // namespace orvanta

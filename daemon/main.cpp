@@ -34,13 +34,14 @@ int main() {
   }
   if (!closeDaemonSandbox(*sandbox)) return -1;
   const auto device = makeDaemonPlatform(files);
-  OrvantadAgent agent(*device);
+  DaemonServices services(*device);
+  OrvantadAgent agent(services);
   auto listener = platform::Listener::create(device->pool(), std::move(*socket),
                                              {kDaemonConnectionLimits, kMaximumConnectionsPerUser},
                                              [&agent](platform::OfferedConnection&& offered) {
                                                return agent.listenerShouldAcceptNewConnection(std::move(offered));
                                              });
-  warnOfUselessConfiguration(*device);
+  warnOfUselessConfiguration(services);
   device->pool().start();
   listener->resume();
   platform::KeepAlive::ready();
@@ -50,7 +51,7 @@ int main() {
   const int signal = platform::waitForTermination();
   ORVANTA_LOG(info, "main: Ending on signal {}", signal);
   platform::KeepAlive::stopping();
-  if (!endService(*listener, *device, agent)) std::_Exit(0);
+  if (!endService(*listener, services, agent)) std::_Exit(0);
   listener.reset();
   device->pool().stop();
   sandbox.reset();  // its watcher logs, too

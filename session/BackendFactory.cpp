@@ -12,9 +12,9 @@ namespace orvanta {
 namespace {
 
 template <class Backend>
-std::shared_ptr<OrvantaBackend> create(Platform& platform, const std::string& name, const SharedDictionary& profile,
-                                       const BackendSetup& setup) {
-  return Backend::create(platform, name, profile, setup);
+std::shared_ptr<OrvantaBackend> create(BackendServices& services, const std::string& name,
+                                       const SharedDictionary& profile, const BackendSetup& setup) {
+  return Backend::create(services, name, profile, setup);
 }
 
 // Desktop devices have no diagnostics adaptor.
@@ -25,7 +25,7 @@ bool supportsBrisk(Platform& platform) {
 struct BackendClass {
   std::string_view name;
   // Null where the device does not support the class.
-  std::shared_ptr<OrvantaBackend> (*create)(Platform& platform, const std::string& name,
+  std::shared_ptr<OrvantaBackend> (*create)(BackendServices& services, const std::string& name,
                                             const SharedDictionary& profile, const BackendSetup& setup);
   bool (*isSupported)(Platform& platform) = nullptr;  // null: everywhere
 };
@@ -38,12 +38,12 @@ constexpr BackendClass kBackendClasses[] = {
 
 }  // namespace
 
-std::shared_ptr<OrvantaBackend> newBackendWithName(Platform& platform, const std::string& name,
+std::shared_ptr<OrvantaBackend> newBackendWithName(BackendServices& services, const std::string& name,
                                                    const SharedDictionary& profile, const BackendSetup& setup) {
   for (const BackendClass& row : kBackendClasses) {
     if (row.name != name) continue;
-    if (row.isSupported != nullptr && !row.isSupported(platform)) break;
-    if (auto backend = row.create(platform, name, profile, setup)) return backend;
+    if (row.isSupported != nullptr && !row.isSupported(services.platform())) break;
+    if (auto backend = row.create(services, name, profile, setup)) return backend;
     break;
   }
   ORVANTA_LOG(error, "OrvantaBackend(newBackendWithName): {}", name);

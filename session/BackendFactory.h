@@ -10,7 +10,7 @@ namespace orvanta {
 
 // Makes the backend of that name, or null: the name is unknown (logged), the profile lacks something (logged by the
 // class) or the device does not support it.
-std::shared_ptr<OrvantaBackend> newBackendWithName(Platform& platform, const std::string& name,
+std::shared_ptr<OrvantaBackend> newBackendWithName(BackendServices& services, const std::string& name,
                                                    const SharedDictionary& profile, const BackendSetup& setup);
 
 }  // namespace orvanta

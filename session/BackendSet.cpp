@@ -1,6 +1,5 @@
 #include "session/BackendSet.h"
 
-#include "config/Orvanta.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
 #include "session/BackendFactory.h"
@@ -8,7 +7,7 @@
 
 namespace orvanta {
 
-std::optional<BackendSet> createBackends(Platform& platform, const SharedDictionary& storebag,
+std::optional<BackendSet> createBackends(DaemonServices& services, const SharedDictionary& storebag,
                                          const SharedDictionary& sessionInfo, const SharedDictionary& userInfo,
                                          const DeviceIDBuffer& deviceID) {
   if (!storebag) {
@@ -21,11 +20,11 @@ std::optional<BackendSet> createBackends(Platform& platform, const SharedDiction
   }
 
   const SessionInfoRecord info = SessionInfoRecord::read(*sessionInfo);
-  const auto& device = platform.device();
+  const auto& device = services.platform.device();
 
   BackendSetup setup;
   BackendIdentity& identity = setup.identity;
-  identity.startTimestamp = platform.clock().timeOfDay();
+  identity.startTimestamp = services.platform.clock().timeOfDay();
   identity.sessionID = info.sessionID;
   identity.clientType = info.clientType;
   identity.clientVersion = info.clientVersion;
@@ -34,9 +33,9 @@ std::optional<BackendSet> createBackends(Platform& platform, const SharedDiction
   identity.productVersion = device.productVersion();
   identity.buildVersion = device.buildVersion();
   identity.productType = device.productType();
-  identity.isInternal = isInternalBuild(platform);
+  identity.isInternal = services.config().isInternalBuild();
   identity.requireUserInfo = info.requireUserInfo;
-  identity.selfVersion = SelfVersion::parse(Orvanta::of(platform).bundleVersion());
+  identity.selfVersion = SelfVersion::parse(services.config().orvanta().bundleVersion());
   setup.batchEvents = info.batchEvent;
   setup.userInfo = userInfo;
 
@@ -44,7 +43,7 @@ std::optional<BackendSet> createBackends(Platform& platform, const SharedDiction
   for (const auto& [key, value] : *storebag) {
     // The profile stays inside the storebag, which lives as long as any backend made from it.
     const SharedDictionary profile(storebag, value.dictionary());
-    auto backend = newBackendWithName(platform, key, profile, setup);
+    auto backend = newBackendWithName(services.backends, key, profile, setup);
     if (backend) backends.add(key, std::move(backend));
   }
   return backends;

@@ -8,6 +8,7 @@
 
 #include "backends/OrvantaBackend.h"
 #include "config/DeviceInfo.h"
+#include "session/DaemonServices.h"
 
 namespace orvanta {
 
@@ -37,7 +38,7 @@ class BackendSet {
 
 // Makes a backend of each entry of the storebag and fills it with the session's and the device's facts. None, with a
 // log line, without a storebag or session info; entries that yield no backend are skipped. On the session's queue.
-std::optional<BackendSet> createBackends(Platform& platform, const SharedDictionary& storebag,
+std::optional<BackendSet> createBackends(DaemonServices& services, const SharedDictionary& storebag,
                                          const SharedDictionary& sessionInfo, const SharedDictionary& userInfo,
                                          const DeviceIDBuffer& deviceID);
 

@@ -7,16 +7,9 @@
 
 namespace orvanta {
 
-namespace {
-// Shared with the requests, since the last completions may run when the platform is already going.
-struct FlushLock {
-  std::shared_ptr<std::mutex> mutex = std::make_shared<std::mutex>();
-};
-}  // namespace
-
-FlushRequest::FlushRequest(Platform& platform, std::int32_t backendCount, FlushReply completion)
-    : _platform(platform),
-      _lock(platform.once<FlushLock>([] { return FlushLock{}; }).mutex),
+FlushRequest::FlushRequest(DaemonServices& services, std::int32_t backendCount, FlushReply completion)
+    : _platform(services.platform),
+      _lock(services.flushLock),
       _pending(backendCount),
       _completion(std::move(completion)) {}
 

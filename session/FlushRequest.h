@@ -8,6 +8,7 @@
 
 #include "backends/OrvantaBackend.h"
 #include "interface/ClientSessionInterface.h"
+#include "session/DaemonServices.h"
 
 namespace orvanta {
 
@@ -18,7 +19,7 @@ namespace orvanta {
 // Shared by the completions of the backends, which may run on any thread. Keeps no session alive.
 class FlushRequest : public std::enable_shared_from_this<FlushRequest> {
  public:
-  FlushRequest(Platform& platform, std::int32_t backendCount, FlushReply completion);
+  FlushRequest(DaemonServices& services, std::int32_t backendCount, FlushReply completion);
 
   // The completion for one backend; `key` is its name in the session's set.
   FlushCompletion completionFor(std::string key, std::string backendName);
@@ -28,7 +29,7 @@ class FlushRequest : public std::enable_shared_from_this<FlushRequest> {
                 std::optional<OrvantaError> error);
 
   Platform& _platform;
-  const std::shared_ptr<std::mutex> _lock;  // one for all flushes of the platform
+  const std::shared_ptr<std::mutex> _lock;  // DaemonServices::flushLock
   std::int32_t _pending;                    // guarded by _lock
   FlushReply _completion;                   // guarded by _lock; empty once called
 };

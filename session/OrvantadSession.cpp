@@ -8,14 +8,15 @@
 
 namespace orvanta {
 
-std::shared_ptr<OrvantadSession> OrvantadSession::create(Platform& platform, OrvantadSessionDelegate& delegate,
+std::shared_ptr<OrvantadSession> OrvantadSession::create(DaemonServices& services, OrvantadSessionDelegate& delegate,
                                                          std::shared_ptr<platform::Connection> connection) {
-  return std::shared_ptr<OrvantadSession>(new OrvantadSession(platform, delegate, std::move(connection)));
+  return std::shared_ptr<OrvantadSession>(new OrvantadSession(services, delegate, std::move(connection)));
 }
 
-OrvantadSession::OrvantadSession(Platform& platform, OrvantadSessionDelegate& delegate,
+OrvantadSession::OrvantadSession(DaemonServices& services, OrvantadSessionDelegate& delegate,
                                  std::shared_ptr<platform::Connection> connection)
-    : _platform(platform),
+    : _services(services),
+      _platform(services.platform),
       _delegate(delegate),
       _connection(std::move(connection)),
       _client(_connection ? std::make_unique<ClientReplyProxy>(_connection->outbox()) : nullptr) {

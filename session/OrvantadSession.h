@@ -10,11 +10,11 @@
 
 #include "backends/Event.h"
 #include "config/DeviceInfo.h"
-#include "config/Platform.h"
 #include "interface/ClientSessionInterface.h"
 #include "platform/ipc/Connection.h"
 #include "session/BackendSet.h"
 #include "session/ClientReplyProxy.h"
+#include "session/DaemonServices.h"
 #include "session/OrvantadSessionDelegate.h"
 #include "session/SessionInfoRecord.h"
 
@@ -29,7 +29,7 @@ namespace orvanta {
 class OrvantadSession final : public ClientSessionInterface, public std::enable_shared_from_this<OrvantadSession> {
  public:
   // `connection` may be null for a session without a client (tests): nothing is then handed back to one.
-  static std::shared_ptr<OrvantadSession> create(Platform& platform, OrvantadSessionDelegate& delegate,
+  static std::shared_ptr<OrvantadSession> create(DaemonServices& services, OrvantadSessionDelegate& delegate,
                                                  std::shared_ptr<platform::Connection> connection);
   ~OrvantadSession() override;
 
@@ -83,7 +83,7 @@ class OrvantadSession final : public ClientSessionInterface, public std::enable_
   const std::shared_ptr<platform::Connection>& connection() const { return _connection; }
 
  private:
-  OrvantadSession(Platform& platform, OrvantadSessionDelegate& delegate,
+  OrvantadSession(DaemonServices& services, OrvantadSessionDelegate& delegate,
                   std::shared_ptr<platform::Connection> connection);
 
   // Setup.
@@ -104,7 +104,7 @@ class OrvantadSession final : public ClientSessionInterface, public std::enable_
   std::optional<std::string> dispatch(Event event);
   std::optional<std::string> send(std::uint16_t category, std::uint16_t type, SharedDictionary payload);
   void internalSendMessage(SharedDictionary payload, std::uint16_t method, std::uint16_t respCode);
-  static void sendSingleMessage(Platform& platform, const SharedDictionary& sessionInfo,
+  static void sendSingleMessage(DaemonServices& services, const SharedDictionary& sessionInfo,
                                 const SharedDictionary& userInfo, const SharedDictionary& storebag, Event event);
 
   // Aggregation and flushing.
@@ -113,6 +113,7 @@ class OrvantadSession final : public ClientSessionInterface, public std::enable_
   void internalFlushMessagesWithCompletion(FlushReply completion);
 
   // Constant after construction.
+  DaemonServices& _services;
   Platform& _platform;
   OrvantadSessionDelegate& _delegate;
   const std::shared_ptr<platform::Connection> _connection;

@@ -60,7 +60,7 @@ void OrvantadSession::internalFlushMessagesWithCompletion(FlushReply completion)
     return;
   }
   const auto request =
-      std::make_shared<FlushRequest>(_platform, static_cast<std::int32_t>(_backends->size()), std::move(completion));
+      std::make_shared<FlushRequest>(_services, static_cast<std::int32_t>(_backends->size()), std::move(completion));
   for (const auto& [key, backend] : *_backends) {
     backend->flushMessagesWithCompletion(request->completionFor(key, backend->name()));
   }

@@ -121,12 +121,12 @@ void OrvantadSession::sendMessageWithSessionInfo(SharedDictionary sessionInfo, S
     reply("storebag not available");
     return;
   }
-  sendSingleMessage(_platform, sessionInfo, userInfo, storebag,
+  sendSingleMessage(_services, sessionInfo, userInfo, storebag,
                     {.payload = std::move(payload), .category = category, .type = type});
   reply("finished");
 }
 
-void OrvantadSession::sendSingleMessage(Platform& platform, const SharedDictionary& sessionInfo,
+void OrvantadSession::sendSingleMessage(DaemonServices& services, const SharedDictionary& sessionInfo,
                                         const SharedDictionary& userInfo, const SharedDictionary& storebag,
                                         Event event) {
   const Value* sessionID = sessionInfo ? sessionInfo->find(kOrvantaSessionInfoSessionID) : nullptr;
@@ -137,8 +137,8 @@ void OrvantadSession::sendSingleMessage(Platform& platform, const SharedDictiona
     return;
   }
   DeviceIDBuffer deviceID{};
-  copyUniqueDeviceID(platform, deviceID);
-  const auto backends = createBackends(platform, storebag, sessionInfo, userInfo, deviceID);
+  copyUniqueDeviceID(services.platform, deviceID);
+  const auto backends = createBackends(services, storebag, sessionInfo, userInfo, deviceID);
   if (!backends) {
     ORVANTA_LOG(error, "sendMessageWithSessionInfo: No backends available to send single message");
     return;
@@ -146,13 +146,13 @@ void OrvantadSession::sendSingleMessage(Platform& platform, const SharedDictiona
   if (userInfo && !SessionInfoRecord::read(*sessionInfo).requireUserInfo) {
     ORVANTA_LOG(warning, "sendMessageWithSessionInfo: user info provided without requiring it.");
   }
-  event.time = platform.clock().timeOfDay();
+  event.time = services.platform.clock().timeOfDay();
   for (const auto& [key, backend] : *backends) {
     backend->updateState();
     if (!admits(*backend, event.category, "sendMessageWithSessionInfo")) continue;
     const auto result = backend->sendMessage(event);
     if (result)
-      writeToLogFile(platform, fmt::format("[{} -> sendMessageWithSessionInfo] {}", backend->name(), *result));
+      writeToLogFile(services.platform, fmt::format("[{} -> sendMessageWithSessionInfo] {}", backend->name(), *result));
   }
   for (const auto& [key, backend] : *backends) backend->cleanup();
 }

@@ -1,6 +1,5 @@
 #include <fmt/format.h>
 
-#include "config/Orvanta.h"
 #include "interface/OrvantaLogging.h"
 #include "session/OrvantadSession.h"
 
@@ -69,7 +68,7 @@ void OrvantadSession::startConfigWithCompletionHandler(BackendNamesReply complet
 
 void OrvantadSession::createBackendsWithStorebag(const SharedDictionary& storebag) {
   ORVANTA_LOG(debug, "createBackendsWithStorebag: Creating backends for session {}", _sessionID);
-  auto backends = createBackends(_platform, storebag, _sessionInfo, _userInfo, _deviceid);
+  auto backends = createBackends(_services, storebag, _sessionInfo, _userInfo, _deviceid);
   if (backends) {
     for (const auto& [key, backend] : *backends) backend->setCombinedSessionIDString(_sessionIDString);
   }
@@ -91,13 +90,13 @@ void OrvantadSession::sendStartMessage() {
   const auto& device = _platform.device();
   const auto known = [](std::optional<std::string> fact) { return Value(std::move(fact).value_or("Unknown")); };
   auto payload = std::make_shared<Dictionary>();
-  if (isInternalBuild(_platform)) {
+  if (_services.config().isInternalBuild()) {
     payload->set("SerialNum", known(device.serialNumber()));
     payload->set("Version", known(device.productVersion()));
     payload->set("Build", known(device.buildVersion()));
     payload->set("Hardware", known(device.hardwareModel()));
     payload->set("Product", known(device.deviceName()));
-    payload->set("ReportVers", Orvanta::of(_platform).bundleVersion());
+    payload->set("ReportVers", _services.config().orvanta().bundleVersion());
   }
   payload->set("Locale", known(device.countryCode()));
   payload->set("AutomaticTimeSet", device.automaticTimeZone().value_or(true));

@@ -13,11 +13,9 @@ namespace {
 constexpr const char* kBundle = "/Tamberline.bundle/Bundles/HQXPerformance.bundle";
 
 // The plug-in's class; null, with the reason in the log, when there is none to be had.
-const OrvantaPluginClass* findAdaptorClass(Platform& platform) {
-  const std::string directory = platform.files().plugInsDirectory + kBundle;
-  const platform::LoadedBundle* loaded =
-      platform.once<std::unique_ptr<platform::BundleLoader>>([] { return std::make_unique<platform::BundleLoader>(); })
-          ->load(directory);
+const OrvantaPluginClass* findAdaptorClass(BackendServices& services) {
+  const std::string directory = services.platform().files().plugInsDirectory + kBundle;
+  const platform::LoadedBundle* loaded = services.plugIns.load(directory);
   if (loaded == nullptr) return nullptr;
   const auto* bundle = static_cast<const OrvantaPluginBundle*>(loaded->symbol(ORVANTA_PLUGIN_SYMBOL));
   if (bundle == nullptr) {
@@ -45,9 +43,9 @@ OrvantaPluginOperation findForwardingOperation(const OrvantaPluginClass& adaptor
 
 }  // namespace
 
-std::unique_ptr<BriskAdaptor> BriskAdaptor::create(Platform& platform) {
+std::unique_ptr<BriskAdaptor> BriskAdaptor::create(BackendServices& services) {
   const platform::BlockingScope blocking;  // what a plug-in does takes as long as it likes, here and below
-  const OrvantaPluginClass* adaptorClass = findAdaptorClass(platform);
+  const OrvantaPluginClass* adaptorClass = findAdaptorClass(services);
   if (adaptorClass == nullptr) return nullptr;
   void* const instance = adaptorClass->create();
   if (instance == nullptr) {

@@ -4,8 +4,8 @@
 #include <memory>
 #include <string>
 
+#include "backends/BackendServices.h"
 #include "backends/Event.h"
-#include "config/Platform.h"
 #include "interface/PluginBundle.h"
 
 namespace orvanta {
@@ -18,7 +18,7 @@ class BriskAdaptor {
   static constexpr const char* kForwardingOperation = "sendMessageWithMethod:respCode:dict:";
 
   // Null when there is no bundle of this ABI version, no class in it, or no instance of it; the log says which.
-  static std::unique_ptr<BriskAdaptor> create(Platform& platform);
+  static std::unique_ptr<BriskAdaptor> create(BackendServices& services);
   BriskAdaptor(const OrvantaPluginClass& adaptorClass, void* instance);
   ~BriskAdaptor();
   BriskAdaptor(const BriskAdaptor&) = delete;

@@ -7,22 +7,22 @@
 
 namespace orvanta {
 
-std::shared_ptr<BriskBackend> BriskBackend::create(Platform& platform, std::string name, SharedDictionary profile,
-                                                   const BackendSetup& setup) {
+std::shared_ptr<BriskBackend> BriskBackend::create(BackendServices& services, std::string name,
+                                                   SharedDictionary profile, const BackendSetup& setup) {
   const std::int32_t clientType = setup.identity.clientType;
-  auto backend = std::make_shared<BriskBackend>(Made{}, platform, std::move(name), std::move(profile), setup);
+  auto backend = std::make_shared<BriskBackend>(Made{}, services, std::move(name), std::move(profile), setup);
   ORVANTA_LOG(info, "BriskBackend(initWithName): Loading Brisk adaptor class for client type {}", clientType);
   if (!isClientTypeAllowed(clientType)) {
     ORVANTA_LOG(error, "BriskBackend(initWithName): No matching bundle found for client type {}", clientType);
     return nullptr;
   }
-  backend->_briskAdaptor = BriskAdaptor::create(platform);
+  backend->_briskAdaptor = BriskAdaptor::create(services);
   return backend;
 }
 
-BriskBackend::BriskBackend(Made, Platform& platform, std::string name, SharedDictionary profile,
+BriskBackend::BriskBackend(Made, BackendServices& services, std::string name, SharedDictionary profile,
                            const BackendSetup& setup)
-    : OrvantaBackend(platform, std::move(name), std::move(profile), setup) {}
+    : OrvantaBackend(services, std::move(name), std::move(profile), setup) {}
 
 bool BriskBackend::isClientTypeAllowed(std::int32_t clientType) {
   return clientType == kClientTypeXF || clientType == kClientTypeZJ || clientType == kClientTypeZEPHQ;

@@ -16,9 +16,9 @@ class BriskBackend final : public OrvantaBackend {
 
  public:
   // Null, with a log line, for client types that have no adaptor.
-  static std::shared_ptr<BriskBackend> create(Platform& platform, std::string name, SharedDictionary profile,
+  static std::shared_ptr<BriskBackend> create(BackendServices& services, std::string name, SharedDictionary profile,
                                               const BackendSetup& setup);
-  BriskBackend(Made, Platform& platform, std::string name, SharedDictionary profile, const BackendSetup& setup);
+  BriskBackend(Made, BackendServices& services, std::string name, SharedDictionary profile, const BackendSetup& setup);
 
   static bool isClientTypeAllowed(std::int32_t clientType);
 

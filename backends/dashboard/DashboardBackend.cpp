@@ -2,8 +2,6 @@
 
 #include <algorithm>
 #include <array>
-#include <condition_variable>
-#include <mutex>
 #include <new>
 #include <span>
 #include <utility>
@@ -52,51 +50,26 @@ Result<std::vector<std::uint8_t>> archive(const SharedArray& logData) {
 
 }  // namespace
 
-// Counts the datagrams handed to network queues and not yet sent. One per platform. Thread-safe.
-class DashboardBackend::HandOver {
- public:
-  static HandOver& of(Platform& platform) {
-    return *platform.once<std::unique_ptr<HandOver>>([] { return std::make_unique<HandOver>(); });
-  }
-  void begin() {
-    const std::lock_guard lock(_mutex);
-    ++_pending;
-  }
-  void end() {
-    const std::lock_guard lock(_mutex);
-    if (--_pending == 0) _none.notify_all();
-  }
-  bool waitForNone(milliseconds patience) {
-    std::unique_lock lock(_mutex);
-    return _none.wait_for(lock, patience, [this] { return _pending == 0; });
-  }
-
- private:
-  std::mutex _mutex;
-  std::condition_variable _none;
-  std::size_t _pending = 0;  // guarded by _mutex
-};
-
 // --- Set-up ---
 
-std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, std::string name,
+std::shared_ptr<DashboardBackend> DashboardBackend::create(BackendServices& services, std::string name,
                                                            SharedDictionary profile, const BackendSetup& setup) {
   const Value* ip = valueAt(profile, "ip");
   const Value* port = valueAt(profile, "port");
   std::optional<std::string> serverIP;
   if (ip != nullptr) serverIP = ip->description();
-  return create(platform, std::move(name), std::move(profile), std::move(serverIP),
+  return create(services, std::move(name), std::move(profile), std::move(serverIP),
                 port == nullptr ? std::uint16_t{0} : portOf(*port), setup);
 }
 
-std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, std::string name,
+std::shared_ptr<DashboardBackend> DashboardBackend::create(BackendServices& services, std::string name,
                                                            std::optional<std::string> serverIP,
                                                            std::uint16_t serverPort, const BackendSetup& setup) {
   if (!serverIP) return nullptr;
-  return create(platform, std::move(name), nullptr, std::move(serverIP), serverPort, setup);
+  return create(services, std::move(name), nullptr, std::move(serverIP), serverPort, setup);
 }
 
-std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, std::string name,
+std::shared_ptr<DashboardBackend> DashboardBackend::create(BackendServices& services, std::string name,
                                                            SharedDictionary profile,
                                                            std::optional<std::string> serverIP,
                                                            std::uint16_t serverPort, const BackendSetup& setup) {
@@ -119,17 +92,16 @@ std::shared_ptr<DashboardBackend> DashboardBackend::create(Platform& platform, s
     ORVANTA_LOG(error, "DashboardBackend(initWithName): socket() failed ({})", error);
     return nullptr;
   }
-  auto backend = std::make_shared<DashboardBackend>(Made{}, platform, std::move(name), std::move(profile), setup,
+  auto backend = std::make_shared<DashboardBackend>(Made{}, services, std::move(name), std::move(profile), setup,
                                                     std::move(socket));
   if (!backend->setUp(serverIP, serverPort)) return nullptr;
   return backend;
 }
 
-DashboardBackend::DashboardBackend(Made, Platform& platform, std::string name, SharedDictionary profile,
+DashboardBackend::DashboardBackend(Made, BackendServices& services, std::string name, SharedDictionary profile,
                                    const BackendSetup& setup, platform::UdpSocket socket)
-    : OrvantaBackend(platform, std::move(name), std::move(profile), setup),
-      _handOver(HandOver::of(platform)),
-      _networkProcQueue(platform.pool().makeQueue()),
+    : OrvantaBackend(services, std::move(name), std::move(profile), setup),
+      _networkProcQueue(services.platform().pool().makeQueue()),
       _socket(std::move(socket)) {}
 
 // Nothing is armed any more, since what is armed holds the backend.
@@ -209,10 +181,10 @@ std::optional<std::string> DashboardBackend::sendNumbered(const Event& event) {
     return std::nullopt;
   }
   std::optional<std::string> line = writeLocalLog(datagram);
-  _handOver.begin();
+  services().pendingDatagrams.begin();
   _networkProcQueue->post([self = self(), datagram = std::move(datagram), number = event.number]() mutable {
     self->tryToSendMsg(std::move(datagram), number);
-    self->_handOver.end();
+    self->services().pendingDatagrams.end();
   });
   return line;
 }
@@ -258,10 +230,6 @@ void DashboardBackend::cleanup() {
       self->_cleanupState = CleanupState::requested;
     }
   });
-}
-
-bool DashboardBackend::waitUntilSent(Platform& platform, milliseconds patience) {
-  return HandOver::of(platform).waitForNone(patience);
 }
 
 // --- On the network queue ---

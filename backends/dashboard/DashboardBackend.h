@@ -29,14 +29,14 @@ class DashboardBackend final : public OrvantaBackend {
 
  public:
   // With a profile: its "ip" and "port" name the server. Null when something is missing or fails, with a log line.
-  static std::shared_ptr<DashboardBackend> create(Platform& platform, std::string name, SharedDictionary profile,
+  static std::shared_ptr<DashboardBackend> create(BackendServices& services, std::string name, SharedDictionary profile,
                                                   const BackendSetup& setup);
   // Without one; delivery is then acknowledged.
-  static std::shared_ptr<DashboardBackend> create(Platform& platform, std::string name,
+  static std::shared_ptr<DashboardBackend> create(BackendServices& services, std::string name,
                                                   std::optional<std::string> serverIP, std::uint16_t serverPort,
                                                   const BackendSetup& setup);
-  DashboardBackend(Made, Platform& platform, std::string name, SharedDictionary profile, const BackendSetup& setup,
-                   platform::UdpSocket socket);
+  DashboardBackend(Made, BackendServices& services, std::string name, SharedDictionary profile,
+                   const BackendSetup& setup, platform::UdpSocket socket);
   ~DashboardBackend() override;
 
   // Blocks for the whole exchange. Whether the server took it, whatever its status; where it went is announced by an
@@ -47,10 +47,6 @@ class DashboardBackend final : public OrvantaBackend {
   bool reliableUDP() const { return _reliableUDP; }
   std::chrono::milliseconds period() const { return _period; }
 
-  // Waits until every datagram handed to a network queue of this platform has had its first transmission, at most
-  // `patience`. For tests. Not from a job of the pool.
-  static bool waitUntilSent(Platform& platform, std::chrono::milliseconds patience);
-
   static constexpr std::chrono::milliseconds kDefaultPeriod{500};
   static constexpr std::chrono::milliseconds kLongestPeriod{86'400'000};
   static constexpr std::chrono::milliseconds kLastResortDelay{9500};
@@ -60,10 +56,8 @@ class DashboardBackend final : public OrvantaBackend {
   std::optional<std::string> sendNumbered(const Event& event) override;
 
  private:
-  class HandOver;
-
   // The server address counts only without a profile.
-  static std::shared_ptr<DashboardBackend> create(Platform& platform, std::string name, SharedDictionary profile,
+  static std::shared_ptr<DashboardBackend> create(BackendServices& services, std::string name, SharedDictionary profile,
                                                   std::optional<std::string> serverIP, std::uint16_t serverPort,
                                                   const BackendSetup& setup);
 
@@ -81,7 +75,6 @@ class DashboardBackend final : public OrvantaBackend {
   void watchSocket();
 
   // Constant after set-up.
-  HandOver& _handOver;
   std::shared_ptr<platform::WorkQueue> _networkProcQueue;
   bool _reliableUDP = false;
   bool _usingProfile = false;

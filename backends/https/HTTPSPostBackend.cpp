@@ -34,27 +34,27 @@ bool forcesEventLogging(Platform& platform) {
 
 }  // namespace
 
-std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::create(Platform& platform, std::string name,
+std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::create(BackendServices& services, std::string name,
                                                            SharedDictionary profile, const BackendSetup& setup) {
   if (!profile || setup.identity.productFamily.empty()) return nullptr;
   if (clientSections(*profile) == nullptr) {
     ORVANTA_LOG(error, "HTTPSPostBackend(initWithName): can't find the client list.");
     return nullptr;
   }
-  return std::shared_ptr<HTTPSPostBackend>(new HTTPSPostBackend(platform, std::move(name), std::move(profile), setup));
+  return std::shared_ptr<HTTPSPostBackend>(new HTTPSPostBackend(services, std::move(name), std::move(profile), setup));
 }
 
-HTTPSPostBackend::HTTPSPostBackend(Platform& platform, std::string name, SharedDictionary profile,
+HTTPSPostBackend::HTTPSPostBackend(BackendServices& services, std::string name, SharedDictionary profile,
                                    const BackendSetup& setup)
-    : OrvantaBackend(platform, std::move(name), std::move(profile), setup),
-      _consentGiven(platform.device().diagnosticsSubmissionAllowed()),
-      _forceEventLogging(forcesEventLogging(platform)),
-      _sessionFields(SessionFields::of(setup.identity, isInternalBuild(platform))),
-      _clientIdentity{Orvanta::of(platform).getPersistentIdentifierForDNU(true),
-                      Orvanta::of(platform).getPersistentIdentifierForDNU(false)},
+    : OrvantaBackend(services, std::move(name), std::move(profile), setup),
+      _consentGiven(services.platform().device().diagnosticsSubmissionAllowed()),
+      _forceEventLogging(forcesEventLogging(services.platform())),
+      _sessionFields(SessionFields::of(setup.identity, services.config.isInternalBuild())),
+      _clientIdentity{services.config.orvanta().getPersistentIdentifierForDNU(true),
+                      services.config.orvanta().getPersistentIdentifierForDNU(false)},
       _userInfo(RecordLayer::of(setup.userInfo)),
-      _realtimePostURL(userDefaultStringForKey(platform, kRealtimePostURLKey)),
-      _postURL(userDefaultStringForKey(platform, kPostURLKey)) {
+      _realtimePostURL(userDefaultStringForKey(services.platform(), kRealtimePostURLKey)),
+      _postURL(userDefaultStringForKey(services.platform(), kPostURLKey)) {
   if (_postURL) {
     _useDefaultPostURL = true;
     ORVANTA_LOG(debug, "HTTPSPostBackend(initWithName): Using user default '{}' for postURL", *_postURL);
@@ -271,7 +271,7 @@ PostMessage HTTPSPostBackend::buildMessage(std::span<const OutgoingEvent> events
 bool HTTPSPostBackend::showsMessages() const {
   if (_clientIdentity.dnuType() == ClientIdentity::kConsentRespected && _consentGiven) return true;
   if (!_forceEventLogging) return false;
-  const EnvironmentType environment = currentEnvironmentType(platform());
+  const EnvironmentType environment = services().config.currentEnvironmentType();
   return environment == EnvironmentType::development || environment == EnvironmentType::internal;
 }
 

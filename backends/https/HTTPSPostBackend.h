@@ -31,7 +31,7 @@ namespace orvanta {
 class HTTPSPostBackend final : public OrvantaBackend {
  public:
   // Null when there is no profile, no product family or (logged) no client list in the profile.
-  static std::shared_ptr<HTTPSPostBackend> create(Platform& platform, std::string name, SharedDictionary profile,
+  static std::shared_ptr<HTTPSPostBackend> create(BackendServices& services, std::string name, SharedDictionary profile,
                                                   const BackendSetup& setup);
 
   void updateState() override;
@@ -51,7 +51,7 @@ class HTTPSPostBackend final : public OrvantaBackend {
   std::optional<std::string> sendNumbered(const Event& event) override;
 
  private:
-  HTTPSPostBackend(Platform& platform, std::string name, SharedDictionary profile, const BackendSetup& setup);
+  HTTPSPostBackend(BackendServices& services, std::string name, SharedDictionary profile, const BackendSetup& setup);
 
   // HTTPSPostConfiguration.cpp
   BackendState updateBackendState();

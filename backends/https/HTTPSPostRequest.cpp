@@ -21,7 +21,7 @@ void HTTPSPostBackend::postJSONMessage(std::string json, const Event* event, Pos
     if (completion) completion(makeOrvantaError("postURL is nil", -1));
     return;
   }
-  if (!_postQueue) _postQueue = std::make_shared<PostQueue>(platform(), weak_from_this(), name());
+  if (!_postQueue) _postQueue = std::make_shared<PostQueue>(services(), weak_from_this(), name());
   _postQueue->post({std::move(*url), postHeaders(event), std::move(json), std::move(completion)});
 }
 

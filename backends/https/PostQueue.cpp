@@ -68,12 +68,12 @@ class PostQueue::Outcome {
   std::shared_ptr<OrvantaBackend> _kept;
 };
 
-PostQueue::PostQueue(Platform& platform, std::weak_ptr<OrvantaBackend> backend, std::string backendName)
-    : _http(platform.http()),
-      _pendingPosts(PendingPosts::of(platform)),
+PostQueue::PostQueue(BackendServices& services, std::weak_ptr<OrvantaBackend> backend, std::string backendName)
+    : _http(services.platform().http()),
+      _pendingPosts(services.pendingPosts),
       _backend(std::move(backend)),
       _backendName(std::move(backendName)),
-      _queue(platform.pool().makeComputeQueue()),
+      _queue(services.platform().pool().makeComputeQueue()),
       _lane(_http.makeLane()) {}
 
 // A post that waits to be compressed.
@@ -81,7 +81,7 @@ struct PostQueue::Job {
   std::shared_ptr<PostQueue> queue;
   Post post;
   std::shared_ptr<Outcome> outcome;
-  // Also until the pool drops the job, which it may do after the platform's own values have gone.
+  // Also until the pool drops the job, which it may do after the services have gone.
   std::unique_ptr<PendingPosts::Place> place;
 };
 

@@ -5,8 +5,8 @@
 #include <string>
 #include <vector>
 
+#include "backends/BackendServices.h"
 #include "backends/OrvantaBackend.h"
-#include "backends/https/PendingPosts.h"
 #include "platform/http/HttpClient.h"
 #include "platform/queue/WorkQueue.h"
 
@@ -30,7 +30,7 @@ struct Post {
 // when the server answers 5xx. A post for which PendingPosts has no room fails like one that the network lost.
 class PostQueue : public std::enable_shared_from_this<PostQueue> {
  public:
-  PostQueue(Platform& platform, std::weak_ptr<OrvantaBackend> backend, std::string backendName);
+  PostQueue(BackendServices& services, std::weak_ptr<OrvantaBackend> backend, std::string backendName);
 
   // Any thread, without locks: it may wait, and the completion may run at once.
   void post(Post post);

@@ -2,7 +2,7 @@
 
 #include <utility>
 
-#include "backends/upload/UploadBudget.h"
+#include "backends/UploadBudget.h"
 #include "backends/upload/UploadURL.h"
 #include "config/Compression.h"
 #include "interface/OrvantaLogging.h"
@@ -42,21 +42,21 @@ std::optional<std::string> compressedContent(const platform::ExtensionHandle& ha
 
 }  // namespace
 
-std::shared_ptr<UploadBackend> UploadBackend::create(Platform& platform, std::string name, SharedDictionary profile,
-                                                     const BackendSetup& setup) {
+std::shared_ptr<UploadBackend> UploadBackend::create(BackendServices& services, std::string name,
+                                                     SharedDictionary profile, const BackendSetup& setup) {
   std::optional<std::string> url = textAt(profile, "post_url");
   if (!url) {
     ORVANTA_LOG(error, "UploadBackend(initWithName): can't resolve upload post URL.");
     return nullptr;
   }
-  auto backend = std::make_shared<UploadBackend>(Made{}, platform, std::move(name), std::move(profile), setup);
+  auto backend = std::make_shared<UploadBackend>(Made{}, services, std::move(name), std::move(profile), setup);
   backend->setUploadURL(std::move(url));
   return backend;
 }
 
-UploadBackend::UploadBackend(Made, Platform& platform, std::string name, SharedDictionary profile,
+UploadBackend::UploadBackend(Made, BackendServices& services, std::string name, SharedDictionary profile,
                              const BackendSetup& setup)
-    : OrvantaBackend(platform, std::move(name), std::move(profile), setup) {
+    : OrvantaBackend(services, std::move(name), std::move(profile), setup) {
   setDisplayURL(textAt(this->profile(), "display_url"));
 }
 
@@ -90,7 +90,7 @@ bool UploadBackend::uploadFileAtPath(const UploadFile& file) {
   std::unique_ptr<UploadBudget::Share> share;
   {
     const platform::BlockingScope waitingForOthers;
-    share = UploadBudget::Share::take(UploadBudget::of(platform()), UploadBudget::kCopies * bytesToRead(*size));
+    share = UploadBudget::Share::take(services().uploadBudget, UploadBudget::kCopies * bytesToRead(*size));
   }
   if (!share) {
     ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): The daemon is ending.");

@@ -18,9 +18,9 @@ class UploadBackend final : public OrvantaBackend {
 
  public:
   // Null, with a log line, when the profile has no "post_url".
-  static std::shared_ptr<UploadBackend> create(Platform& platform, std::string name, SharedDictionary profile,
+  static std::shared_ptr<UploadBackend> create(BackendServices& services, std::string name, SharedDictionary profile,
                                                const BackendSetup& setup);
-  UploadBackend(Made, Platform& platform, std::string name, SharedDictionary profile, const BackendSetup& setup);
+  UploadBackend(Made, BackendServices& services, std::string name, SharedDictionary profile, const BackendSetup& setup);
 
   // Whether the request was made, whatever came of it. A file above UploadBudget::kMaximumFileBytes is refused.
   bool uploadFileAtPath(const UploadFile& file) override;

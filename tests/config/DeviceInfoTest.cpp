@@ -5,7 +5,7 @@
 
 #include <set>
 
-#include "config/Environment.h"
+#include "config/ConfigServices.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
 
@@ -77,16 +77,16 @@ TEST(Environment, isTheSettingOrFollowsTheBuild) {
       {"-3", false, 2, "4294967293"},
   };
   for (const auto& row : rows) {
-    test::TestPlatform platform;
+    test::TestServices<ConfigServices> platform;
     if (row.internalBuild) platform.device.release = "Internal";
-    platform.get().defaults().set("environmentType", row.setting);
+    ASSERT_TRUE(platform.get().defaults().set("environmentType", row.setting));
     const test::LogCapture log;
     std::vector<std::string> lines;
     if (!row.invalid.empty()) lines.push_back("<3>userDefaultsEnvironment: Invalid environment type " + row.invalid);
     lines.push_back("<6>userDefaultsEnvironment: Environment type " + std::to_string(row.expected));
     // Decided once: neither a later setting nor another line.
     for (int asked = 0; asked < 2; ++asked) {
-      EXPECT_EQ(static_cast<std::uint32_t>(currentEnvironmentType(platform)), row.expected);
+      EXPECT_EQ(static_cast<std::uint32_t>(platform.services.currentEnvironmentType()), row.expected);
       EXPECT_EQ(log.lines(), lines);
       ASSERT_TRUE(platform.get().defaults().set("environmentType", row.expected == 1 ? 4 : 1));
     }

@@ -25,7 +25,7 @@ TEST(Orvanta, readsTheBundlesVersion) {
     test::TestPlatform platform;
     if (file != nullptr) platform.directory.write("share/framework.plist", file);
     const test::LogCapture log;
-    EXPECT_EQ(Orvanta::of(platform).bundleVersion(), version);
+    EXPECT_EQ(Orvanta(platform).bundleVersion(), version);
     EXPECT_EQ(log.count("<4>bundleVersion: "), lines) << file;
   }
 }
@@ -34,12 +34,12 @@ TEST(Orvanta, theShippedBundleHasAVersionOfThreeNumbers) {
   test::TestPlatform platform;
   std::filesystem::copy_file(ORVANTA_SOURCE_DIR "/packaging/share/orvanta/framework.plist",
                              platform.directory / "share/framework.plist");
-  EXPECT_THAT(Orvanta::of(platform).bundleVersion(), testing::MatchesRegex("[0-9]+\\.[0-9]+\\.[0-9]+"));
+  EXPECT_THAT(Orvanta(platform).bundleVersion(), testing::MatchesRegex("[0-9]+\\.[0-9]+\\.[0-9]+"));
 }
 
 TEST(Orvanta, keepsTheKeyOnceItHasOne) {
   test::TestPlatform platform;
-  Orvanta& orvanta = Orvanta::of(platform);
+  Orvanta orvanta(platform);
   EXPECT_FALSE(orvanta.publicKey());
   const std::string file = platform.directory / "share/publicKey.der";
   const auto der = test::StorebagSigner().publicKeyDer(test::KeyLayout::pkcs1);
@@ -55,13 +55,14 @@ TEST(Orvanta, keepsTheKeyOnceItHasOne) {
   const auto key = orvanta.publicKey();
   ASSERT_TRUE(key);
   std::filesystem::remove(file);
-  EXPECT_EQ(Orvanta::of(platform).publicKey(), key);
+  EXPECT_EQ(orvanta.publicKey(), key);
 }
 
 TEST(Orvanta, keepsOneIdentifierPerStandOnConsent) {
   test::TestPlatform platform;
-  const std::string respect = Orvanta::of(platform).getPersistentIdentifierForDNU(true);
-  const std::string override = Orvanta::of(platform).getPersistentIdentifierForDNU(false);
+  Orvanta orvanta(platform);
+  const std::string respect = orvanta.getPersistentIdentifierForDNU(true);
+  const std::string override = orvanta.getPersistentIdentifierForDNU(false);
   EXPECT_THAT(respect, testing::MatchesRegex("[0-9A-F]{8}-[0-9A-F]{4}-4[0-9A-F]{3}-[89AB][0-9A-F]{3}-[0-9A-F]{12}"));
   EXPECT_NE(respect, override);
   Orvanta afterRestart(platform);

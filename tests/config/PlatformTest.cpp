@@ -7,8 +7,9 @@
 #include <cstdlib>
 #include <future>
 #include <string>
-#include <vector>
+#include <tuple>
 
+#include "config/ConfigServices.h"
 #include "platform/host/Process.h"
 #include "tests/support/TestPlatform.h"
 
@@ -45,26 +46,21 @@ TEST(FileLocations, comeFromTheEnvironment) {
   }
 }
 
-TEST(Platform, makesEachOnceValueOnceWhateverThreadAsks) {
-  struct Inner {
-    int value;
-  };
-  struct Outer {
-    int value;
-  };
-  orvanta::test::TestPlatform device;
-  Platform& platform = device;
-  std::atomic<int> made{0};
+TEST(ConfigServices, findEachFactOutOnceWhateverThreadAsks) {
+  test::TestServices<ConfigServices> device, another;
+  ConfigServices& services = device.services;
   const auto ask = [&] {
-    return &platform.once<Outer>([&] { return Outer{platform.once<Inner>([&] { return Inner{++made}; }).value + 10}; });
+    return std::tuple(&services.storebagServerURL(), &services.orvanta(), services.storebagLane(),
+                      services.isInternalBuild());
   };
   auto other = std::async(std::launch::async, ask);
-  const Outer* mine = ask();
+  const auto mine = ask();
   EXPECT_EQ(mine, other.get());
-  EXPECT_EQ(mine->value, 11);
-  EXPECT_EQ(made, 1);
-  orvanta::test::TestPlatform another;
-  EXPECT_EQ(another.get().once<Inner>([] { return Inner{5}; }).value, 5);
+  EXPECT_EQ(mine, ask());
+  device.device.release = another.device.release = "Internal";
+  EXPECT_FALSE(services.isInternalBuild());
+  EXPECT_TRUE(another.services.isInternalBuild());
+  EXPECT_NE(another.services.storebagLane(), services.storebagLane());
 }
 
 TEST(Process, nothingGetsTheNumberOfAClosedStandardDescriptor) {
@@ -75,49 +71,6 @@ TEST(Process, nothingGetsTheNumberOfAClosedStandardDescriptor) {
     return ::read(0, &byte, 1) == 0 && ::write(1, "x", 1) == 1 ? ::open("/", O_RDONLY) : -1;
   };
   EXPECT_EXIT(::_exit(numberAfterSecuring() > 2 ? 0 : 1), testing::ExitedWithCode(0), "");
-}
-
-using Ends = std::vector<std::string>;
-
-class TellingHttpClient final : public orvanta::test::ScriptedHttpClient {
- public:
-  TellingHttpClient(platform::WorkPool& pool, Ends& ends) : _pool(pool), _ends(ends) {}
-  ~TellingHttpClient() override { _ends.emplace_back("client destroyed"); }
-  void shutdown(std::chrono::milliseconds) override {
-    EXPECT_EQ(_pool.threadCount(), 1U) << "nobody would run the last completions";
-    _ends.emplace_back("client shut down");
-  }
-
- private:
-  platform::WorkPool& _pool;
-  Ends& _ends;
-};
-
-// What a once-value holds of the client and the pool must go while they are there.
-TEST(Platform, endsItsPartsInOrder) {
-  Ends ends;
-  {
-    Platform::Parts parts;
-    parts.pool = std::make_unique<platform::WorkPool>(1);
-    parts.pool->start();
-    parts.http = std::make_unique<TellingHttpClient>(*parts.pool, ends);
-    Platform platform(std::move(parts));
-    using Telling = std::shared_ptr<void>;
-    platform.once<Telling>([&] {
-      return Telling(nullptr, [&](void*) {
-        EXPECT_EQ(platform.pool().threadCount(), 0U) << "a job may still use it";
-        ends.emplace_back("once-value destroyed");
-        platform.pool().post([last = Telling(nullptr, [&](void*) { ends.emplace_back("pool destroyed"); })] {});
-      });
-    });
-    std::promise<void> ran;
-    platform.pool().post([&] {
-      ends.emplace_back("job");
-      ran.set_value();
-    });
-    ran.get_future().get();
-  }
-  EXPECT_EQ(ends, (Ends{"job", "client shut down", "once-value destroyed", "client destroyed", "pool destroyed"}));
 }
 
 }  // namespace

@@ -2,7 +2,6 @@
 
 #include <gmock/gmock.h>
 
-#include "config/DeviceInfo.h"
 #include "platform/codec/PropertyList.h"
 #include "tests/config/SignedStorebag.h"
 #include "tests/support/LogCapture.h"
@@ -25,7 +24,7 @@ class StorebagFixture : public testing::Test {
   }
 
   StorebagSigner signer;
-  TestPlatform platform;
+  TestServices<ConfigServices> platform;
   StorebagFetch fetch;
   LogCapture log;
 };
@@ -88,15 +87,15 @@ TEST(StorebagServer, isTheOverrideOrFollowsTheBuildOnce) {
       {local, std::nullopt, local},
   };
   for (const auto& [setting, releaseType, expected] : rows) {
-    TestPlatform platform;
+    TestServices<ConfigServices> platform;
     platform.device.release = releaseType;
-    if (setting) platform.get().defaults().set("orvanta_storebag_url", *setting);
-    EXPECT_EQ(storebagServerURL(platform), expected);
-    EXPECT_EQ(isInternalBuild(platform), releaseType == "Internal");
+    if (setting) ASSERT_TRUE(platform.get().defaults().set("orvanta_storebag_url", *setting));
+    EXPECT_EQ(platform.services.storebagServerURL(), expected);
+    EXPECT_EQ(platform.services.isInternalBuild(), releaseType == "Internal");
     platform.device.release = releaseType == "Internal" ? "Beta" : "Internal";
-    EXPECT_EQ(isInternalBuild(platform), releaseType == "Internal") << "asked again";
+    EXPECT_EQ(platform.services.isInternalBuild(), releaseType == "Internal") << "asked again";
     ASSERT_TRUE(platform.get().defaults().set("orvanta_storebag_url", "http://other.kovalt.com"));
-    EXPECT_EQ(storebagServerURL(platform), expected) << "asked again";
+    EXPECT_EQ(platform.services.storebagServerURL(), expected) << "asked again";
   }
 }
 
@@ -180,7 +179,7 @@ TEST_F(StorebagFetchTest, withoutAServerOnlyTheConferencingClientGetsABag) {
 
 TEST_F(StorebagFetchTest, everyFormOfDocumentBagAndKeyIsRead) {
   for (const auto layout : {KeyLayout::subjectPublicKeyInfo, KeyLayout::pkcs1}) {
-    TestPlatform other;  // which has not kept a key yet
+    TestServices<ConfigServices> other;  // which has not kept a key yet
     installKey(other, signer.publicKeyDer(layout));
     for (const auto outer : {PlistForm::xml, PlistForm::binary}) {
       for (const auto inner : {PlistForm::xml, PlistForm::binary}) {
@@ -232,10 +231,10 @@ TEST_F(StorebagSelectionTest, takesTheEnvironmentsSection) {
       {2, true, releaseOnly, nullptr, {notFound("kovalt_internal")}},
   };
   for (const auto& row : rows) {
-    TestPlatform device;  // the environment is decided once
+    TestServices<ConfigServices> device;  // the environment is decided once
     installKey(device, signer.publicKeyDer(KeyLayout::subjectPublicKeyInfo));
     if (row.internalBuild) device.device.release = "Internal";
-    if (row.environment) device.get().defaults().set("environmentType", *row.environment);
+    if (row.environment) ASSERT_TRUE(device.get().defaults().set("environmentType", *row.environment));
     device.http.answer = [&](const auto&) { return ScriptedHttpClient::status(200, signer.document(row.bag)); };
     log.clear();
     const auto chosen = fetchStorebagForEnvironmentAndClientType(device, 5, fetch);

@@ -78,7 +78,7 @@ class WholeDaemon {
   }
 
   static constexpr std::size_t kThreads = 4;
-  TestPlatform device{kThreads};
+  TestServices<DaemonServices> device{kThreads};
   OrvantadAgent agent{device, [this](std::int32_t, StorebagFetch& fetch) {
                         fetch.maxAge = 0;
                         fetch.version = "1.0";

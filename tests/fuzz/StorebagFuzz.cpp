@@ -28,11 +28,11 @@ struct World {
   }
   Swallow log;
   test::StorebagSigner signer;
-  test::TestPlatform device;
+  test::TestServices<BackendServices> device;
   std::string document;
 };
 
-void evaluate(Platform& platform, const Value& profile) {
+void evaluate(BackendServices& services, const Value& profile) {
   if (profile.dictionary() == nullptr) return;
   BackendSetup setup;
   setup.identity.clientType = 5;
@@ -40,7 +40,7 @@ void evaluate(Platform& platform, const Value& profile) {
   setup.identity.requireUserInfo = true;
   setup.identity.selfVersion = SelfVersion::parse("8.0.0");
   const auto backend =
-      HTTPSPostBackend::create(platform, "http_post", std::make_shared<const Dictionary>(*profile.dictionary()), setup);
+      HTTPSPostBackend::create(services, "http_post", std::make_shared<const Dictionary>(*profile.dictionary()), setup);
   if (!backend) return;
   backend->updateState();
   REQUIRE(backend->state() == kBackendWaiting);
@@ -61,7 +61,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t siz
   const bool isSigned = (bytes[0] & 1U) != 0;
   world.document = isSigned ? world.signer.document(rest) : std::string(rest.begin(), rest.end());
   StorebagFetch fetch;
-  const auto section = fetchStorebagForEnvironmentAndClientType(world.device, 5, fetch);
+  const auto section = fetchStorebagForEnvironmentAndClientType(world.device.services.config, 5, fetch);
   if (!section) return 0;
   REQUIRE(isSigned);  // a signature cannot be guessed
   for (const auto& [name, profile] : *section) evaluate(world.device, profile);

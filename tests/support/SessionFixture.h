@@ -80,7 +80,7 @@ class SessionFixture : public ::testing::Test {
   }
 
   LogCapture log;
-  TestPlatform device;
+  TestServices<DaemonServices> device;
   SharedDictionary storebag;  // what the server gives; null: nothing
   std::int32_t maxAge = 3600;
   int fetches = 0;

@@ -173,4 +173,16 @@ class TestPlatform {
   RecordedPowerLog& powerLog = static_cast<RecordedPowerLog&>(_platform->powerLog());
 };
 
+// The same with one layer's services above it, ended in the order in which the daemon ends them.
+template <class Services>
+class TestServices : public TestPlatform {
+ public:
+  explicit TestServices(std::size_t threads = 2) : TestPlatform(threads), services(get()) {}
+  ~TestServices() { get().stop(); }
+
+  operator Services&() { return services; }  // NOLINT(google-explicit-constructor): stands for the services
+
+  Services services;
+};
+
 }  // namespace orvanta::test

@@ -18,8 +18,10 @@ constexpr const char* kNotResponding = " does not respond to forwarding selector
 
 class BriskBackendTest : public ::testing::Test {
  protected:
-  static std::string libraryPath(test::TestPlatform& on) { return on.get().files().plugInsDirectory + kLibrary; }
-  static void install(test::TestPlatform& on, const std::string& library) {
+  static std::string libraryPath(test::TestServices<BackendServices>& on) {
+    return on.get().files().plugInsDirectory + kLibrary;
+  }
+  static void install(test::TestServices<BackendServices>& on, const std::string& library) {
     std::filesystem::create_directories(std::filesystem::path(libraryPath(on)).parent_path());
     if (library == kFifo) {
       ASSERT_EQ(::mkfifo(libraryPath(on).c_str(), 0600), 0);
@@ -27,13 +29,13 @@ class BriskBackendTest : public ::testing::Test {
       std::filesystem::copy_file(library, libraryPath(on));
     }
   }
-  static std::shared_ptr<BriskBackend> make(test::TestPlatform& on, std::int32_t clientType) {
+  static std::shared_ptr<BriskBackend> make(test::TestServices<BackendServices>& on, std::int32_t clientType) {
     BackendSetup setup;
     setup.identity.clientType = clientType;
     return BriskBackend::create(on, "brisk", nullptr, setup);
   }
 
-  test::TestPlatform platform;
+  test::TestServices<BackendServices> platform;
   test::LogCapture log;
 };
 
@@ -62,7 +64,7 @@ TEST_F(BriskBackendTest, EveryFaultyBundleIsExplainedOnceAndEachEventLeavesALine
       {faults + "/faulty_adaptor_4.so", "The class BriskAdaptor gave no instance", "(null)"},
   };
   for (const auto& [library, reason, adaptor] : rows) {
-    test::TestPlatform fresh;  // loads anew
+    test::TestServices<BackendServices> fresh;  // loads anew
     if (!library.empty()) install(fresh, library);
     log.clear();
     const auto backend = make(fresh, 7);

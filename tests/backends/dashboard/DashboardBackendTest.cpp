@@ -77,7 +77,7 @@ class DashboardBackendTest : public ::testing::Test {
   }
 
   test::LogCapture log;  // outlives the platform's threads
-  test::TestPlatform platform;
+  test::TestServices<BackendServices> platform;
   test::UdpServer server;
 };
 
@@ -140,7 +140,7 @@ TEST_F(DashboardBackendTest, SendsEachEventAndReturnsItsLine) {
   auto explicitServer = DashboardBackend::create(platform, "dashboard", "127.0.0.1", server.port(), {});
   send(*explicitServer);
   EXPECT_EQ(received().header.mode, 3);
-  EXPECT_TRUE(DashboardBackend::waitUntilSent(platform, test::kHangGuard));
+  EXPECT_TRUE(platform.services.pendingDatagrams.waitUntilSent(test::kHangGuard));
   server.send({});                                // no end of anything
   std::vector<std::uint8_t> acknowledgement(62);  // as short as it may be
   acknowledgement[61] = 1;
@@ -154,7 +154,7 @@ TEST_F(DashboardBackendTest, WhatAServerRefusesIsSentAgainWhenItIsBack) {
   auto backend = make(profile({{"port", static_cast<int>(port)}, {"reliable", 200}}));
   send(*backend);  // nobody there: the next send fails
   send(*backend);
-  ASSERT_TRUE(DashboardBackend::waitUntilSent(platform, test::kHangGuard));
+  ASSERT_TRUE(platform.services.pendingDatagrams.waitUntilSent(test::kHangGuard));
   const std::weak_ptr<DashboardBackend> weak = backend;
   backend->cleanup();  // with both still to be sent
   backend.reset();
@@ -178,7 +178,7 @@ TEST_F(DashboardBackendTest, CleanUpWithAnEmptyQueueClosesAtOnceAndSendsGoNowher
   backend->cleanup();
   ASSERT_TRUE(eventually([&] { return openSockets() == before; }));
   EXPECT_TRUE(send(*backend));
-  EXPECT_TRUE(DashboardBackend::waitUntilSent(platform, test::kHangGuard));
+  EXPECT_TRUE(platform.services.pendingDatagrams.waitUntilSent(test::kHangGuard));
   EXPECT_EQ(server.receive(0), std::nullopt);
   EXPECT_EQ(log.count("clean-up"), 0U);
   const test::UdpServer another;  // under the descriptor that has become free
@@ -218,7 +218,7 @@ TEST_F(DashboardBackendTest, LogDataThatDoesNotArrive) {
     EXPECT_FALSE(uploader->uploadLogData(logData)) << line;
     EXPECT_EQ(log.lines().at(0), "<3>DashboardBackend(uploadLogData): " + line);
   }
-  EXPECT_TRUE(DashboardBackend::waitUntilSent(platform, test::kHangGuard));
+  EXPECT_TRUE(platform.services.pendingDatagrams.waitUntilSent(test::kHangGuard));
   EXPECT_EQ(server.receive(0), std::nullopt);
 }
 

@@ -74,7 +74,7 @@ BackendIdentity HTTPSFixture::defaultIdentity() {
   return identity;
 }
 
-std::shared_ptr<HTTPSPostBackend> HTTPSFixture::makeBackend(const Setup& setup, TestPlatform& on) {
+std::shared_ptr<HTTPSPostBackend> HTTPSFixture::makeBackend(const Setup& setup, TestBackends& on) {
   auto backend = HTTPSPostBackend::create(on, setup.name, shared(setup.profile),
                                           {setup.identity, setup.batchEvents, setup.userInfo});
   if (!backend) return nullptr;
@@ -110,7 +110,7 @@ std::promise<void> HTTPSFixture::holdCompressing() {
 }
 
 void HTTPSFixture::settle() {
-  ASSERT_TRUE(PendingPosts::of(platform)->waitUntilHandedIn(kHangGuard));
+  ASSERT_TRUE(platform.services.pendingPosts->waitUntilHandedIn(kHangGuard));
 }
 
 HTTPSFixture::Posts HTTPSFixture::fields(std::string_view key) {

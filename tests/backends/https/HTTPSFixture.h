@@ -29,6 +29,8 @@ Dictionary envelopeOf(const platform::HttpRequest& request);
 std::vector<Dictionary> postedEvents(const platform::HttpRequest& request);
 std::string headerOf(const platform::HttpRequest& request, std::string_view name);
 
+using TestBackends = TestServices<BackendServices>;
+
 // What a flush told its caller.
 struct FlushAnswer {
   int calls = 0;
@@ -66,7 +68,7 @@ class HTTPSFixture : public ::testing::Test {
   static Setup requiring(const Dictionary& more = {}, bool batches = false);
   static BackendIdentity defaultIdentity();
   std::shared_ptr<HTTPSPostBackend> makeBackend(const Setup& setup) { return makeBackend(setup, platform); }
-  static std::shared_ptr<HTTPSPostBackend> makeBackend(const Setup& setup, TestPlatform& on);
+  static std::shared_ptr<HTTPSPostBackend> makeBackend(const Setup& setup, TestBackends& on);
 
   // One event at the clock's time.
   std::optional<std::string> send(OrvantaBackend& backend, std::uint16_t method, std::int32_t flag = 0,
@@ -83,7 +85,7 @@ class HTTPSFixture : public ::testing::Test {
   Posts fields(std::string_view key);
   Posts categories() { return fields("_method"); }
 
-  TestPlatform platform;
+  TestBackends platform;
 };
 
 }  // namespace orvanta::test

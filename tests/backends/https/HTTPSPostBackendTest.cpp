@@ -167,7 +167,7 @@ TEST_F(HTTPSPostBackendTest, WhoIsShownWhatWasSent) {
       {"nonsense on development", false, 1, 1, "maybe", false},
   };
   for (const auto& row : rows) {
-    TestPlatform own;  // the environment is decided once per platform
+    TestBackends own;  // the environment is decided once per platform
     own.device.consent = row.consent;
     ASSERT_TRUE(own.get().defaults().set("environmentType", row.environment).ok());
     if (row.force != nullptr) {
@@ -176,7 +176,7 @@ TEST_F(HTTPSPostBackendTest, WhoIsShownWhatWasSent) {
     const auto backend = makeBackend(requiring({{"override_dnu", row.overrideDnu}}), own);
     ASSERT_EQ(backend->state(), kBackendEnabled) << row.what;
     EXPECT_EQ(send(*backend, 1).has_value(), row.shown) << row.what;
-    EXPECT_TRUE(PendingPosts::of(own)->waitUntilHandedIn(kHangGuard));
+    EXPECT_TRUE(own.services.pendingPosts->waitUntilHandedIn(kHangGuard));
   }
 }
 

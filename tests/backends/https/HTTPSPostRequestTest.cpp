@@ -137,13 +137,13 @@ TEST_F(HTTPSPostRequestTest, ADroppedPostIsReported) {
   // A client that loses a request without a word, as a pool does with jobs that it never ran.
   Pending pending;
   {
-    TestPlatform own;
+    TestBackends own;
     own.http.hold = true;
     const auto backend = makeBackend(batching(), own);
     Event event{.category = 1, .type = 1};
     backend->sendMessage(event);
     backend->flushMessagesWithCompletion(pending.completion());
-    ASSERT_TRUE(PendingPosts::of(own)->waitUntilHandedIn(kHangGuard));
+    ASSERT_TRUE(own.services.pendingPosts->waitUntilHandedIn(kHangGuard));
     EXPECT_EQ(pending.answer->calls, 0);
   }
   EXPECT_EQ(pending.answer->calls, 1);
@@ -195,7 +195,7 @@ TEST_F(HTTPSPostRequestTest, WhoHasMoreThanMayWaitWaitsForRoomAndLosesNothing) {
   ASSERT_TRUE(waiting.waitFor(1)) << "in a BlockingScope";
   const auto other = std::async(std::launch::async, [&] { backend->setCorrelatedSessionID("root.own"); });
   EXPECT_EQ(other.wait_for(kHangGuard), std::future_status::ready) << "it waits with the backend's lock held";
-  EXPECT_FALSE(PendingPosts::of(platform)->waitUntilHandedIn(std::chrono::milliseconds(0)));
+  EXPECT_FALSE(platform.services.pendingPosts->waitUntilHandedIn(std::chrono::milliseconds(0)));
   release.set_value();
   sender.get();
   ASSERT_TRUE(first.wait() && second.wait());

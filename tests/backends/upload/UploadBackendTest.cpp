@@ -9,7 +9,7 @@
 #include <filesystem>
 #include <future>
 
-#include "backends/upload/UploadBudget.h"
+#include "backends/UploadBudget.h"
 #include "backends/upload/UploadURL.h"
 #include "platform/core/UniqueFd.h"
 #include "tests/backends/https/HTTPSFixture.h"
@@ -61,7 +61,7 @@ class UploadBackendTest : public ::testing::Test {
     return upload(path, fd.get());
   }
 
-  test::TestPlatform platform;
+  test::TestServices<BackendServices> platform;
   test::LogCapture log;
   std::shared_ptr<UploadBackend> backend;
   int removals = 0;
@@ -170,7 +170,7 @@ TEST_F(UploadBackendTest, RequestsThatCannotBeMade) {
 
 TEST_F(UploadBackendTest, UploadsShareTheirMemoryUntilTheDaemonEnds) {
   using Share = UploadBudget::Share;
-  auto& budget = UploadBudget::of(platform);
+  auto& budget = platform.services.uploadBudget;
   auto large = Share::take(budget, UploadBudget::kMaximumTotalBytes);
   auto second =
       std::async(std::launch::async, [&] { return Share::take(budget, UploadBudget::kMaximumTotalBytes - 1); });

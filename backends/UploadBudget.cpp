@@ -1,12 +1,8 @@
-#include "backends/upload/UploadBudget.h"
+#include "backends/UploadBudget.h"
 
 #include <memory>
 
 namespace orvanta {
-
-UploadBudget& UploadBudget::of(Platform& platform) {
-  return *platform.once<std::unique_ptr<UploadBudget>>([] { return std::make_unique<UploadBudget>(); });
-}
 
 std::unique_ptr<UploadBudget::Share> UploadBudget::Share::take(UploadBudget& budget, std::uint64_t bytes) {
   std::unique_lock lock(budget._mutex);

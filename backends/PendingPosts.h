@@ -6,12 +6,10 @@
 #include <memory>
 #include <mutex>
 
-#include "config/Platform.h"
-
 namespace orvanta {
 
-// The posts of all backends that wait to be compressed: how many, and how much memory they may take. One per platform,
-// shared with the posts, some of which go after it. Thread-safe.
+// The posts of all backends that wait to be compressed: how many, and how much memory they may take. Owned by
+// BackendServices and shared with the posts, some of which go after it. Thread-safe.
 //
 // Who brings more than there is room for waits, so that a program that reports faster than this device compresses is
 // slowed down. When kMaximumWaiters wait already it is refused instead; when the daemon ends there is room for all.
@@ -20,8 +18,6 @@ class PendingPosts {
   static constexpr std::size_t kMaximumQueueBytes = 16U << 20U;
   static constexpr std::size_t kMaximumTotalBytes = 64U << 20U;
   static constexpr std::size_t kMaximumWaiters = 16;
-
-  static std::shared_ptr<PendingPosts> of(Platform& platform);
 
   // One queue's share. Shared by the queue and its posts.
   struct QueueShare {

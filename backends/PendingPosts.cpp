@@ -1,17 +1,10 @@
-#include "backends/https/PendingPosts.h"
+#include "backends/PendingPosts.h"
 
 #include <utility>
 
 #include "platform/queue/WorkQueue.h"
 
 namespace orvanta {
-
-std::shared_ptr<PendingPosts> PendingPosts::of(Platform& platform) {
-  struct Holder {
-    std::shared_ptr<PendingPosts> posts;
-  };
-  return platform.once<Holder>([] { return Holder{std::make_shared<PendingPosts>()}; }).posts;
-}
 
 bool PendingPosts::hasRoom(const QueueShare& queue, std::size_t bytes) const {
   const auto fits = [bytes](std::size_t used, std::size_t limit) { return used == 0 || used + bytes <= limit; };

@@ -5,12 +5,11 @@
 #include <memory>
 #include <mutex>
 
-#include "config/Platform.h"
 #include "interface/WireLimits.h"
 
 namespace orvanta {
 
-// How much memory file uploads of all sessions may take together. One per platform; thread-safe.
+// How much memory file uploads of all sessions may take together. Owned by BackendServices; thread-safe.
 //
 // An upload takes its share before it reads the file, and waits for it in the order of arrival: a small one does not
 // pass a large one for ever.
@@ -21,8 +20,6 @@ class UploadBudget {
   // then the copy of the right size). Beside one of the largest there is room for small ones.
   static constexpr std::uint64_t kCopies = 3;
   static constexpr std::uint64_t kMaximumTotalBytes = kCopies * kMaximumFileBytes + (64U << 20U);
-
-  static UploadBudget& of(Platform& platform);
 
   // Holds `bytes`, at most kMaximumTotalBytes, while it lives.
   class Share {
