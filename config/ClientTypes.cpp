@@ -8,7 +8,7 @@ namespace {
 
 struct ClientTypeRow {
   std::string_view senderCode;
-  std::string_view storebagName;  // empty: none
+  std::string_view storebagName;  // empty when it has no storebag
 };
 
 constexpr std::array<ClientTypeRow, 19> kClientTypes{{
@@ -19,13 +19,13 @@ constexpr std::array<ClientTypeRow, 19> kClientTypes{{
     {"VX", ""},
     {"ZK", "quillon"},
     {"QB", "brindle"},
-    {"XF", "confluo"},
+    {"XF", kConfluoStorebag},
     {"JZ", "skylume"},
     {"QW", "ostrel"},
     {"XQ", "pondera"},
-    {"ZJ", "confluo"},
+    {"ZJ", kConfluoStorebag},
     {"QUBZ", "graphelle"},
-    {"ZEPHQ", "confluo"},
+    {"ZEPHQ", kConfluoStorebag},
     {"QB-ZIRL", "brindle"},
     {"QB-JOVEX", "brindle"},
     {"ZORNEPS", "scribehall"},
