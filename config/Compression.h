@@ -8,7 +8,7 @@
 
 namespace orvanta {
 
-// Deflates the whole input in one pass into a gzip member (or a zlib stream). None on failure, which is logged.
+// Deflates the whole input in one pass into a gzip member (or a zlib stream). Nullopt on failure, which is logged.
 // Thread-safe: each thread keeps one stream per container, so that a small body does not pay for setting one up.
 std::optional<std::string> compressDataWithZlibOrGzip(bool gzip, std::string_view input);
 std::optional<std::string> gzipDeflate(std::string_view input);

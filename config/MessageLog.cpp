@@ -4,12 +4,12 @@
 
 #include <cerrno>
 #include <optional>
-#include <system_error>
 #include <utility>
 #include <vector>
 
 #include "config/MessageLogDirectory.h"
 #include "interface/OrvantaLogging.h"
+#include "platform/core/Text.h"
 
 namespace orvanta {
 
@@ -31,7 +31,7 @@ void expireLogFile(const MessageLogDirectory& directory, const Entry& file) {
               describeCreation(file.created));
 }
 
-// The message logs that the directory holds; none when it cannot be listed. A missing directory is made.
+// The message logs that the directory holds; empty when it cannot be listed. A missing directory is made.
 std::vector<Entry> listOrCreate(MessageLogDirectory& directory) {
   std::vector<Entry> entries;
   const int error = directory.list(entries);
@@ -39,7 +39,7 @@ std::vector<Entry> listOrCreate(MessageLogDirectory& directory) {
     ORVANTA_LOG(info, "writeToLogFile: Creating orvantad log directory at {}", directory.path());
     directory.create();
   } else if (error != 0) {
-    ORVANTA_LOG(error, "writeToLogFile: Error reading from log directory: {}", std::generic_category().message(error));
+    ORVANTA_LOG(error, "writeToLogFile: Error reading from log directory: {}", platform::errnoText(error));
   }
   return entries;
 }

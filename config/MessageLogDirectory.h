@@ -10,8 +10,8 @@
 
 namespace orvanta {
 
-// Whether a file of that name is a message log: "orvantad", digits or any other text without "_", "messageLog.diag",
-// joined by "_".
+// Returns whether a file of that name is a message log: "orvantad", digits or any other text without "_",
+// "messageLog.diag", joined by "_".
 bool isMessageLogName(std::string_view name);
 std::string messageLogName(std::int32_t creationTime);
 
@@ -20,7 +20,7 @@ std::string messageLogName(std::int32_t creationTime);
 // is remembered from one call to the next.
 class MessageLogDirectory {
  public:
-  // Seconds since 1970; none where the file system does not keep it.
+  // Seconds since 1970; nullopt where the file system does not keep it.
   using CreationDate = std::optional<double>;
 
   struct Entry {

@@ -6,7 +6,6 @@
 
 #include <cerrno>
 #include <optional>
-#include <system_error>
 #include <utility>
 #include <vector>
 
@@ -14,6 +13,7 @@
 #include "interface/OrvantaLogging.h"
 #include "platform/codec/PropertyList.h"
 #include "platform/core/NearestWord.h"
+#include "platform/core/Text.h"
 #include "platform/core/UniqueFd.h"
 
 namespace orvanta {
@@ -51,10 +51,10 @@ std::string readVersion(const std::string& frameworkDirectory) {
 // The key file's bytes, or what keeps them from being read.
 Result<std::vector<std::uint8_t>> readKeyFile(const std::string& path) {
   const platform::UniqueFd file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
-  if (!file) return Failure{"cannot open " + path + ": " + std::generic_category().message(errno)};
+  if (!file) return Failure{"cannot open " + path + ": " + platform::errnoText(errno)};
   std::vector<std::uint8_t> bytes(kLargestKeyFile);
   const ssize_t count = ::read(file.get(), bytes.data(), bytes.size());
-  if (count < 0) return Failure{"cannot read " + path + ": " + std::generic_category().message(errno)};
+  if (count < 0) return Failure{"cannot read " + path + ": " + platform::errnoText(errno)};
   bytes.resize(static_cast<std::size_t>(count));
   return bytes;
 }
@@ -72,7 +72,7 @@ std::shared_ptr<const platform::RsaPublicKey> Orvanta::publicKey() {
 }
 
 Result<std::shared_ptr<const platform::RsaPublicKey>> Orvanta::readPublicKey() {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   if (_key) return _key;
   const std::string path = _platform.files().frameworkDirectory + "/publicKey.der";
   const auto bytes = readKeyFile(path);

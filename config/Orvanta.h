@@ -5,6 +5,7 @@
 
 #include "config/Platform.h"
 #include "interface/Values.h"
+#include "platform/core/Mutex.h"
 #include "platform/host/Digest.h"
 
 namespace orvanta {
@@ -18,7 +19,7 @@ class Orvanta {
 
   // framework.plist's "version", or "8.0" when it has none.
   const std::string& bundleVersion() const { return _version; }
-  // The resource publicKey.der; null when it is missing or no RSA key.
+  // The resource publicKey.der; null when it is missing or not an RSA key.
   std::shared_ptr<const platform::RsaPublicKey> publicKey();
   // The same, with the reason.
   Result<std::shared_ptr<const platform::RsaPublicKey>> readPublicKey();
@@ -29,8 +30,8 @@ class Orvanta {
  private:
   Platform& _platform;
   std::string _version;  // constant after construction
-  std::mutex _mutex;
-  std::shared_ptr<const platform::RsaPublicKey> _key;  // guarded by _mutex
+  platform::Mutex _mutex;
+  std::shared_ptr<const platform::RsaPublicKey> _key GUARDED_BY(_mutex);
 };
 
 }  // namespace orvanta

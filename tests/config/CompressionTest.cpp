@@ -12,7 +12,7 @@
 namespace orvanta {
 namespace {
 
-// None when the stream is damaged, incomplete or followed by more bytes.
+// Nullopt when the stream is damaged, incomplete or followed by more bytes.
 std::optional<std::string> inflated(const std::string& compressed) {
   auto content = collector::inflateBody(compressed, 2U << 20U);
   return content ? std::optional(std::move(*content)) : std::nullopt;

@@ -41,8 +41,9 @@ TEST(Conversions, makeIPv4SocketAddress) {
   };
   check("255.255.255.254", 0xfffffffe);
   check("0.0.0.0", 0);
-  for (const char* none : {"", "10.0.0", "10.0.0.256", "10.0.0.1 ", "::1", "host.kovalt", "127.0.0.1.127.0.0.1"}) {
-    check(none, 0xffffffff);
+  for (const char* unparsable :
+       {"", "10.0.0", "10.0.0.256", "10.0.0.1 ", "::1", "host.kovalt", "127.0.0.1.127.0.0.1"}) {
+    check(unparsable, 0xffffffff);
   }
 }
 
