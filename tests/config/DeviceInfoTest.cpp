@@ -5,7 +5,6 @@
 
 #include <set>
 
-#include "config/ConfigServices.h"
 #include "tests/support/LogCapture.h"
 #include "tests/support/TestPlatform.h"
 
@@ -51,46 +50,11 @@ TEST(DeviceInfo, persistentIdentifiersSurviveARestart) {
     EXPECT_EQ(afterRestart.text(key), made);
     EXPECT_EQ(getPersistentIdentifierForCustomClientIDSuffix(platform, first, second), made);
   }
-  // Whatever somebody else has stored there is the identifier.
+  // A value that another program has stored there is the identifier.
   ASSERT_TRUE(platform.get().defaults().set("uuid:a:b", "given by hand"));
   ASSERT_TRUE(platform.get().defaults().set("uuid:a:", 12));
   EXPECT_EQ(getPersistentIdentifierForCustomClientIDSuffix(platform, "a", "b"), "given by hand");
   EXPECT_EQ(getPersistentIdentifierForCustomClientIDSuffix(platform, "a", {}), "12");
-}
-
-TEST(Environment, isTheSettingOrFollowsTheBuild) {
-  const struct {
-    Value setting;  // null: none
-    bool internalBuild;
-    std::uint32_t expected;
-    std::string invalid = "";  // the value that the error line names; empty: no such line
-  } rows[] = {
-      {nullptr, false, 3},
-      {nullptr, true, 2},
-      {1, false, 1},
-      {4, true, 4},
-      {"4", false, 4},
-      {"release", false, 0},
-      {5, false, 2, "5"},
-      {std::int64_t{0x1'0000'0001}, false, 2, "4294967297"},  // not 1 with its upper half cut off
-      {-1, false, 2, "4294967295"},
-      {"-3", false, 2, "4294967293"},
-  };
-  for (const auto& row : rows) {
-    test::TestServices<ConfigServices> platform;
-    if (row.internalBuild) platform.device.release = "Internal";
-    ASSERT_TRUE(platform.get().defaults().set("environmentType", row.setting));
-    const test::LogCapture log;
-    std::vector<std::string> lines;
-    if (!row.invalid.empty()) lines.push_back("<3>userDefaultsEnvironment: Invalid environment type " + row.invalid);
-    lines.push_back("<6>userDefaultsEnvironment: Environment type " + std::to_string(row.expected));
-    // Decided once: neither a later setting nor another line.
-    for (int asked = 0; asked < 2; ++asked) {
-      EXPECT_EQ(static_cast<std::uint32_t>(platform.services.currentEnvironmentType()), row.expected);
-      EXPECT_EQ(log.lines(), lines);
-      ASSERT_TRUE(platform.get().defaults().set("environmentType", row.expected == 1 ? 4 : 1));
-    }
-  }
 }
 
 }  // namespace

@@ -5,13 +5,9 @@
 #include <unistd.h>
 
 #include <cstdlib>
-#include <future>
 #include <string>
-#include <tuple>
 
-#include "config/ConfigServices.h"
 #include "platform/host/Process.h"
-#include "tests/support/TestPlatform.h"
 
 namespace orvanta {
 namespace {
@@ -20,7 +16,7 @@ TEST(FileLocations, comeFromTheEnvironment) {
   // A variable's value, and what becomes of it where the service manager may give several paths, and elsewhere.
   const struct {
     const char* given;
-    std::optional<std::string> listed, single;  // none: the default
+    std::optional<std::string> listed, single;  // nullopt: the default
   } rows[] = {
       {"/srv/a", "/srv/a", "/srv/a"},
       {"/srv/a///", "/srv/a", "/srv/a"},
@@ -44,23 +40,6 @@ TEST(FileLocations, comeFromTheEnvironment) {
     EXPECT_EQ(locations.plugInsDirectory, single.value_or(defaults.plugInsDirectory));
     EXPECT_EQ(locations.caFile, single.value_or(""));
   }
-}
-
-TEST(ConfigServices, findEachFactOutOnceWhateverThreadAsks) {
-  test::TestServices<ConfigServices> device, another;
-  ConfigServices& services = device.services;
-  const auto ask = [&] {
-    return std::tuple(&services.storebagServerURL(), &services.orvanta(), services.storebagLane(),
-                      services.isInternalBuild());
-  };
-  auto other = std::async(std::launch::async, ask);
-  const auto mine = ask();
-  EXPECT_EQ(mine, other.get());
-  EXPECT_EQ(mine, ask());
-  device.device.release = another.device.release = "Internal";
-  EXPECT_FALSE(services.isInternalBuild());
-  EXPECT_TRUE(another.services.isInternalBuild());
-  EXPECT_NE(another.services.storebagLane(), services.storebagLane());
 }
 
 TEST(Process, nothingGetsTheNumberOfAClosedStandardDescriptor) {

@@ -74,31 +74,6 @@ TEST_F(StorebagFetchTest, asksTheServerForTheNameAndVersion) {
   }
 }
 
-TEST(StorebagServer, isTheOverrideOrFollowsTheBuildOnce) {
-  using Text = std::optional<std::string>;
-  const std::string local = "http://127.0.0.1:8080/x";
-  const std::tuple<Text, Text, std::string> rows[] = {
-      // setting, release type, address
-      {std::nullopt, std::nullopt, "https://bags.kovalt.com/bags/tamrel"},
-      {std::nullopt, "Internal", "https://internal-bags.kovalt.com/storebags/tamrel"},
-      {std::nullopt, "internal", "https://bags.kovalt.com/bags/tamrel"},
-      {std::nullopt, "Internal ", "https://bags.kovalt.com/bags/tamrel"},
-      {local, "Internal", local},
-      {local, std::nullopt, local},
-  };
-  for (const auto& [setting, releaseType, expected] : rows) {
-    TestServices<ConfigServices> platform;
-    platform.device.release = releaseType;
-    if (setting) ASSERT_TRUE(platform.get().defaults().set("orvanta_storebag_url", *setting));
-    EXPECT_EQ(platform.services.storebagServerURL(), expected);
-    EXPECT_EQ(platform.services.isInternalBuild(), releaseType == "Internal");
-    platform.device.release = releaseType == "Internal" ? "Beta" : "Internal";
-    EXPECT_EQ(platform.services.isInternalBuild(), releaseType == "Internal") << "asked again";
-    ASSERT_TRUE(platform.get().defaults().set("orvanta_storebag_url", "http://other.kovalt.com"));
-    EXPECT_EQ(platform.services.storebagServerURL(), expected) << "asked again";
-  }
-}
-
 TEST_F(StorebagFetchTest, asksConditionallyOnceItHoldsAStamp) {
   const std::string monday = "Mon, 02 Mar 2026 10:00:00 GMT";
   serve(signer.document(bag), {{"last-modified", monday}, {"Cache-Control", "max-age=600"}});
@@ -217,7 +192,7 @@ TEST_F(StorebagSelectionTest, takesTheEnvironmentsSection) {
     std::optional<int> environment;
     bool internalBuild;
     Dictionary bag;
-    const char* mark;  // null: none
+    const char* mark;  // null: no section
     std::vector<std::string> lines = {};
   } rows[] = {
       {1, false, all, "development"},
