@@ -1,6 +1,7 @@
 #include "config/Environment.h"
 
 #include "config/ConfigServices.h"
+#include "config/StorebagKeys.h"
 #include "config/UserDefaultKeys.h"
 #include "interface/OrvantaLogging.h"
 
@@ -31,19 +32,19 @@ EnvironmentType userDefaultsEnvironment(ConfigServices& services) {
   return type;
 }
 
-const char* environmentSectionName(EnvironmentType type) {
+std::string_view environmentSectionName(EnvironmentType type) {
   switch (type) {
     case EnvironmentType::development:
-      return "development";
+      return nameOf(StorebagKey::bagDevelopment);
     case EnvironmentType::internal:
-      return "kovalt_internal";
+      return nameOf(StorebagKey::bagInternal);
     case EnvironmentType::seed:
-      return "seed";
+      return nameOf(StorebagKey::bagSeed);
     case EnvironmentType::release:
-      return "release";
+      return nameOf(StorebagKey::bagRelease);
     case EnvironmentType::none:
       break;
   }
-  return nullptr;
+  return {};
 }
 }  // namespace orvanta

@@ -8,8 +8,11 @@
 #include <vector>
 
 #include "config/ClientTypes.h"
+#include "config/StorebagKeys.h"
+#include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/codec/PropertyList.h"
+#include "platform/core/Text.h"
 
 namespace orvanta {
 using platform::HttpResponse;
@@ -18,7 +21,6 @@ namespace {
 
 constexpr std::chrono::seconds kRequestTimeout{15};
 constexpr std::int32_t kLongestMaxAge = 86400;
-constexpr std::string_view kNameWithFallback = "confluo";
 
 std::span<const std::uint8_t> bytesOf(std::string_view text) {
   return {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()};
@@ -28,11 +30,7 @@ std::span<const std::uint8_t> bytesOf(std::string_view text) {
 std::optional<std::string> cacheControlOf(const HttpResponse& response) {
   std::optional<std::string> joined;
   for (const auto& [name, value] : response.headers) {
-    constexpr std::string_view kName = "cache-control";
-    const bool same = std::equal(name.begin(), name.end(), kName.begin(), kName.end(), [](char a, char b) {
-      return (a >= 'A' && a <= 'Z' ? static_cast<char>(a - 'A' + 'a') : a) == b;
-    });
-    if (!same) continue;
+    if (!platform::equalsIgnoringCase(name, "cache-control")) continue;
     joined = joined ? *joined + ", " + value : value;
   }
   return joined;
@@ -40,19 +38,21 @@ std::optional<std::string> cacheControlOf(const HttpResponse& response) {
 
 // What the conferencing client gets when no server can be reached.
 SharedDictionary fallbackBag() {
-  const Dictionary section{{"brisk", Dictionary{{"active", true}}}};
-  return std::make_shared<const Dictionary>(Dictionary{{"kovalt_internal", section},
-                                                       {"development", section},
-                                                       {"release", section},
-                                                       {"version", "1.0.0-Confluo-Fallback"},
-                                                       {"refresh_cycle", 3600}});
+  Dictionary section;
+  section.set(kOrvantaBackendBrisk, Dictionary{{"active", true}});
+  auto bag = std::make_shared<Dictionary>();
+  for (const StorebagKey key : {StorebagKey::bagInternal, StorebagKey::bagDevelopment, StorebagKey::bagRelease}) {
+    bag->set(nameOf(key), section);
+  }
+  bag->set(nameOf(StorebagKey::bagVersion), "1.0.0-Confluo-Fallback");
+  bag->set(nameOf(StorebagKey::bagRefreshCycle), 3600);
+  return bag;
 }
 
-// The bytes of a base64 text under `key`; none when the document has no such text or it does not decode.
-std::optional<std::vector<std::uint8_t>> decodedMember(const Dictionary& document, std::string_view key) {
-  const Value* member = document.find(key);
-  if (member == nullptr || member->string() == nullptr) return std::nullopt;
-  return platform::decodeBase64(*member->string());
+// The bytes of a base64 text under `key`; nullopt when the document has no such text or it does not decode.
+std::optional<std::vector<std::uint8_t>> decodedMember(const Dictionary& document, StorebagKey key) {
+  const std::string* member = document.text(nameOf(key));
+  return member == nullptr ? std::nullopt : platform::decodeBase64(*member);
 }
 
 // The inner bag of a downloaded document, once its signature has been verified; null for anything else.
@@ -61,15 +61,15 @@ SharedDictionary openDocument(Orvanta& orvanta, std::string_view body) {
   const auto document = platform::parsePropertyList(bytesOf(body));
   if (!document) ORVANTA_LOG(error, "fetchStorebagWithName: propertyListWithData error {}", document.error());
   const Dictionary* content = document ? document->dictionary() : nullptr;
-  if (content == nullptr || !content->contains("signature")) {
+  if (content == nullptr || !content->contains(nameOf(StorebagKey::documentSignature))) {
     ORVANTA_LOG(error, "fetchStorebagWithName: Signature is missing");
     return nullptr;
   }
   const auto key = orvanta.publicKey();
   if (!key) return nullptr;
-  const auto signature = decodedMember(*content, "signature");
+  const auto signature = decodedMember(*content, StorebagKey::documentSignature);
   if (!signature) return nullptr;
-  const auto bag = decodedMember(*content, "bag");
+  const auto bag = decodedMember(*content, StorebagKey::documentBag);
   if (!bag) return nullptr;
   if (!verifyStorebagSignature(*key, *bag, *signature)) {
     ORVANTA_LOG(error, "fetchStorebagWithName: Signature can not be verified, {}", fmt::ptr(key.get()));
@@ -123,7 +123,7 @@ SharedDictionary fetchStorebagWithName(ConfigServices& services, const std::stri
   if (!result.response) {
     ORVANTA_LOG(info, "fetchStorebagWithName: Error resolving with lookup server {}, sendSynchronousRequest error {}",
                 url, result.error);
-    if (name != kNameWithFallback) return nullptr;
+    if (name != kConfluoStorebag) return nullptr;
     ORVANTA_LOG(info, "fetchStorebagWithName: Loading default storebag '{}'", name);
     return fallbackBag();
   }
@@ -157,12 +157,10 @@ SharedDictionary fetchStorebagForEnvironmentAndClientType(ConfigServices& servic
     }
     return nullptr;
   }
-  const auto sectionNamed = [&](const char* sectionName) {
-    const Value* section = sectionName == nullptr ? nullptr : bag->find(sectionName);
-    return section == nullptr ? nullptr : section->dictionary();
-  };
   const EnvironmentType environment = services.currentEnvironmentType();
-  const char* sectionName = environmentSectionName(environment);
+  // An environment without a name has no section, whatever the bag holds.
+  const auto sectionNamed = [&](std::string_view name) { return name.empty() ? nullptr : bag->dictionary(name); };
+  std::string_view sectionName = environmentSectionName(environment);
   const Dictionary* section = sectionNamed(sectionName);
   if (section == nullptr && environment == EnvironmentType::seed) {
     ORVANTA_LOG(warning, "fetchStorebagForEnvironmentAndClientType: Seed section is missing in the storebag.");
@@ -173,12 +171,12 @@ SharedDictionary fetchStorebagForEnvironmentAndClientType(ConfigServices& servic
     ORVANTA_LOG(error,
                 "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type {} with {} "
                 "environment",
-                clientType, sectionName == nullptr ? "(null)" : sectionName);
+                clientType, sectionName.empty() ? "(null)" : sectionName);
     return nullptr;
   }
-  const Value* version = bag->find("version");
+  const Value* version = bag->find(nameOf(StorebagKey::bagVersion));
   fetch.version = version == nullptr ? std::string() : version->description();
-  if (const Value* refreshCycle = bag->find("refresh_cycle")) {
+  if (const Value* refreshCycle = bag->find(nameOf(StorebagKey::bagRefreshCycle))) {
     constexpr std::int64_t kLowest = std::numeric_limits<std::int32_t>::min();
     fetch.maxAge =
         static_cast<std::int32_t>(std::clamp<std::int64_t>(refreshCycle->integerValue(), kLowest, kLongestMaxAge));

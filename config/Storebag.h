@@ -15,7 +15,7 @@ namespace orvanta {
 
 // The signed remote configuration: fetching, verifying, choosing a section. See docs/storebag.md.
 
-// The text of a key of the daemon's user defaults; none when it has no value.
+// The text of a key of the daemon's user defaults; nullopt when it has no value.
 std::optional<std::string> userDefaultStringForKey(Platform& platform, std::string_view key);
 
 bool verifyStorebagSignature(const platform::RsaPublicKey& key, std::span<const std::uint8_t> bag,

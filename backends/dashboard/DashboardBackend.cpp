@@ -8,6 +8,7 @@
 
 #include "backends/dashboard/DashboardDatagram.h"
 #include "config/Conversions.h"
+#include "config/StorebagKeys.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/codec/PropertyList.h"
 #include "platform/core/Utf8.h"
@@ -24,15 +25,14 @@ constexpr std::size_t kReceiveBuffer = 1088;
 constexpr int kReadsPerTurn = 256;
 constexpr milliseconds kFloodPause{2};
 
-std::optional<std::string> textAt(const Dictionary& dictionary, std::string_view key) {
-  const Value* value = dictionary.find(key);
-  const std::string* text = value == nullptr ? nullptr : value->string();
+std::optional<std::string> textAt(const Dictionary& dictionary, StorebagKey key) {
+  const std::string* text = dictionary.text(nameOf(key));
   return text == nullptr ? std::nullopt : std::optional(*text);
 }
 
 // Null when the key is absent.
-const Value* valueAt(const SharedDictionary& dictionary, std::string_view key) {
-  const Value* value = dictionary ? dictionary->find(key) : nullptr;
+const Value* valueAt(const SharedDictionary& dictionary, StorebagKey key) {
+  const Value* value = dictionary ? dictionary->find(nameOf(key)) : nullptr;
   return value == nullptr || value->isNull() ? nullptr : value;
 }
 
@@ -54,8 +54,8 @@ Result<std::vector<std::uint8_t>> archive(const SharedArray& logData) {
 
 std::shared_ptr<DashboardBackend> DashboardBackend::create(BackendServices& services, std::string name,
                                                            SharedDictionary profile, const BackendSetup& setup) {
-  const Value* ip = valueAt(profile, "ip");
-  const Value* port = valueAt(profile, "port");
+  const Value* ip = valueAt(profile, StorebagKey::dashboardIP);
+  const Value* port = valueAt(profile, StorebagKey::dashboardPort);
   std::optional<std::string> serverIP;
   if (ip != nullptr) serverIP = ip->description();
   return create(services, std::move(name), std::move(profile), std::move(serverIP),
@@ -74,12 +74,12 @@ std::shared_ptr<DashboardBackend> DashboardBackend::create(BackendServices& serv
                                                            std::optional<std::string> serverIP,
                                                            std::uint16_t serverPort, const BackendSetup& setup) {
   if (profile) {
-    const Value* ip = valueAt(profile, "ip");
+    const Value* ip = valueAt(profile, StorebagKey::dashboardIP);
     if (ip == nullptr) {
       ORVANTA_LOG(error, "DashboardBackend(initWithName): can't resolve server IP");
       return nullptr;
     }
-    const Value* port = valueAt(profile, "port");
+    const Value* port = valueAt(profile, StorebagKey::dashboardPort);
     if (port == nullptr) {
       ORVANTA_LOG(error, "DashboardBackend(initWithName): can't resolve server port");
       return nullptr;
@@ -110,9 +110,9 @@ DashboardBackend::~DashboardBackend() = default;
 bool DashboardBackend::setUp(const std::optional<std::string>& serverIP, std::uint16_t serverPort) {
   if (profile()) {
     _usingProfile = true;
-    setDisplayURL(textAt(*profile(), "display_url"));
-    _postURL = textAt(*profile(), "post_url");
-    if (const Value* reliable = valueAt(profile(), "reliable")) {
+    setDisplayURL(textAt(*profile(), StorebagKey::dashboardDisplayURL));
+    _postURL = textAt(*profile(), StorebagKey::dashboardPostURL);
+    if (const Value* reliable = valueAt(profile(), StorebagKey::dashboardReliable)) {
       useReliableUDP();
       setPeriod(*reliable);
     }

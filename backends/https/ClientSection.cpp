@@ -11,8 +11,7 @@ bool readsAsNumber(const Value& value) {
   return value.isNumber() || value.string() != nullptr;
 }
 
-// The problem with a value, or null.
-using Check = const char* (*)(const Value&);
+// The checks give the problem with a value, or null.
 
 const char* checkTextsOrNumbers(const Value& value) {
   const Array* list = value.array();
@@ -31,35 +30,34 @@ const char* checkCountryThresholds(const Value& value) {
   for (const Value& element : *list) {
     const Dictionary* entry = element.dictionary();
     if (entry == nullptr) return "holds something that is no dictionary";
-    const Value* countries = entry->find("country");
+    const Value* countries = valueUnder(*entry, StorebagKey::thresholdCountry);
     if (countries != nullptr && checkTextsOrNumbers(*countries) != nullptr) {
       return "has a \"country\" that is no list of country codes";
     }
-    const Value* threshold = entry->find("threshold");
+    const Value* threshold = valueUnder(*entry, StorebagKey::threshold);
     if (threshold != nullptr && !readsAsNumber(*threshold)) return "has a \"threshold\" that is no number";
   }
   return nullptr;
 }
 
-struct KeyCheck {
-  const char* key;
-  Check check;
-};
+// The problem with the value of a restricting key; null for the filters, which say where their problem is.
+const char* check(const Value& value, StorebagType type) {
+  switch (type) {
+    case StorebagType::texts:
+    case StorebagType::categories:
+      return checkTextsOrNumbers(value);
+    case StorebagType::textOrNumber:
+      return checkNumber(value);
+    case StorebagType::countryThresholds:
+      return checkCountryThresholds(value);
+    default:
+      return nullptr;
+  }
+}
 
-constexpr KeyCheck kKeyChecks[] = {
-    {"locale_whitelist", checkTextsOrNumbers},
-    {"device_whitelist", checkTextsOrNumbers},
-    {"device_blacklist", checkTextsOrNumbers},
-    {"sampling_threshold", checkNumber},
-    {"per_country_sampling_thresholds", checkCountryThresholds},
-    {"override_sampling", checkNumber},
-    {"event_whitelist", checkTextsOrNumbers},
-    {"event_blacklist", checkTextsOrNumbers},
-};
-
-// The pieces of a comma-separated text; empty when the key is absent. False when it is no text.
-bool readPieces(const Dictionary& section, std::string_view key, TextList& pieces) {
-  const Value* value = section.find(key);
+// The pieces of a comma-separated text; empty when the key is absent. False when it is not a text.
+bool readPieces(const Dictionary& section, StorebagKey key, TextList& pieces) {
+  const Value* value = valueUnder(section, key);
   if (value == nullptr) return true;
   if (value->string() == nullptr) return false;
   pieces = splitAtCommas(*value->string());
@@ -69,60 +67,65 @@ bool readPieces(const Dictionary& section, std::string_view key, TextList& piece
 }  // namespace
 
 const Array* clientSections(const Dictionary& profile) {
-  const Value* clients = profile.find("clients");
-  return clients == nullptr ? nullptr : clients->array();
+  return profile.array(nameOf(StorebagKey::httpsClients));
 }
 
 bool matchClientNameAndServiceID(const Dictionary& section, const std::optional<std::string>& clientName,
                                  const std::optional<std::string>& serviceID) {
   TextList clients;
   TextList services;
-  return readPieces(section, "client", clients) && readPieces(section, "service", services) &&
+  return readPieces(section, StorebagKey::client, clients) && readPieces(section, StorebagKey::service, services) &&
          matchExactStringWithList(clients, clientName, true) && matchStringWithList(services, serviceID, true);
 }
 
 bool isFrameworkEnabledForClient(const Dictionary& section, const OrvantaBackend::SelfVersion& ownVersion) {
-  const Value* since = section.find("enabledSince");
+  const Value* since = valueUnder(section, StorebagKey::enabledSince);
   if (since == nullptr) return true;
   return readsAsNumber(*since) && ownVersion >= OrvantaBackend::SelfVersion::parse(since->description());
 }
 
 std::optional<MalformedKey> findMalformedKey(const Dictionary& section) {
-  for (const KeyCheck& row : kKeyChecks) {
-    const Value* value = section.find(row.key);
+  for (const StorebagKeyInfo& row : storebagKeys()) {
+    if (row.place != StorebagPlace::clientSection || row.wrongType != WrongType::reportsNothing) continue;
+    const Value* value = section.find(row.name);
     if (value == nullptr) continue;
-    if (const char* problem = row.check(*value)) return MalformedKey{row.key, problem};
+    if (const char* problem = check(*value, row.type)) return MalformedKey{std::string(row.name), problem};
   }
-  if (const Value* filters = section.find("filters")) {
-    if (filters->array() == nullptr) return MalformedKey{"filters", "is no list"};
+  // Last, since building the filters is the only check that costs anything.
+  if (const Value* filters = valueUnder(section, StorebagKey::filters)) {
+    const std::string key(nameOf(StorebagKey::filters));
+    if (filters->array() == nullptr) return MalformedKey{key, "is no list"};
     const auto made = EventFilters::createFiltersFromArray(*filters->array());
-    if (!made) return MalformedKey{"filters", "does not hold: " + made.error()};
+    if (!made) return MalformedKey{key, "does not hold: " + made.error()};
   }
   return std::nullopt;
 }
 
-const std::string* textUnder(const Dictionary& dictionary, std::string_view key) {
-  const Value* value = dictionary.find(key);
-  return value == nullptr ? nullptr : value->string();
+const Value* valueUnder(const Dictionary& dictionary, StorebagKey key) {
+  return dictionary.find(nameOf(key));
 }
 
-std::optional<double> realUnder(const Dictionary& dictionary, std::string_view key) {
-  const Value* value = dictionary.find(key);
+const std::string* textUnder(const Dictionary& dictionary, StorebagKey key) {
+  return dictionary.text(nameOf(key));
+}
+
+std::optional<double> realUnder(const Dictionary& dictionary, StorebagKey key) {
+  const Value* value = valueUnder(dictionary, key);
   if (value == nullptr || !readsAsNumber(*value)) return std::nullopt;
   return value->doubleValue();
 }
 
-std::optional<std::int32_t> intUnder(const Dictionary& dictionary, std::string_view key) {
-  const Value* value = dictionary.find(key);
+std::optional<std::int32_t> intUnder(const Dictionary& dictionary, StorebagKey key) {
+  const Value* value = valueUnder(dictionary, key);
   if (value == nullptr || !readsAsNumber(*value)) return std::nullopt;
   return static_cast<std::int32_t>(value->integerValue());
 }
 
-TextList textsUnder(const Dictionary& dictionary, std::string_view key) {
+TextList textsUnder(const Dictionary& dictionary, StorebagKey key) {
   TextList texts;
-  const Value* value = dictionary.find(key);
-  if (value == nullptr || value->array() == nullptr) return texts;
-  for (const Value& element : *value->array()) texts.push_back(element.description());
+  const Array* list = dictionary.array(nameOf(key));
+  if (list == nullptr) return texts;
+  for (const Value& element : *list) texts.push_back(element.description());
   return texts;
 }
 

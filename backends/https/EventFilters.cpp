@@ -9,6 +9,7 @@
 #include "backends/https/EventField.h"
 #include "backends/https/ReservedKeys.h"
 #include "backends/https/StringMatching.h"
+#include "config/StorebagKeys.h"
 
 namespace orvanta {
 namespace {
@@ -18,8 +19,8 @@ bool isAscii(std::string_view text) {
 }
 
 // A number, or a text, which reads as its leading number. False for other types.
-bool readNumber(const Dictionary& definition, std::string_view key, std::int32_t& number) {
-  const Value* value = definition.find(key);
+bool readNumber(const Dictionary& definition, StorebagKey key, std::int32_t& number) {
+  const Value* value = definition.find(nameOf(key));
   if (value == nullptr) return true;
   if (!value->isNumber() && value->string() == nullptr) return false;
   number = static_cast<std::int32_t>(value->integerValue());
@@ -41,15 +42,17 @@ Result<EventFilters> EventFilters::createFiltersFromArray(const Array& definitio
     const Dictionary* definition = definitions[i].dictionary();
     if (definition == nullptr) return refuse("is no dictionary");
     FilterRule rule;
-    if (!readNumber(*definition, "method", rule.method)) return refuse("has a \"method\" that is no number");
-    if (!readNumber(*definition, "status", rule.status)) return refuse("has a \"status\" that is no number");
-    if (const Value* key = definition->find("key")) {
+    if (!readNumber(*definition, StorebagKey::filterMethod, rule.method))
+      return refuse("has a \"method\" that is no number");
+    if (!readNumber(*definition, StorebagKey::filterStatus, rule.status))
+      return refuse("has a \"status\" that is no number");
+    if (const Value* key = definition->find(nameOf(StorebagKey::filterKey))) {
       if (key->string() == nullptr) return refuse("has a \"key\" that is no text");
       rule.key = *key->string();
     }
-    if (const Value* action = definition->find("action"); action != nullptr && action->string() != nullptr) {
-      if (*action->string() == "remove") rule.action = FilterRule::Action::remove;
-      if (*action->string() == "sha256") rule.action = FilterRule::Action::sha256;
+    if (const std::string* action = definition->text(nameOf(StorebagKey::filterAction))) {
+      if (*action == "remove") rule.action = FilterRule::Action::remove;
+      if (*action == "sha256") rule.action = FilterRule::Action::sha256;
     }
     if (rule.key) {
       // Letters beyond ASCII may change their length with their case.

@@ -64,7 +64,7 @@ HTTPSPostBackend::HTTPSPostBackend(BackendServices& services, std::string name, 
     ORVANTA_LOG(debug, "HTTPSPostBackend(initWithName): Using user default '{}' for realtimePostURL",
                 *_realtimePostURL);
   }
-  if (const std::string* url = textUnder(*this->profile(), "display_url")) setDisplayURL(*url);
+  if (const std::string* url = textUnder(*this->profile(), StorebagKey::httpsDisplayURL)) setDisplayURL(*url);
 }
 
 void HTTPSPostBackend::setUserInfoDict(SharedDictionary userInfo) {

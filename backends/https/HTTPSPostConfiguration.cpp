@@ -113,7 +113,7 @@ bool HTTPSPostBackend::updatePostLink(const Dictionary& section) {
   std::optional<std::string> postURL = this->postURL();
   if (!_useDefaultPostURL || !postURL) {
     _useDefaultPostURL = false;
-    if (const std::string* url = textUnder(section, "post_url")) {
+    if (const std::string* url = textUnder(section, StorebagKey::postURL)) {
       postURL = *url;
       setPostURL(*url);
       ORVANTA_LOG(debug, "HTTPSPostBackend(updatePostLink): Storebag '{}' for postURL", *url);
@@ -122,7 +122,7 @@ bool HTTPSPostBackend::updatePostLink(const Dictionary& section) {
   }
   if (!_useDefaultRealtimePostURL || !_realtimePostURL) {
     _useDefaultRealtimePostURL = false;
-    if (const std::string* url = textUnder(section, "realtime_post_url")) {
+    if (const std::string* url = textUnder(section, StorebagKey::realtimePostURL)) {
       _realtimePostURL = *url;
       ORVANTA_LOG(debug, "HTTPSPostBackend(updatePostLink): Storebag '{}' for realtimePostURL", *url);
     } else {

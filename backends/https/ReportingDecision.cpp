@@ -18,7 +18,8 @@ void takeExpedite(ReportingDecision& decision, const Array& sections, const Repo
   for (const Value& element : sections) {
     const Dictionary* section = element.dictionary();
     if (section == nullptr || !isForClient(*section, facts)) continue;
-    if (const auto expedite = realUnder(*section, "expedite")) decision.settings.batchEvents = *expedite == 0;
+    if (const auto expedite = realUnder(*section, StorebagKey::expedite))
+      decision.settings.batchEvents = *expedite == 0;
     return;
   }
 }
@@ -26,8 +27,8 @@ void takeExpedite(ReportingDecision& decision, const Array& sections, const Repo
 void takeCounters(ReportingDecision& decision, const Dictionary* section) {
   ReportingSettings::Counters counters;
   if (section != nullptr) {
-    counters.eventThreshold = intUnder(*section, "event_threshold").value_or(0);
-    counters.extrasOnInternal = intUnder(*section, "extras_on_internal").value_or(0);
+    counters.eventThreshold = intUnder(*section, StorebagKey::eventThreshold).value_or(0);
+    counters.extrasOnInternal = intUnder(*section, StorebagKey::extrasOnInternal).value_or(0);
   }
   decision.settings.counters = counters;
 }
@@ -38,7 +39,7 @@ void reportWithoutUserInfo(ReportingDecision& decision, const Array& sections, c
     const Dictionary* section = element.dictionary();
     if (section == nullptr) continue;
     decision.settings.linkSections.push_back(section);
-    if (facts.postURLFixed || textUnder(*section, "post_url") == nullptr) continue;
+    if (facts.postURLFixed || textUnder(*section, StorebagKey::postURL) == nullptr) continue;
     source = section;
     break;
   }
@@ -61,28 +62,28 @@ const Dictionary* chooseSection(ReportingReason& reason, const Array& sections, 
     if (reason.section) continue;
     reason.test = ReportingTest::versionTooLow;
     reason.section = i;
-    reason.subject = section->find("enabledSince")->description();
+    reason.subject = valueUnder(*section, StorebagKey::enabledSince)->description();
   }
   return nullptr;
 }
 
 // A list test that refuses says so with the text and the list that it looked at.
-bool refuseByList(ReportingReason& reason, ReportingTest test, const Dictionary& section, std::string_view key,
+bool refuseByList(ReportingReason& reason, ReportingTest test, const Dictionary& section, StorebagKey key,
                   const std::optional<std::string>& text) {
   reason.test = test;
   reason.subject = text;
-  if (const Value* list = section.find(key)) reason.list = list->description();
+  if (const Value* list = valueUnder(section, key)) reason.list = list->description();
   return false;
 }
 
 // Consent, country, device and filters. False, with the reason, when one of them refuses.
 bool passesTests(ReportingDecision& decision, const Dictionary& section, const ReportingFacts& facts) {
   ReportingReason& reason = decision.reason;
-  // Consent is overridden by a number alone: a value that makes no sense overrides nothing.
-  const Value* override = section.find("override_dnu");
-  if (override != nullptr && override->isNumber()) reason.overrideDNU = *intUnder(section, "override_dnu");
+  // Consent is overridden by a number alone: a value of another type overrides nothing.
+  const Value* override = valueUnder(section, StorebagKey::overrideDNU);
+  if (override != nullptr && override->isNumber()) reason.overrideDNU = *intUnder(section, StorebagKey::overrideDNU);
   // Compared unrounded: 1.5 is not the 1 that overrides.
-  if (reason.overrideDNU == 1 && realUnder(section, "override_dnu") == 1.0) {
+  if (reason.overrideDNU == 1 && realUnder(section, StorebagKey::overrideDNU) == 1.0) {
     decision.settings.dnuType =
         facts.consentGiven ? ClientIdentity::kConsentOverriddenGiven : ClientIdentity::kConsentOverriddenNotGiven;
   } else {
@@ -91,16 +92,19 @@ bool passesTests(ReportingDecision& decision, const Dictionary& section, const R
     if (!facts.consentGiven) return false;
   }
   // An unknown country passes any list that has an entry; without one nobody reports.
-  if (!matchStringWithList(textsUnder(section, "locale_whitelist"), facts.countryCode, false)) {
-    return refuseByList(reason, ReportingTest::countryNotListed, section, "locale_whitelist", facts.countryCode);
+  if (!matchStringWithList(textsUnder(section, StorebagKey::localeWhitelist), facts.countryCode, false)) {
+    return refuseByList(reason, ReportingTest::countryNotListed, section, StorebagKey::localeWhitelist,
+                        facts.countryCode);
   }
-  if (!matchStringWithList(textsUnder(section, "device_whitelist"), facts.productFamily, true)) {
-    return refuseByList(reason, ReportingTest::familyNotListed, section, "device_whitelist", facts.productFamily);
+  if (!matchStringWithList(textsUnder(section, StorebagKey::deviceWhitelist), facts.productFamily, true)) {
+    return refuseByList(reason, ReportingTest::familyNotListed, section, StorebagKey::deviceWhitelist,
+                        facts.productFamily);
   }
-  if (matchStringWithList(textsUnder(section, "device_blacklist"), facts.productType, false)) {
-    return refuseByList(reason, ReportingTest::modelBlacklisted, section, "device_blacklist", facts.productType);
+  if (matchStringWithList(textsUnder(section, StorebagKey::deviceBlacklist), facts.productType, false)) {
+    return refuseByList(reason, ReportingTest::modelBlacklisted, section, StorebagKey::deviceBlacklist,
+                        facts.productType);
   }
-  const Value* filters = section.find("filters");
+  const Value* filters = valueUnder(section, StorebagKey::filters);
   reason.test = ReportingTest::filtersMissing;
   if (filters == nullptr) return false;
   // An empty list keeps the filters of an earlier evaluation.
@@ -112,13 +116,13 @@ bool passesTests(ReportingDecision& decision, const Dictionary& section, const R
 
 void takeSampling(ReportingDecision& decision, const Dictionary& section, const ReportingFacts& facts) {
   auto& sampling = decision.settings.sampling.emplace();
-  sampling.threshold = realUnder(section, "sampling_threshold");
-  const Value* byCountry = section.find("per_country_sampling_thresholds");
+  sampling.threshold = realUnder(section, StorebagKey::samplingThreshold);
+  const Value* byCountry = valueUnder(section, StorebagKey::perCountrySamplingThresholds);
   if (byCountry == nullptr || !facts.countryCode) return;
   for (const Value& element : *byCountry->array()) {
-    const TextList countries = textsUnder(*element.dictionary(), "country");
+    const TextList countries = textsUnder(*element.dictionary(), StorebagKey::thresholdCountry);
     if (std::find(countries.begin(), countries.end(), *facts.countryCode) == countries.end()) continue;
-    const auto threshold = realUnder(*element.dictionary(), "threshold");
+    const auto threshold = realUnder(*element.dictionary(), StorebagKey::threshold);
     sampling.changedByCountry =
         ReportingSettings::CountryThreshold{*facts.countryCode, sampling.threshold.value_or(0), threshold.value_or(0)};
     sampling.threshold = threshold;
@@ -138,7 +142,7 @@ void decideBySampling(ReportingDecision& decision, const Dictionary& section, do
     return conclude(kBackendDisabled, ReportingTest::noSamplingThreshold);
   }
   if (factor <= *reason.threshold) return conclude(kBackendEnabled, ReportingTest::sampledIn);
-  reason.overrideSampling = realUnder(section, "override_sampling");
+  reason.overrideSampling = realUnder(section, StorebagKey::overrideSampling);
   decision.settings.overrideSampling.emplace().value = reason.overrideSampling;
   if (!reason.overrideSampling || factor <= *reason.overrideSampling) {
     return conclude(kBackendHeld, ReportingTest::heldBySampling);
@@ -146,8 +150,8 @@ void decideBySampling(ReportingDecision& decision, const Dictionary& section, do
   conclude(kBackendDisabled, ReportingTest::disabledBySampling);
 }
 
-std::optional<ReportingSettings::EventList> eventList(const Dictionary& section, std::string_view key) {
-  const Value* list = section.find(key);
+std::optional<ReportingSettings::EventList> eventList(const Dictionary& section, StorebagKey key) {
+  const Value* list = valueUnder(section, key);
   if (list == nullptr) return std::nullopt;
   ReportingSettings::EventList taken;
   taken.source = list;
@@ -185,10 +189,10 @@ ReportingDecision evaluate(const Dictionary& profile, const ReportingFacts& fact
   takeSampling(decision, *section, facts);
   decideBySampling(decision, *section, facts.samplingFactor);
   takeCounters(decision, section);
-  decision.settings.customClientID = section->contains("custom_clientId");
+  decision.settings.customClientID = valueUnder(*section, StorebagKey::customClientID) != nullptr;
   decision.settings.linkSections.push_back(section);
-  decision.settings.eventWhitelist = eventList(*section, "event_whitelist");
-  decision.settings.eventBlacklist = eventList(*section, "event_blacklist");
+  decision.settings.eventWhitelist = eventList(*section, StorebagKey::eventWhitelist);
+  decision.settings.eventBlacklist = eventList(*section, StorebagKey::eventBlacklist);
   return decision;
 }
 

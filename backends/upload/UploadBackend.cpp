@@ -5,6 +5,7 @@
 #include "backends/UploadBudget.h"
 #include "backends/upload/UploadURL.h"
 #include "config/Compression.h"
+#include "config/StorebagKeys.h"
 #include "interface/OrvantaLogging.h"
 #include "interface/WireLimits.h"
 #include "platform/core/Utf8.h"
@@ -18,9 +19,8 @@ std::uint64_t bytesToRead(std::uint64_t size) {
   return size > 0 ? size : kMaximumUnsizedUploadBytes + 1;
 }
 
-std::optional<std::string> textAt(const SharedDictionary& dictionary, std::string_view key) {
-  const Value* value = dictionary ? dictionary->find(key) : nullptr;
-  const std::string* text = value == nullptr ? nullptr : value->string();
+std::optional<std::string> textAt(const SharedDictionary& dictionary, StorebagKey key) {
+  const std::string* text = dictionary ? dictionary->text(nameOf(key)) : nullptr;
   return text == nullptr ? std::nullopt : std::optional(*text);
 }
 
@@ -44,7 +44,7 @@ std::optional<std::string> compressedContent(const platform::ExtensionHandle& ha
 
 std::shared_ptr<UploadBackend> UploadBackend::create(BackendServices& services, std::string name,
                                                      SharedDictionary profile, const BackendSetup& setup) {
-  std::optional<std::string> url = textAt(profile, "post_url");
+  std::optional<std::string> url = textAt(profile, StorebagKey::uploadPostURL);
   if (!url) {
     ORVANTA_LOG(error, "UploadBackend(initWithName): can't resolve upload post URL.");
     return nullptr;
@@ -57,7 +57,7 @@ std::shared_ptr<UploadBackend> UploadBackend::create(BackendServices& services, 
 UploadBackend::UploadBackend(Made, BackendServices& services, std::string name, SharedDictionary profile,
                              const BackendSetup& setup)
     : OrvantaBackend(services, std::move(name), std::move(profile), setup) {
-  setDisplayURL(textAt(this->profile(), "display_url"));
+  setDisplayURL(textAt(this->profile(), StorebagKey::uploadDisplayURL));
 }
 
 std::optional<std::string> UploadBackend::uploadURL() const {
