@@ -12,8 +12,8 @@ namespace orvanta {
 namespace {
 
 template <class Backend>
-std::shared_ptr<OrvantaBackend> create(BackendServices& services, const std::string& name,
-                                       const SharedDictionary& profile, const BackendSetup& setup) {
+std::shared_ptr<OrvantaBackend> create(BackendServices& services, const std::string& name, const SharedDictionary& profile,
+                                       const BackendSetup& setup) {
   return Backend::create(services, name, profile, setup);
 }
 
@@ -24,16 +24,20 @@ bool supportsBrisk(Platform& platform) {
 
 struct BackendClass {
   std::string_view name;
-  // Null where the device does not support the class.
+  // Returns null where the profile lacks something.
   std::shared_ptr<OrvantaBackend> (*create)(BackendServices& services, const std::string& name,
                                             const SharedDictionary& profile, const BackendSetup& setup);
+  BackendRules rules;
   bool (*isSupported)(Platform& platform) = nullptr;  // null: everywhere
 };
 
 constexpr BackendClass kBackendClasses[] = {
-    {kOrvantaBackendDashboard, create<DashboardBackend>}, {kOrvantaBackendUploadServer, create<UploadBackend>},
-    {kOrvantaBackendHTTPPost, create<HTTPSPostBackend>},  {kOrvantaBackendHTTPPost2, create<HTTPSPostBackend>},
-    {kOrvantaBackendVoltmark, create<VoltmarkBackend>},   {kOrvantaBackendBrisk, create<BriskBackend>, supportsBrisk},
+    {kOrvantaBackendDashboard, create<DashboardBackend>, {ReplyRole::fallback, 3}},
+    {kOrvantaBackendUploadServer, create<UploadBackend>, {}},
+    {kOrvantaBackendHTTPPost, create<HTTPSPostBackend>, {ReplyRole::reply, 1}},
+    {kOrvantaBackendHTTPPost2, create<HTTPSPostBackend>, {ReplyRole::reply, 2}},
+    {kOrvantaBackendVoltmark, create<VoltmarkBackend>, {}},
+    {kOrvantaBackendBrisk, create<BriskBackend>, {}, supportsBrisk},
 };
 
 }  // namespace
@@ -48,6 +52,13 @@ std::shared_ptr<OrvantaBackend> newBackendWithName(BackendServices& services, co
   }
   ORVANTA_LOG(error, "OrvantaBackend(newBackendWithName): {}", name);
   return nullptr;
+}
+
+BackendRules rulesForBackend(std::string_view name) {
+  for (const BackendClass& row : kBackendClasses) {
+    if (row.name == name) return row.rules;
+  }
+  return {};
 }
 
 }  // namespace orvanta

@@ -1,9 +1,9 @@
 #pragma once
 
 #include <memory>
-#include <mutex>
 
 #include "backends/BackendServices.h"
+#include "platform/core/Mutex.h"
 #include "platform/listen/Entitlements.h"
 
 namespace orvanta {
@@ -24,7 +24,7 @@ struct DaemonServices {
   Platform& platform;
   BackendServices backends;
   // One for all flushes. Shared with the requests, since the pool may drop the last completions only when it goes.
-  const std::shared_ptr<std::mutex> flushLock = std::make_shared<std::mutex>();
+  const std::shared_ptr<platform::Mutex> flushLock = std::make_shared<platform::Mutex>();
   // Who may connect.
   platform::Entitlements entitlements;
 };

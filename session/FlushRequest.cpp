@@ -13,21 +13,21 @@ FlushRequest::FlushRequest(DaemonServices& services, std::int32_t backendCount, 
       _pending(backendCount),
       _completion(std::move(completion)) {}
 
-FlushCompletion FlushRequest::completionFor(std::string key, std::string backendName) {
-  return [self = shared_from_this(), key = std::move(key), name = std::move(backendName)](
-             std::optional<std::string> result, std::optional<OrvantaError> error) {
-    self->finished(key, name, std::move(result), std::move(error));
+FlushCompletion FlushRequest::completionFor(std::string backendName) {
+  return [self = shared_from_this(), name = std::move(backendName)](std::optional<std::string> result,
+                                                                    std::optional<OrvantaError> error) {
+    self->finished(name, std::move(result), std::move(error));
   };
 }
 
-void FlushRequest::finished(const std::string& key, const std::string& backendName, std::optional<std::string> result,
+void FlushRequest::finished(const std::string& backendName, std::optional<std::string> result,
                             std::optional<OrvantaError> error) {
   ORVANTA_LOG(debug, "internalFlushMessagesWithCompletion: {}", backendName);
-  if (result) writeToLogFile(_platform, fmt::format("[{} -> flushMessages] {}", key, *result));
+  if (result) writeToLogFile(_platform, fmt::format("[{} -> flushMessages] {}", backendName, *result));
 
   FlushReply completion;
   {
-    const std::lock_guard lock(*_lock);
+    const platform::MutexLock lock(*_lock);
     --_pending;
     if (!_completion || (!error && _pending > 0)) return;
     completion = std::move(_completion);

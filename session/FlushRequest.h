@@ -2,12 +2,12 @@
 
 #include <cstdint>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 
 #include "backends/OrvantaBackend.h"
 #include "interface/ClientSessionInterface.h"
+#include "platform/core/Mutex.h"
 #include "session/DaemonServices.h"
 
 namespace orvanta {
@@ -21,17 +21,16 @@ class FlushRequest : public std::enable_shared_from_this<FlushRequest> {
  public:
   FlushRequest(DaemonServices& services, std::int32_t backendCount, FlushReply completion);
 
-  // The completion for one backend; `key` is its name in the session's set.
-  FlushCompletion completionFor(std::string key, std::string backendName);
+  // The completion for one backend.
+  FlushCompletion completionFor(std::string backendName);
 
  private:
-  void finished(const std::string& key, const std::string& backendName, std::optional<std::string> result,
-                std::optional<OrvantaError> error);
+  void finished(const std::string& backendName, std::optional<std::string> result, std::optional<OrvantaError> error);
 
   Platform& _platform;
-  const std::shared_ptr<std::mutex> _lock;  // DaemonServices::flushLock
-  std::int32_t _pending;                    // guarded by _lock
-  FlushReply _completion;                   // guarded by _lock; empty once called
+  const std::shared_ptr<platform::Mutex> _lock;  // DaemonServices::flushLock
+  std::int32_t _pending GUARDED_BY(*_lock);
+  FlushReply _completion GUARDED_BY(*_lock);  // empty once called
 };
 
 }  // namespace orvanta

@@ -1,20 +1,18 @@
 #pragma once
 
-#include <atomic>
 #include <cstdint>
 #include <memory>
 #include <mutex>
 #include <optional>
 #include <string>
-#include <string_view>
 
 #include "backends/Event.h"
 #include "config/DeviceInfo.h"
+#include "session/DaemonServices.h"
 #include "interface/ClientSessionInterface.h"
 #include "platform/ipc/Connection.h"
+#include "session/Aggregation.h"
 #include "session/BackendSet.h"
-#include "session/ClientReplyProxy.h"
-#include "session/DaemonServices.h"
 #include "session/OrvantadSessionDelegate.h"
 #include "session/SessionInfoRecord.h"
 
@@ -23,12 +21,12 @@ namespace orvanta {
 // The daemon's side of one client connection: holds the session's description and its backends and carries out every
 // call of the client.
 //
-// Owned by the agent's session list and by the connection's handler. Every operation runs on the connection's queue,
-// one at a time, unless it says otherwise. end() is the last job there; after it the session can be dropped on any
-// thread. Failures are logged and answered as the operations describe; nothing here throws.
+// Owned by the agent's session list and by the connection's handler. Every operation runs on the session's queue, which
+// is its connection's, one at a time, unless it says otherwise. end() is the last job there; after it the session can
+// be dropped on any thread. Failures are logged and answered as the operations describe; nothing here throws.
 class OrvantadSession final : public ClientSessionInterface, public std::enable_shared_from_this<OrvantadSession> {
  public:
-  // `connection` may be null for a session without a client (tests): nothing is then handed back to one.
+  // `connection` may be null for a session without a client (tests): it is then sent nothing.
   static std::shared_ptr<OrvantadSession> create(DaemonServices& services, OrvantadSessionDelegate& delegate,
                                                  std::shared_ptr<platform::Connection> connection);
   ~OrvantadSession() override;
@@ -54,28 +52,30 @@ class OrvantadSession final : public ClientSessionInterface, public std::enable_
   // job.
   void end();
 
-  // --- What related sessions' threads call; they hold the agent's lock ---
-  std::uint32_t sessionID() const { return _sessionID; }
+  // --- Called by related sessions' threads, which hold the agent's lock ---
+  std::uint32_t sessionID() const { return _info.sessionID; }
   const std::string& sessionIDString() const { return _sessionIDString; }
-  std::uint32_t hierarchyLevel() const { return static_cast<std::uint32_t>(_hierarchy.level); }
-  const std::optional<std::string>& hierarchyToken() const { return _hierarchy.token; }
+  std::uint32_t hierarchyLevel() const { return static_cast<std::uint32_t>(_info.hierarchy.level); }
+  const std::optional<std::string>& hierarchyToken() const { return _info.hierarchy.token; }
   bool hasUserInfo() const { return _userInfo != nullptr; }
   void updateCombinedSessionID();
   void syncReportingStates();
   // Any thread.
-  bool hasAggregator() const { return _hasAggregator.load(std::memory_order_acquire); }
+  bool hasAggregator() const { return _aggregation.hasAggregator(); }
   void shutdownSessionAggregation();
-  // Whether the event was handed to this session's client: not when its aggregation has ended meanwhile. Any thread.
-  bool sendToAggregator(const SharedDictionary& sessionInfo, double timestamp, std::uint16_t category,
-                        std::uint16_t type, const SharedDictionary& payload);
+  // Returns whether this session's client was given the event: not when its aggregation has ended meanwhile. Any
+  // thread.
+  bool sendToAggregator(const SharedDictionary& sessionInfo, const Event& event) {
+    return _aggregation.send(sessionInfo, event);
+  }
 
-  // --- The session's own queue ---
+  // --- The session's queue only ---
   const SharedDictionary& sessionInfo() const { return _sessionInfo; }
   const SharedDictionary& userInfo() const { return _userInfo; }
   const std::optional<std::string>& storebagVersion() const { return _storebagVersion; }
   std::int32_t clientType() const { return _info.clientType; }
-  const BackendSet* backends() const { return _backends ? &*_backends : nullptr; }
-  // Whether the registry holds the session in some group; set by the agent.
+  const BackendSet* backends() const { return _backends.get(); }
+  // Returns whether the registry holds the session in a group; set by the agent.
   bool isInGroup() const { return _inGroup; }
   void setInGroup(bool inGroup) { _inGroup = inGroup; }
   // For log lines.
@@ -87,58 +87,46 @@ class OrvantadSession final : public ClientSessionInterface, public std::enable_
                   std::shared_ptr<platform::Connection> connection);
 
   // Setup.
+  void configure(SharedDictionary sessionInfo, SessionInfoRecord info);
   void createBackendsWithStorebag(const SharedDictionary& storebag);
-  // Lets go of the earlier ones.
-  void replaceBackends(std::optional<BackendSet> backends);
+  void replaceBackends(std::unique_ptr<BackendSet> backends);  // cleans the earlier ones up
   void sendStartMessage();
   void receivedUserInfo(SharedDictionary userInfo);
-  void updateUserInfoForBackends();
-  void updateReportingStates();
   void updateSessionWithDefaultSessionInfo();
   BackendNames fetchReportingStates() const;
-  void configure(SharedDictionary sessionInfo);  // records and registration; shared fields under the agent's lock
   // Held around changes of what related sessions read. Sessions outside every group take no lock.
   std::unique_lock<AgentLock> lockSharedFields(bool joiningGroup = false);
 
-  // Intake.
-  std::optional<std::string> dispatch(Event event);
+  // Events.
   std::optional<std::string> send(std::uint16_t category, std::uint16_t type, SharedDictionary payload);
-  void internalSendMessage(SharedDictionary payload, std::uint16_t method, std::uint16_t respCode);
-  static void sendSingleMessage(DaemonServices& services, const SharedDictionary& sessionInfo,
-                                const SharedDictionary& userInfo, const SharedDictionary& storebag, Event event);
-
-  // Aggregation and flushing.
-  void aggregateMessage(const Event& event);
-  SharedDictionary mergedPayload(const SharedDictionary& payload) const;
-  void internalFlushMessagesWithCompletion(FlushReply completion);
+  std::optional<std::string> dispatch(Event event);
+  void internalSendMessage(SharedDictionary payload, std::uint16_t category, std::uint16_t type);
+  void sendSingleMessage(const SharedDictionary& userInfo, const SharedDictionary& storebag, Event event) const;
+  void aggregateMessage(Event event);
 
   // Constant after construction.
   DaemonServices& _services;
   Platform& _platform;
   OrvantadSessionDelegate& _delegate;
-  const std::shared_ptr<platform::Connection> _connection;
-  const std::unique_ptr<ClientReplyProxy> _client;  // used under _aggregationLock; null without a connection
+  const std::shared_ptr<platform::Connection> _connection;  // null for a session without a client
   DeviceIDBuffer _deviceid{};
   std::string _sessionIDString;
 
   // Written on the session's queue, under the agent's lock when the session is in a group; read there without it, and
   // by related sessions' threads under it.
-  std::uint32_t _sessionID = 0;
-  HierarchyPosition _hierarchy;
+  SessionInfoRecord _info;
   SharedDictionary _userInfo;
-  std::optional<BackendSet> _backends;
+  std::unique_ptr<BackendSet> _backends;  // null until there is a storebag
 
   // The session's queue only.
-  SharedDictionary _sessionInfo;
-  SessionInfoRecord _info;
+  SharedDictionary _sessionInfo;  // null until configured
   SharedArray _frameworks;
   std::optional<std::string> _storebagVersion;
   bool _inGroup = false;
   bool _ended = false;
 
-  // Leaf lock: an event or the end notice is handed to the client together with the test and change of _hasAggregator.
-  std::mutex _aggregationLock;
-  std::atomic<bool> _hasAggregator{false};  // written under _aggregationLock
+  // Any thread.
+  Aggregation _aggregation;
 };
 
 }  // namespace orvanta

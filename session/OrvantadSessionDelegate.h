@@ -40,7 +40,7 @@ class CAPABILITY("mutex") AgentLock {
   platform::RecursiveMutex _mutex;
 };
 
-// What a session asks of the agent: storebags and the hierarchy of related sessions. Called on any session's queue.
+// The agent as its sessions see it: storebags and the hierarchy of related sessions. Called on any session's queue.
 // Outlives every session.
 class OrvantadSessionDelegate {
  public:

@@ -14,7 +14,7 @@
 namespace orvanta::test {
 namespace {
 
-// Remembers whom it was given, and plays the peer that comes and goes.
+// Keeps its delegate, and plays the peer that comes and goes.
 struct Peer final : public RecordingConnection {
   using RecordingConnection::RecordingConnection;
   ~Peer() override {
@@ -87,7 +87,7 @@ class SilentServerTest : public ConcurrentSessionsTest {
     _waiting = std::async(std::launch::async, [this, fetching] { start(*fetching); });
     ASSERT_TRUE(_asked.waitFor(1));
   }
-  // Whether the step comes to its end though the fetch does not.
+  // Returns whether the step ends while the fetch does not.
   template <class Step>
   bool passes(Step step) {
     auto done = std::async(std::launch::async, step);
@@ -102,7 +102,7 @@ class SilentServerTest : public ConcurrentSessionsTest {
   std::future<void> _waiting;
 };
 
-TEST_F(SilentServerTest, OnlySessionsWithSomebodyAboveWaitForIt) {
+TEST_F(SilentServerTest, OnlySessionsBelowAnotherWaitForIt) {
   maxAge = 0;
   const auto related = makeSession();
   configure(*related, 4, hierarchy("t", 0));
@@ -172,7 +172,7 @@ TEST_F(ConcurrentSessionsTest, TheProcessIsBusyFromTheFirstAdmissionToTheLastDep
   expect(1, 2, 1);
   peers[2]->leave();
   expect(0, 2, 2);
-  // None is left that this could wait for.
+  // There is nothing left to wait for.
   EXPECT_TRUE(sessions.endAll());
   sessions.waitForClients();
 }
@@ -210,7 +210,7 @@ TEST_F(ConcurrentSessionsTest, NoEventFollowsTheEndOfAggregationAndItIsToldOnce)
         ready.add();
         ready.waitFor(3);
         for (int event = 0; event < 5; ++event) {
-          if (i > 0) session->sendToAggregator(session->sessionInfo(), 1, 2, 3, nullptr);
+          if (i > 0) session->sendToAggregator(session->sessionInfo(), {.category = 2, .type = 3});
         }
         if (i < 2) session->shutdownSessionAggregation();
       });
@@ -231,7 +231,7 @@ TEST_F(ConcurrentSessionsTest, AFlushOnItsWayKeepsNothingAliveAndIsStillAnswered
     configure(*session, 1, {{"batchEvent", true}});
     start(*session);
     const std::weak_ptr<OrvantadSession> watch = session;
-    const std::weak_ptr<OrvantaBackend> backend = session->backends()->begin()->second;
+    const std::weak_ptr<OrvantaBackend> backend = session->backends()->begin()->backend;
     KeptFlush kept;
     session->flushMessagesWithCompletion(kept.reply());
     leave(session);

@@ -4,6 +4,7 @@
 #include <fstream>
 
 #include "tests/support/SessionFixture.h"
+#include "tests/support/UdpServer.h"
 
 namespace orvanta::test {
 namespace {
@@ -36,7 +37,7 @@ TEST_F(SessionSetupTest, OnlyReportingBackendsAreNamed) {
   storebag = shared({{"telegraph", Dictionary{}}});
   const auto session = makeSession();
   configure(*session, 7, {{"requireUserInfo", true}});
-  EXPECT_EQ(start(*session), std::vector<std::string>{}) << "an empty list, not none";
+  EXPECT_EQ(start(*session), std::vector<std::string>{}) << "an empty list, not nullopt";
   EXPECT_TRUE(log.contains("<3>OrvantaBackend(newBackendWithName): telegraph"));
   storebag = shared({{"voltmark", Dictionary{}},
                      {"http_post", Dictionary{{"clients", Array{}}, {"display_url", "http://show"}}},
@@ -46,6 +47,32 @@ TEST_F(SessionSetupTest, OnlyReportingBackendsAreNamed) {
   EXPECT_EQ(start(*other), std::vector<std::string>{"voltmark"}) << "http_post waits for user info";
   EXPECT_TRUE(log.contains("<3>OrvantaBackend(newBackendWithName): http_post2"));
   EXPECT_EQ(displayURL(*other), "http://show");
+}
+
+TEST_F(SessionSetupTest, TheDisplayURLComesFromTheHTTPSBackendsThenFromTheDashboard) {
+  const auto backend = [](bool hasURL, const char* name, Dictionary profile) {
+    if (hasURL) profile.set("display_url", std::string("http://") + name);
+    return profile;
+  };
+  const struct {
+    bool first, second, dashboard;
+    const char* expected;
+  } rows[] = {{true, true, true, "http://first"},
+              {false, true, true, "http://second"},
+              {false, false, true, "http://dashboard"},
+              {false, false, false, "URL not available"}};
+  maxAge = 0;
+  for (const auto& row : rows) {
+    storebag = shared({{"http_post", backend(row.first, "first", {{"clients", Array{}}})},
+                       {"http_post2", backend(row.second, "second", {{"clients", Array{}}})},
+                       {"dashboard", backend(row.dashboard, "dashboard", {{"ip", "127.0.0.1"}, {"port", 9}})},
+                       {"upload_server", backend(true, "upload", {{"post_url", "http://127.0.0.1/x"}})}});
+    const auto session = makeSession();
+    configure(*session, 1);
+    start(*session);
+    ASSERT_EQ(std::distance(session->backends()->begin(), session->backends()->end()), 4);
+    EXPECT_EQ(displayURL(*session), row.expected);
+  }
 }
 
 TEST_F(SessionSetupTest, BackendsGetTheSessionsAndTheDevicesFacts) {
@@ -120,6 +147,8 @@ class SessionIntakeTest : public SessionFixture {
     connections.back()->received->frames.clear();
     return session;
   }
+  UdpServer dashboardServer;
+
   std::string messageLog() {
     std::string content;
     const auto directory = device.get().files().stateDirectory + "/Logs/Faultline/Retired";
@@ -203,6 +232,28 @@ TEST_F(SessionIntakeTest, TheLastHTTPSTextOrElseNothingBecomesTheReply) {
   EXPECT_EQ(messageLog().find("[voltmark"), std::string::npos);
 }
 
+TEST_F(SessionIntakeTest, ADashboardsLineBecomesTheReplyForWantOfAnHTTPSText) {
+  device.device.consent = true;
+  const Dictionary dashboard{{"ip", "127.0.0.1"}, {"port", static_cast<int>(dashboardServer.port())}};
+  maxAge = 0;
+  const auto replyOf = [&](Dictionary bag, bool promisesUserInfo = false) {
+    storebag = shared(std::move(bag));
+    const auto session = makeSession();
+    configure(*session, 11, {{"requireUserInfo", promisesUserInfo}});
+    start(*session);
+    return send(*session, {{"category", 3}, {"type", 4}, {"payload", Dictionary{{"greeting", "hello"}}}})
+        .value_or("none");
+  };
+  const std::string line = replyOf({{"dashboard", dashboard}, {"voltmark", Dictionary{}}});
+  EXPECT_NE(line.find("3     4  greeting=hello"), std::string::npos) << line;
+  const std::string text = replyOf({{"dashboard", dashboard}, {"http_post2", kClients}});
+  EXPECT_NE(text.find("hello"), std::string::npos) << text;
+  EXPECT_EQ(text.find("greeting=hello"), std::string::npos) << text;
+  const std::string left = replyOf({{"dashboard", dashboard}, {"http_post", kClients}}, true);  // which gives no text
+  EXPECT_NE(left.find("greeting=hello"), std::string::npos) << left;
+  EXPECT_EQ(replyOf({{"voltmark", Dictionary{}}}), "none");
+}
+
 TEST_F(SessionIntakeTest, AOneOffEventNeedsIdentifiersAndGoesThroughBackendsOfItsOwn) {
   const auto session = makeSession();
   for (const auto& info : {Dictionary{{"sessionID", 1}}, Dictionary{{"clientType", 5}}, Dictionary{}}) {
@@ -256,7 +307,7 @@ TEST_F(SessionIntakeTest, AFlushAnswersAtOnceWhereThereIsNothingWithTheFirstErro
   }
 }
 
-TEST_F(SessionIntakeTest, UploadsThatNobodyTakesAreAnsweredNo) {
+TEST_F(SessionIntakeTest, UploadsThatNoBackendTakesAreAnsweredNo) {
   const auto session = started();
   Kept<bool> file;
   session->uploadFileAtPath("file:///tmp/a%20b.log", std::nullopt, file.reply());

@@ -1,5 +1,6 @@
-#include "session/ClientReplyProxy.h"
+#include "session/Aggregation.h"
 
+#include "config/Conversions.h"
 #include "interface/OrvantaLogging.h"
 #include "interface/RemoteCalls.h"
 
@@ -30,8 +31,26 @@ void ClientReplyProxy::sendMessageToClient(const SharedDictionary& sessionInfo, 
   }
 }
 
-void ClientReplyProxy::removeFile(std::string_view token) {
-  _outbox->send(encodeRemoveFile(token));
+Aggregation::Aggregation(std::shared_ptr<platform::Outbox> outbox) {
+  if (outbox) _client.emplace(std::move(outbox));
+}
+
+void Aggregation::setHasAggregator(bool hasAggregator) {
+  const platform::MutexLock lock(_lock);
+  _hasAggregator.store(hasAggregator, std::memory_order_release);
+}
+
+bool Aggregation::send(const SharedDictionary& sessionInfo, const Event& event) {
+  const platform::MutexLock lock(_lock);
+  if (!hasAggregator() || !_client) return false;
+  _client->sendMessageToClient(sessionInfo, timevalToSeconds(event.time), event.category, event.type, event.payload);
+  return true;
+}
+
+void Aggregation::shutdown() {
+  const platform::MutexLock lock(_lock);
+  if (hasAggregator() && _client) _client->sendMessageToClient(nullptr, 0.0, 0, 0, nullptr);
+  _hasAggregator.store(false, std::memory_order_release);
 }
 
 }  // namespace orvanta
