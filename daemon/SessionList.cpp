@@ -110,7 +110,7 @@ bool SessionList::allEnded() const {
   return std::all_of(_entries.begin(), _entries.end(), [](const Entry& entry) { return entry.state == State::ended; });
 }
 
-// Gives back what the sessions used now that none is left; but not after each of many short visits.
+// Returns the memory of the last sessions to the system, but not after each of many short visits.
 void SessionList::releaseMemoryWhenIdle() {
   const auto now = std::chrono::steady_clock::now();
   if (now - _memoryReleased < kBetweenReleases) return;

@@ -14,7 +14,7 @@ namespace orvanta {
 
 enum class StorebagFetchState { successful, failure };  // "Fetch Successful", "Fetch Failure"
 
-// What is known of one storebag. Made by the first attempt to fetch it and kept for the life of the process.
+// One storebag as far as it is known. Made by the first attempt to fetch it and kept for the life of the process.
 struct StorebagCacheEntry {
   SharedDictionary storebagData;               // of the last fetch that brought one
   std::optional<std::string> storebagVersion;  // together with storebagData
@@ -24,7 +24,7 @@ struct StorebagCacheEntry {
   std::optional<std::string> storebagLastModified;
 };
 
-// Pure: whether the entry serves as it is at `now`, and why not.
+// Returns whether the entry serves as it is at `now`, and else why not. Pure.
 enum class StorebagFreshness { fresh, waiting, expired };
 StorebagFreshness freshnessOf(const StorebagCacheEntry& entry, double now);
 
@@ -37,7 +37,7 @@ class StorebagCache {
   using Fetch = std::function<SharedDictionary(std::int32_t clientType, StorebagFetch& fetch)>;
   StorebagCache(platform::Clock& clock, Fetch fetch) : _clock(clock), _fetch(std::move(fetch)) {}
 
-  // Null when there is none, or the client type has no storebag.
+  // Returns null when no fetch has succeeded, or the client type has no storebag.
   SharedDictionary storebag(std::int32_t clientType);
   // Never fetches.
   std::optional<std::string> version(std::int32_t clientType) const;

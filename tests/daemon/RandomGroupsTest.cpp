@@ -63,14 +63,14 @@ class WholeDaemon {
   }
   std::string socketDirectory() { return device.get().files().runtimeDirectory; }
   void changeStorebag(std::uint32_t variant) { _current = variant; }
-  // What the scripted servers keep is not the daemon's.
+  // The scripted servers' records are not the daemon's memory.
   void forgetRecords() {
     device.http.clear();
     const std::lock_guard lock(device.powerLog.mutex);
     device.powerLog.records.clear();
   }
-  // Whether all sessions have ended, and the threads that stood in for blocked ones, each with a compressor of its own,
-  // have gone.
+  // Returns whether all sessions have ended, and the threads that stood in for blocked ones, each with a compressor of
+  // its own, have gone.
   bool isIdle() {
     auto& platform = device.get();
     return agent.sessions().openCount() == 0 && platform.keepAlive().begun() == platform.keepAlive().ended() &&

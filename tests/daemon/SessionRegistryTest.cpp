@@ -65,7 +65,7 @@ TEST_F(HierarchyTest, QuestionsWithoutAnAnswerSayWhy) {
   hasNoParent("ERROR: No sessions found for hierarchyToken t");
 }
 
-TEST_F(HierarchyTest, TheFirstRegisteredOfTheLevelAboveIsTheParentAndNobodyIsInTwoGroups) {
+TEST_F(HierarchyTest, TheFirstRegisteredOfTheLevelAboveIsTheParentAndNoSessionIsInTwoGroups) {
   const auto first = join(1, "t", 1);
   const auto second = join(2, "t", 1);
   const auto child = join(3, "t", 2);
@@ -192,7 +192,7 @@ TEST_F(HierarchyTest, EventsReachOneAggregatorAndTheDeeperOnesAreToldThatTheyEnd
   EXPECT_EQ(*event.payload, (Dictionary{{"clientName", "c"}, {"serviceName", "s"}, {"x", 1}}));
   EXPECT_EQ(event.sessionInfo->find("sessionID")->integerValue(), 3);
   send(*leaf, {{"category", 5}, {"type", 7}});
-  EXPECT_FALSE(rootClient->aggregated().back().payload) << "no payload stays none";
+  EXPECT_FALSE(rootClient->aggregated().back().payload) << "no payload stays null";
 
   const auto total = rootClient->aggregated().size();
   root->shutdownSessionAggregation();

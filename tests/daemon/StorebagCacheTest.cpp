@@ -19,7 +19,7 @@ class StorebagCacheTest : public ::testing::Test {
   TestClock clock;
   int fetches = 0;
   std::optional<std::string> sentStamp;
-  // What the server gives: a bag called "first", no news, or nothing.
+  // The server gives a bag called "first", no news, or nothing.
   enum { good, notModified, failure } answer = good;
   int maxAge = 100;
   StorebagCache cache{clock, [this](std::int32_t, StorebagFetch& fetch) -> SharedDictionary {
