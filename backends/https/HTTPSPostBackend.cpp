@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 
 #include "backends/https/ClientSection.h"
+#include "backends/https/Disposition.h"
 #include "config/Conversions.h"
 #include "config/DeviceInfo.h"
 #include "config/Environment.h"
@@ -53,17 +54,8 @@ HTTPSPostBackend::HTTPSPostBackend(BackendServices& services, std::string name, 
       _clientIdentity{services.config.orvanta().getPersistentIdentifierForDNU(true),
                       services.config.orvanta().getPersistentIdentifierForDNU(false)},
       _userInfo(RecordLayer::of(setup.userInfo)),
-      _realtimePostURL(userDefaultStringForKey(services.platform(), kRealtimePostURLKey)),
-      _postURL(userDefaultStringForKey(services.platform(), kPostURLKey)) {
-  if (_postURL) {
-    _useDefaultPostURL = true;
-    ORVANTA_LOG(debug, "HTTPSPostBackend(initWithName): Using user default '{}' for postURL", *_postURL);
-  }
-  if (_realtimePostURL) {
-    _useDefaultRealtimePostURL = true;
-    ORVANTA_LOG(debug, "HTTPSPostBackend(initWithName): Using user default '{}' for realtimePostURL",
-                *_realtimePostURL);
-  }
+      _postURLs(userDefaultStringForKey(services.platform(), kPostURLKey),
+                userDefaultStringForKey(services.platform(), kRealtimePostURLKey)) {
   if (const std::string* url = textUnder(*this->profile(), StorebagKey::httpsDisplayURL)) setDisplayURL(*url);
 }
 
@@ -73,7 +65,9 @@ void HTTPSPostBackend::setUserInfoDict(SharedDictionary userInfo) {
 }
 
 std::optional<std::string> HTTPSPostBackend::sendNumbered(const Event& event) {
-  if (state() == kBackendDisabled) return std::nullopt;
+  const bool knowsUser = !identity().requireUserInfo || userInfoDict() != nullptr;
+  const Disposition becomes = disposition(state(), event.flag, batchEvents(), knowsUser);
+  if (becomes == Disposition::drop) return std::nullopt;
   Event kept = event;
   if (isSessionEnd(event)) kept.payload = sessionEndPayload(event.payload);
   PreparedEvent prepared = newEventDict(std::move(kept));
@@ -84,14 +78,10 @@ std::optional<std::string> HTTPSPostBackend::sendNumbered(const Event& event) {
     BackendState held = kBackendHeld;
     stateCell().compare_exchange_strong(held, kBackendEnabled);
   }
-  const bool realtime = isRealtime(event.flag);
-  ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): realtime is {:d}", realtime);
-  const BackendState now = state();
-  const bool mayPost = now != kBackendWaiting && now != kBackendHeld;
-  const bool hasInfo = !identity().requireUserInfo || userInfoDict() != nullptr;
-  if (mayPost && (realtime || !batchEvents()) && hasInfo) return sendDirectly(prepared.record, event);
+  ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): realtime is {:d}", isRealtime(event.flag));
+  if (becomes == Disposition::post) return sendDirectly(prepared.record, event);
 
-  ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): Batching {}, {:d}, {:d}", int{now}, batchEvents(),
+  ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): Batching {}, {:d}, {:d}", int{state()}, batchEvents(),
               identity().requireUserInfo);
   return batchEvent(std::move(prepared));
 }

@@ -14,6 +14,7 @@
 #include "backends/https/EventRecord.h"
 #include "backends/https/PostMessage.h"
 #include "backends/https/PostQueue.h"
+#include "backends/https/PostURLs.h"
 #include "backends/https/RecordLayer.h"
 #include "backends/https/ReportingDecision.h"
 #include "backends/https/SessionFields.h"
@@ -39,8 +40,8 @@ class HTTPSPostBackend final : public OrvantaBackend {
   void setCorrelatedSessionID(std::optional<std::string> combined) override;
   void setUserInfoDict(SharedDictionary userInfo) override;
 
-  std::optional<std::string> postURL() const;
-  void setPostURL(std::optional<std::string> url);
+  const std::optional<std::string>& postURL() const { return _postURLs.postURL(); }
+  void setPostURL(std::optional<std::string> url) { _postURLs.setPostURL(std::move(url)); }
   // Why the last evaluation that was not frozen came out as it did; none before the first.
   const std::optional<ReportingReason>& reason() const { return _reason; }
 
@@ -54,10 +55,8 @@ class HTTPSPostBackend final : public OrvantaBackend {
   HTTPSPostBackend(BackendServices& services, std::string name, SharedDictionary profile, const BackendSetup& setup);
 
   // HTTPSPostConfiguration.cpp
-  BackendState updateBackendState();
   ReportingFacts gatherFacts() const;
   void apply(ReportingDecision&& decision, const ReportingFacts& facts);
-  bool updatePostLink(const Dictionary& section);
   void resetBackendStateWithClient(const ReportingSettings::Counters& counters);
 
   // HTTPSPostBackend.cpp
@@ -95,12 +94,9 @@ class HTTPSPostBackend final : public OrvantaBackend {
   std::optional<ReportingReason> _reason;
   std::shared_ptr<const RecordLayer> _userInfo;  // of userInfoDict
   std::shared_ptr<PostQueue> _postQueue;         // made with the first post
-  std::optional<std::string> _realtimePostURL;
-  bool _useDefaultPostURL = false;  // the URL is a user default and stays, as the other one
-  bool _useDefaultRealtimePostURL = false;
+  PostURLs _postURLs;
 
   // Guarded by mutex().
-  std::optional<std::string> _postURL;
   EventBatch _batchedEvents;
 };
 

@@ -1,6 +1,5 @@
 // HTTPSPostBackend: its evaluation, from the facts to the settings taken.
 
-#include "backends/https/ClientSection.h"
 #include "backends/https/HTTPSPostBackend.h"
 #include "config/DeviceInfo.h"
 #include "interface/OrvantaConstants.h"
@@ -33,18 +32,13 @@ void logRefusal(const ReportingReason& reason) {
 }  // namespace
 
 void HTTPSPostBackend::updateState() {
-  // Nothing is stored for a frozen state: the store would undo what a server's answer or a parent session sets
-  // meanwhile.
-  if (!_immutable) setState(updateBackendState());
-}
-
-BackendState HTTPSPostBackend::updateBackendState() {
-  if (_immutable) return state();
+  // A frozen state is not even stored again: that would undo what a server's answer or a parent session sets meanwhile.
+  if (_immutable) return;
   const ReportingFacts facts = gatherFacts();
   ReportingDecision decision = evaluate(*profile(), facts);
   const BackendState decided = decision.state;
   apply(std::move(decision), facts);
-  return decided;
+  setState(decided);
 }
 
 ReportingFacts HTTPSPostBackend::gatherFacts() const {
@@ -59,7 +53,7 @@ ReportingFacts HTTPSPostBackend::gatherFacts() const {
   facts.productFamily = identity().productFamily;
   facts.productType = identity().productType;
   facts.samplingFactor = samplingFactor();
-  facts.postURLFixed = _useDefaultPostURL && postURL().has_value();
+  facts.postURLFixed = _postURLs.postURLFixed();
   return facts;
 }
 
@@ -83,7 +77,7 @@ void HTTPSPostBackend::apply(ReportingDecision&& decision, const ReportingFacts&
   if (settings.overrideSampling) _overrideSampling = settings.overrideSampling->value;
   // Without user info the URLs come first, with it the counters do.
   if (!facts.requireUserInfo) {
-    for (const auto* section : settings.linkSections) updatePostLink(*section);
+    for (const auto* section : settings.linkSections) _postURLs.update(*section);
   }
   if (settings.counters) resetBackendStateWithClient(*settings.counters);
   if (settings.customClientID) {
@@ -93,7 +87,7 @@ void HTTPSPostBackend::apply(ReportingDecision&& decision, const ReportingFacts&
   if (facts.requireUserInfo && settings.sampling) {
     ORVANTA_LOG(debug, "HTTPSPostBackend(updateBackendState): {}: client found {}:{}, state={}, samplingFactor={:f}",
                 name(), orNull(facts.clientName), orNull(facts.serviceName), int{decision.state}, facts.samplingFactor);
-    for (const auto* section : settings.linkSections) updatePostLink(*section);
+    for (const auto* section : settings.linkSections) _postURLs.update(*section);
   }
   if (auto& list = settings.eventWhitelist) {
     ORVANTA_LOG(debug, "HTTPSPostBackend(updateBackendState): {}: eventWhitelist={}", name(),
@@ -108,46 +102,11 @@ void HTTPSPostBackend::apply(ReportingDecision&& decision, const ReportingFacts&
   _reason = std::move(decision.reason);
 }
 
-bool HTTPSPostBackend::updatePostLink(const Dictionary& section) {
-  bool supplied = false;
-  std::optional<std::string> postURL = this->postURL();
-  if (!_useDefaultPostURL || !postURL) {
-    _useDefaultPostURL = false;
-    if (const std::string* url = textUnder(section, StorebagKey::postURL)) {
-      postURL = *url;
-      setPostURL(*url);
-      ORVANTA_LOG(debug, "HTTPSPostBackend(updatePostLink): Storebag '{}' for postURL", *url);
-      supplied = true;
-    }
-  }
-  if (!_useDefaultRealtimePostURL || !_realtimePostURL) {
-    _useDefaultRealtimePostURL = false;
-    if (const std::string* url = textUnder(section, StorebagKey::realtimePostURL)) {
-      _realtimePostURL = *url;
-      ORVANTA_LOG(debug, "HTTPSPostBackend(updatePostLink): Storebag '{}' for realtimePostURL", *url);
-    } else {
-      ORVANTA_LOG(debug, "HTTPSPostBackend(updatePostLink): realtimePostURL defaults to postURL '{}'", orNull(postURL));
-      _realtimePostURL = std::move(postURL);
-    }
-  }
-  return supplied;
-}
-
 void HTTPSPostBackend::resetBackendStateWithClient(const ReportingSettings::Counters& counters) {
   _eventThreshold = counters.eventThreshold;
   ORVANTA_LOG(debug, "resetBackendStateWithClient: event_threshold set to {}", counters.eventThreshold);
   _clientIdentity.setExtrasOnInternal(counters.extrasOnInternal);
   ORVANTA_LOG(debug, "setBackendStateWithClient: extras on internal is set to {}", counters.extrasOnInternal);
-}
-
-std::optional<std::string> HTTPSPostBackend::postURL() const {
-  const std::lock_guard lock(mutex());
-  return _postURL;
-}
-
-void HTTPSPostBackend::setPostURL(std::optional<std::string> url) {
-  const std::lock_guard lock(mutex());
-  _postURL.swap(url);
 }
 
 }  // namespace orvanta

@@ -16,13 +16,13 @@ std::optional<std::string> userInfoText(const SharedDictionary& userInfo, std::s
 
 void HTTPSPostBackend::postJSONMessage(std::string json, const Event* event, PostCompletion completion) {
   const bool realtime = event != nullptr && isRealtime(event->flag);
-  std::optional<std::string> url = realtime ? _realtimePostURL : postURL();
+  const std::optional<std::string>& url = realtime ? _postURLs.realtimePostURL() : _postURLs.postURL();
   if (!url) {
     if (completion) completion(makeOrvantaError("postURL is nil", -1));
     return;
   }
   if (!_postQueue) _postQueue = std::make_shared<PostQueue>(services(), weak_from_this(), name());
-  _postQueue->post({std::move(*url), postHeaders(event), std::move(json), std::move(completion)});
+  _postQueue->post({*url, postHeaders(event), std::move(json), std::move(completion)});
 }
 
 std::vector<platform::HttpHeader> HTTPSPostBackend::postHeaders(const Event* event) const {

@@ -4,6 +4,7 @@
 #include <cmath>
 
 #include "backends/https/ClientSection.h"
+#include "backends/https/PostURLs.h"
 #include "backends/https/StringMatching.h"
 
 namespace orvanta {
@@ -39,7 +40,7 @@ void reportWithoutUserInfo(ReportingDecision& decision, const Array& sections, c
     const Dictionary* section = element.dictionary();
     if (section == nullptr) continue;
     decision.settings.linkSections.push_back(section);
-    if (facts.postURLFixed || textUnder(*section, StorebagKey::postURL) == nullptr) continue;
+    if (suppliedPostURL(*section, facts.postURLFixed) == nullptr) continue;
     source = section;
     break;
   }
