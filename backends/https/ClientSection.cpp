@@ -2,8 +2,6 @@
 
 #include <algorithm>
 
-#include "backends/https/EventFilters.h"
-
 namespace orvanta {
 namespace {
 
@@ -90,13 +88,6 @@ std::optional<MalformedKey> findMalformedKey(const Dictionary& section) {
     const Value* value = section.find(row.name);
     if (value == nullptr) continue;
     if (const char* problem = check(*value, row.type)) return MalformedKey{std::string(row.name), problem};
-  }
-  // Last, since building the filters is the only check that costs anything.
-  if (const Value* filters = valueUnder(section, StorebagKey::filters)) {
-    const std::string key(nameOf(StorebagKey::filters));
-    if (filters->array() == nullptr) return MalformedKey{key, "is no list"};
-    const auto made = EventFilters::createFiltersFromArray(*filters->array());
-    if (!made) return MalformedKey{key, "does not hold: " + made.error()};
   }
   return std::nullopt;
 }

@@ -111,6 +111,7 @@ void EventRecord::applyFilters(const EventFilters& filters) {
       if (const auto* rule = filters.find(nameOf(key), method, status)) apply(nameOf(key), rule, ownValue(key));
     }
   }
+  _filteredAbovePayload = !_changes.empty();
   hidden |= _present;
   for (const auto& [key, value] : orEmpty(_event.payload)) {
     const auto* rule = filters.find(key, method, status);
@@ -132,89 +133,83 @@ std::size_t EventRecord::footprint() const {
   return kReservedFieldsAbout + footprintOf(orEmpty(_event.payload));
 }
 
-// From the top layer down; a key that was written, or taken away, hides the same key of the layers below.
 void EventRecord::write(FieldWriter& writer, const Overlay& overlay) const {
-  const bool compact = writer.form() == FieldWriter::Form::compact;
-  const auto writeLayer = [&](const RecordLayer& layer) {
-    if (compact) {
-      writer.fragment(layer.json());
-      layer.logUnsendable();
-    } else {
-      for (const auto& [key, value] : layer.entries()) writer.value(key, value);
-    }
-  };
-
-  const RecordLayer* const top = overlay.userInfo;
-  ReservedKeys hidden = 0;
-  if (top != nullptr) {
-    writeLayer(*top);
-    hidden |= top->reservedKeys();
-  }
-  if (overlay.relabelled) {
-    constexpr ReservedKeys kSessionID = setOf(ReservedKey::sessionID);
-    if (overlay.sessionID != nullptr && (hidden & kSessionID) == 0) {
-      writer.text(ReservedKey::sessionID, *overlay.sessionID);
-    }
-    hidden |= kSessionID;
-  }
-  for (const Change& change : _changes) {
-    const ReservedKeys reserved = reservedKeyNamed(change.key);
-    if ((reserved & hidden) != 0 || (top != nullptr && top->holds(change.key))) continue;
-    hidden |= reserved;
-    if (change.digest) writer.text(change.key, *change.digest);
-  }
-  if (_userInfo && _userInfo.get() != top) {
-    if (top == nullptr && _changes.empty() && (hidden & _userInfo->reservedKeys()) == 0) {
-      writeLayer(*_userInfo);
-    } else {
-      for (const auto& [key, value] : _userInfo->entries()) {
-        if ((reservedKeyNamed(key) & hidden) != 0 || (top != nullptr && top->holds(key))) continue;
-        if (changeOf(key) == nullptr) writer.value(key, value);
-      }
-    }
-    hidden |= _userInfo->reservedKeys();
-  }
-  writeReserved(writer, hidden);
-  hidden |= _present;
-  for (const auto& [key, value] : orEmpty(_event.payload)) {
-    if ((reservedKeyNamed(key) & hidden) != 0) continue;
-    if (_userInfo && _userInfo->holds(key)) continue;
-    if (top != nullptr && top != _userInfo.get() && top->holds(key)) continue;
-    if (changeOf(key) == nullptr) writer.value(key, value);
+  const RecordLayer* const info = overlay.userInfo != nullptr ? overlay.userInfo : _userInfo.get();
+  const bool oneInfo = !_userInfo || info == _userInfo.get();
+  if (oneInfo && !_filteredAbovePayload && (info == nullptr || info->reservedKeys() == 0)) {
+    writeLayers(writer, overlay, info);
+  } else {
+    for (const auto& [key, value] : flatten(overlay)) writer.value(key, value);
   }
 }
 
-void EventRecord::writeReserved(FieldWriter& writer, ReservedKeys hidden) const {
-  if (writer.form() == FieldWriter::Form::compact && (hidden & _fields->present) == 0) {
+void EventRecord::writeLayers(FieldWriter& writer, const Overlay& overlay, const RecordLayer* info) const {
+  const auto writeInfo = [&] {
+    if (writer.form() == FieldWriter::Form::compact) {
+      writer.fragment(info->json());
+      info->logUnsendable();
+    } else {
+      for (const auto& [key, value] : info->entries()) writer.value(key, value);
+    }
+  };
+  const auto inInfo = [&](std::string_view key) { return info != nullptr && info->holds(key); };
+
+  if (overlay.userInfo != nullptr) writeInfo();
+  if (overlay.relabelled && overlay.sessionID != nullptr) writer.text(ReservedKey::sessionID, *overlay.sessionID);
+  const ReservedKeys relabelled = overlay.relabelled ? setOf(ReservedKey::sessionID) : 0;
+  for (const Change& change : _changes) {
+    if (!change.digest || (reservedKeyNamed(change.key) & relabelled) != 0 || inInfo(change.key)) continue;
+    writer.text(change.key, *change.digest);
+  }
+  if (overlay.userInfo == nullptr && info != nullptr) writeInfo();
+  writeReserved(writer, !overlay.relabelled);
+  const ReservedKeys hidden = _present | relabelled;
+  for (const auto& [key, value] : orEmpty(_event.payload)) {
+    if ((reservedKeyNamed(key) & hidden) == 0 && !inInfo(key) && changeOf(key) == nullptr) writer.value(key, value);
+  }
+}
+
+void EventRecord::writeReserved(FieldWriter& writer, bool withSessionID) const {
+  if (writer.form() == FieldWriter::Form::compact) {
     writer.fragment(_fields->json);
   } else {
     for (std::size_t i = 0; i <= static_cast<std::size_t>(ReservedKey::reportVers); ++i) {
       const auto key = static_cast<ReservedKey>(i);
-      if ((_fields->present & ~hidden & setOf(key)) != 0) writer.value(nameOf(key), _fields->value(key));
+      if ((_fields->present & setOf(key)) != 0) writer.value(nameOf(key), _fields->value(key));
     }
   }
-  const auto visible = [&](ReservedKey key) { return (_present & ~hidden & setOf(key)) != 0; };
-  const auto number = [&](ReservedKey key, std::int64_t value) {
-    if (visible(key)) writer.number(key, value);
-  };
-  if (visible(ReservedKey::sessionID)) {
-    if (_fields->numericSessionID) {
-      writer.number(ReservedKey::sessionID, std::int64_t{*_fields->numericSessionID});
+  if (withSessionID && _fields->numericSessionID) {
+    writer.number(ReservedKey::sessionID, std::int64_t{*_fields->numericSessionID});
+  } else if (withSessionID && _combinedSessionID) {
+    writer.text(ReservedKey::sessionID, *_combinedSessionID);
+  }
+  writer.number(ReservedKey::eventNumber, _event.number);
+  writer.number(ReservedKey::method, _event.category);
+  writer.number(ReservedKey::status, _event.type);
+  writer.number({ReservedKey::clientTS, ReservedKey::eventTime}, _clientTS);
+  writer.number(ReservedKey::timezoneOffset, _timezoneOffset);
+}
+
+Dictionary EventRecord::flatten(const Overlay& overlay) const {
+  Dictionary flat = orEmpty(_event.payload);
+  for (std::size_t i = 0; i < kReservedKeyCount; ++i) {
+    const auto key = static_cast<ReservedKey>(i);
+    if ((_present & setOf(key)) != 0) flat.set(nameOf(key), ownValue(key));
+  }
+  if (_userInfo) flat.merge(_userInfo->entries());
+  for (const Change& change : _changes) {
+    if (change.digest) {
+      flat.set(change.key, *change.digest);
     } else {
-      writer.text(ReservedKey::sessionID, *_combinedSessionID);
+      flat.erase(change.key);
     }
   }
-  number(ReservedKey::eventNumber, _event.number);
-  number(ReservedKey::method, _event.category);
-  number(ReservedKey::status, _event.type);
-  if (visible(ReservedKey::clientTS) && visible(ReservedKey::eventTime)) {
-    writer.number({ReservedKey::clientTS, ReservedKey::eventTime}, _clientTS);
-  } else if (visible(ReservedKey::clientTS)) {
-    writer.number({ReservedKey::clientTS}, _clientTS);
-  } else if (visible(ReservedKey::eventTime)) {
-    writer.number({ReservedKey::eventTime}, _clientTS);
+  if (overlay.relabelled) {
+    flat.erase(nameOf(ReservedKey::sessionID));
+    if (overlay.sessionID != nullptr) flat.set(nameOf(ReservedKey::sessionID), *overlay.sessionID);
   }
-  number(ReservedKey::timezoneOffset, _timezoneOffset);
+  if (overlay.userInfo != nullptr) flat.merge(overlay.userInfo->entries());
+  return flat;
 }
 
 }  // namespace orvanta

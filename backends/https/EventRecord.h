@@ -19,10 +19,18 @@ namespace orvanta {
 
 class FieldWriter;
 
-// One event as it will be sent. To the outside it is one flat dictionary: the client's payload, the reserved keys over
-// it, the user info over those, filters applied to the result; a flush lays a new session identifier and its own user
-// info on top. Inside it is kept as those layers, which are shared and never copied, and they come together only as
-// JSON.
+// One event as it will be sent. To the outside it is one flat dictionary, made in these steps, in which a later one
+// replaces what an earlier one left under the same key:
+//
+//     made       payload ◄─ reserved keys (session, device, time)
+//     prepared   ◄─ user info, then the filters' removals and digests
+//     written    ◄─ relabelling: "_sessionID" replaced or removed     ┐ only for those that
+//                ◄─ user info of the flush, filtered by itself        ┘ waited in a batch
+//
+// Inside it is kept as those layers, which are shared with other events and never copied, plus the few changes that
+// filters made. Nearly always the layers have no key in common but those of the payload that give way: then the shared
+// ones are written as the JSON that they hold ready. Where user info names a reserved key, a filter changed one or a
+// field of the user info, or the flush has other user info than the record, the steps are carried out on a dictionary.
 //
 // Made and prepared on the session's queue; afterwards immutable.
 class EventRecord {
@@ -60,7 +68,10 @@ class EventRecord {
   Value ownValue(ReservedKey key) const;
   void applyFilters(const EventFilters& filters);
   const Change* changeOf(std::string_view key) const;
-  void writeReserved(FieldWriter& writer, ReservedKeys hidden) const;
+  // The two ways to write. `info`: the one user info that there is, without reserved keys; may be null.
+  void writeLayers(FieldWriter& writer, const Overlay& overlay, const RecordLayer* info) const;
+  void writeReserved(FieldWriter& writer, bool withSessionID) const;
+  Dictionary flatten(const Overlay& overlay) const;
 
   std::shared_ptr<const SessionFields> _fields;
   Event _event;
@@ -70,7 +81,8 @@ class EventRecord {
   double _clientTS = 0;          // seconds, finite
   std::int32_t _timezoneOffset = 0;
   std::int32_t _category = 0;
-  ReservedKeys _present = 0;
+  ReservedKeys _present = 0;  // of the payload's, these are hidden
+  bool _filteredAbovePayload = false;
 };
 
 }  // namespace orvanta

@@ -200,7 +200,7 @@ std::optional<std::string> HTTPSPostBackend::flushEnabled(FlushCompletion comple
   if (userInfo && !_filters.empty()) {
     auto filtered = std::make_shared<Dictionary>(userInfo->entries());
     _filters.filterEvent(*filtered);
-    userInfo = RecordLayer::of(std::move(filtered));
+    if (*filtered != userInfo->entries()) userInfo = RecordLayer::of(std::move(filtered));
   }
   EventBatch::Events events;
   {

@@ -77,8 +77,21 @@ bool refuseByList(ReportingReason& reason, ReportingTest test, const Dictionary&
   return false;
 }
 
+// Returns what is wrong with the section's filters. Without any they stay nullopt.
+std::optional<MalformedKey> buildFilters(const Dictionary& section, std::optional<EventFilters>& filters) {
+  const Value* list = valueUnder(section, StorebagKey::filters);
+  if (list == nullptr) return std::nullopt;
+  const std::string key(nameOf(StorebagKey::filters));
+  if (list->array() == nullptr) return MalformedKey{key, "is no list"};
+  auto made = EventFilters::createFiltersFromArray(*list->array());
+  if (!made) return MalformedKey{key, "does not hold: " + made.error()};
+  filters = std::move(*made);
+  return std::nullopt;
+}
+
 // Consent, country, device and filters. False, with the reason, when one of them refuses.
-bool passesTests(ReportingDecision& decision, const Dictionary& section, const ReportingFacts& facts) {
+bool passesTests(ReportingDecision& decision, const Dictionary& section, const ReportingFacts& facts,
+                 std::optional<EventFilters> filters) {
   ReportingReason& reason = decision.reason;
   // Consent is overridden by a number alone: a value of another type overrides nothing.
   const Value* override = valueUnder(section, StorebagKey::overrideDNU);
@@ -105,13 +118,10 @@ bool passesTests(ReportingDecision& decision, const Dictionary& section, const R
     return refuseByList(reason, ReportingTest::modelBlacklisted, section, StorebagKey::deviceBlacklist,
                         facts.productType);
   }
-  const Value* filters = valueUnder(section, StorebagKey::filters);
   reason.test = ReportingTest::filtersMissing;
-  if (filters == nullptr) return false;
+  if (!filters) return false;
   // An empty list keeps the filters of an earlier evaluation.
-  if (!filters->array()->empty()) {
-    decision.settings.filters = std::move(*EventFilters::createFiltersFromArray(*filters->array()));
-  }
+  if (!filters->empty()) decision.settings.filters = std::move(filters);
   return true;
 }
 
@@ -180,13 +190,16 @@ ReportingDecision evaluate(const Dictionary& profile, const ReportingFacts& fact
   }
   const Dictionary* section = chooseSection(decision.reason, *sections, facts);
   if (section == nullptr) return decision;
-  if (auto malformed = findMalformedKey(*section)) {
+  std::optional<EventFilters> filters;
+  auto malformed = findMalformedKey(*section);
+  if (!malformed) malformed = buildFilters(*section, filters);
+  if (malformed) {
     decision.reason.test = ReportingTest::malformedSection;
     decision.reason.subject = std::move(malformed->key);
     decision.reason.list = std::move(malformed->problem);
     return decision;
   }
-  if (!passesTests(decision, *section, facts)) return decision;
+  if (!passesTests(decision, *section, facts, std::move(filters))) return decision;
   takeSampling(decision, *section, facts);
   decideBySampling(decision, *section, facts.samplingFactor);
   takeCounters(decision, section);
