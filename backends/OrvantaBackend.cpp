@@ -15,8 +15,8 @@ namespace {
 
 // Never seeded: the draws are the generator's default sequence from process start.
 double nextSamplingDraw() {
-  static std::mutex mutex;
-  const std::lock_guard lock(mutex);
+  static platform::Mutex mutex;
+  const platform::MutexLock lock(mutex);
   return ::drand48();
 }
 
@@ -69,22 +69,22 @@ bool OrvantaBackend::isBlacklistedEvent(std::uint16_t category) const {
 }
 
 std::optional<double> OrvantaBackend::samplingThreshold() const {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   return _samplingThreshold;
 }
 
 void OrvantaBackend::setSamplingThreshold(std::optional<double> threshold) {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   _samplingThreshold = threshold;
 }
 
 std::optional<std::string> OrvantaBackend::combinedSessionIDString() const {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   return _combinedSessionIDString;
 }
 
 void OrvantaBackend::setCombinedSessionIDString(std::optional<std::string> combined) {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   _combinedSessionIDString.swap(combined);
 }
 

@@ -4,7 +4,6 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -16,7 +15,7 @@
 #include "config/DeviceInfo.h"
 #include "interface/OrvantaError.h"
 #include "interface/Values.h"
-#include "platform/core/Clock.h"
+#include "platform/core/Mutex.h"
 #include "platform/core/UniqueFunction.h"
 
 namespace orvanta {
@@ -109,7 +108,8 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
   void setEventBlacklist(std::optional<std::vector<std::int32_t>> list) { _eventBlacklist = std::move(list); }
   // For subclasses whose rules are compare-exchange.
   std::atomic<BackendState>& stateCell() { return _state; }
-  std::mutex& mutex() const { return _mutex; }
+  // The backend's one lock.
+  platform::Mutex& mutex() const RETURN_CAPABILITY(_mutex) { return _mutex; }
 
  private:
   BackendServices& _services;
@@ -129,9 +129,9 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
 
   // Any thread.
   std::atomic<BackendState> _state{kBackendWaiting};
-  mutable std::mutex _mutex;                            // the backend's one lock; subclasses use it too
-  std::optional<double> _samplingThreshold;             // guarded by _mutex
-  std::optional<std::string> _combinedSessionIDString;  // guarded by _mutex
+  mutable platform::Mutex _mutex;
+  std::optional<double> _samplingThreshold GUARDED_BY(_mutex);
+  std::optional<std::string> _combinedSessionIDString GUARDED_BY(_mutex);
 };
 
 }  // namespace orvanta

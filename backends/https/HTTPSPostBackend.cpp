@@ -107,7 +107,7 @@ HTTPSPostBackend::PreparedEvent HTTPSPostBackend::newEventDict(Event event) {
   std::uint64_t labelsSeen = 0;
   {
     // Before the identifier is read, so that a relabelling in between is taken for one that the record missed.
-    const std::lock_guard lock(mutex());
+    const platform::MutexLock lock(mutex());
     labelsSeen = _batchedEvents.labels();
   }
   const std::int32_t timezoneOffset = platform().device().timeZoneOffset(platform().clock().wallSeconds());
@@ -120,7 +120,7 @@ std::optional<std::string> HTTPSPostBackend::batchEvent(PreparedEvent event) {
   std::int32_t count = 0;
   std::size_t waitingBytes = 0;
   const auto look = [&] {
-    const std::lock_guard lock(mutex());
+    const platform::MutexLock lock(mutex());
     count = _batchedEvents.countOf(category);
     waitingBytes = _batchedEvents.footprint();
   };
@@ -145,7 +145,7 @@ std::optional<std::string> HTTPSPostBackend::batchEvent(PreparedEvent event) {
     if (reached) count = 0;
   }
   EventBatch::Events dropped;
-  const std::lock_guard lock(mutex());
+  const platform::MutexLock lock(mutex());
   if (waitingBytes != 0 && waitingBytes + footprint > kMaximumBatchBytes) {
     // A flush keeps what it must not send; that must not grow for ever.
     ORVANTA_LOG(warning, "HTTPSPostBackend(batchEvent): Dropping all batched events as they take {} bytes",
@@ -183,7 +183,7 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
     if (batchedBytes() > kLargeBatch) large.emplace();
     if (state() == kBackendEnabled) return flushEnabled(std::move(completion));
     EventBatch::Events dropped;
-    const std::lock_guard lock(mutex());
+    const platform::MutexLock lock(mutex());
     dropped = _batchedEvents.take();
   }
   completeWithError(completion, "Nothing to flush");
@@ -204,7 +204,7 @@ std::optional<std::string> HTTPSPostBackend::flushEnabled(FlushCompletion comple
   }
   EventBatch::Events events;
   {
-    const std::lock_guard lock(mutex());
+    const platform::MutexLock lock(mutex());
     events = _batchedEvents.take();
     _batchedEvents.clearCounts();
   }
@@ -266,18 +266,18 @@ bool HTTPSPostBackend::showsMessages() const {
 }
 
 bool HTTPSPostBackend::hasBatched() const {
-  const std::lock_guard lock(mutex());
+  const platform::MutexLock lock(mutex());
   return _batchedEvents.exists();
 }
 
 std::size_t HTTPSPostBackend::batchedBytes() const {
-  const std::lock_guard lock(mutex());
+  const platform::MutexLock lock(mutex());
   return _batchedEvents.footprint();
 }
 
 void HTTPSPostBackend::setCorrelatedSessionID(std::optional<std::string> combined) {
   setCombinedSessionIDString(combined);
-  const std::lock_guard lock(mutex());
+  const platform::MutexLock lock(mutex());
   _batchedEvents.relabel(combined);
 }
 

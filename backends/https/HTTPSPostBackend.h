@@ -96,8 +96,7 @@ class HTTPSPostBackend final : public OrvantaBackend {
   std::shared_ptr<PostQueue> _postQueue;         // made with the first post
   PostURLs _postURLs;
 
-  // Guarded by mutex().
-  EventBatch _batchedEvents;
+  EventBatch _batchedEvents GUARDED_BY(mutex());
 };
 
 // A user info's text under that key; a number counts as its decimal text.

@@ -61,12 +61,12 @@ UploadBackend::UploadBackend(Made, BackendServices& services, std::string name, 
 }
 
 std::optional<std::string> UploadBackend::uploadURL() const {
-  const std::lock_guard lock(mutex());
+  const platform::MutexLock lock(mutex());
   return _uploadURL;
 }
 
 void UploadBackend::setUploadURL(std::optional<std::string> url) {
-  const std::lock_guard lock(mutex());
+  const platform::MutexLock lock(mutex());
   _uploadURL.swap(url);
 }
 

@@ -35,7 +35,7 @@ class UploadBackend final : public OrvantaBackend {
                                                    std::string body) const;
   static void handleAnswer(const std::string& uploadURL, const UploadFile& file, const platform::HttpResult& result);
 
-  std::optional<std::string> _uploadURL;  // guarded by mutex()
+  std::optional<std::string> _uploadURL GUARDED_BY(mutex());
 };
 
 }  // namespace orvanta
