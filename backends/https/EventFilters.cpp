@@ -58,7 +58,7 @@ Result<EventFilters> EventFilters::createFiltersFromArray(const Array& definitio
       // Letters beyond ASCII may change their length with their case.
       made._keyBits |= isAscii(*rule.key) ? bitOf(*rule.key) : ~std::uint64_t{0};
       made._namesReservedKey |= std::any_of(kReservedKeyNames.begin(), kReservedKeyNames.end(),
-                                            [&](std::string_view name) { return equalsIgnoringCase(name, *rule.key); });
+                                            [&](std::string_view name) { return equalsFolded(name, *rule.key); });
     }
     made._filters.push_back(std::move(rule));
   }
@@ -69,7 +69,7 @@ const FilterRule* EventFilters::search(std::string_view key, std::int32_t method
   for (const FilterRule& rule : _filters) {
     if (rule.method >= 0 && rule.method != method) continue;
     if (rule.status >= 0 && rule.status != status) continue;
-    if (rule.key && equalsIgnoringCase(*rule.key, key)) return &rule;
+    if (rule.key && equalsFolded(*rule.key, key)) return &rule;
   }
   return nullptr;
 }

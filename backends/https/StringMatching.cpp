@@ -113,7 +113,7 @@ std::string foldCase(std::string_view text) {
   return folded;
 }
 
-bool equalsIgnoringCase(std::string_view a, std::string_view b) {
+bool equalsFolded(std::string_view a, std::string_view b) {
   while (!a.empty() && !b.empty()) {
     if (fold(takeCodePoint(a)) != fold(takeCodePoint(b))) return false;
   }
@@ -123,7 +123,7 @@ bool equalsIgnoringCase(std::string_view a, std::string_view b) {
 bool matchExactStringWithList(const TextList& list, const std::optional<std::string>& wholeString, bool whitelist) {
   if (const auto answer = answerWithoutSearch(list, wholeString, whitelist)) return *answer;
   return std::any_of(list.begin(), list.end(),
-                     [&](const std::string& element) { return equalsIgnoringCase(element, *wholeString); });
+                     [&](const std::string& element) { return equalsFolded(element, *wholeString); });
 }
 
 bool matchStringWithList(const TextList& list, const std::optional<std::string>& wholeString, bool whitelist) {

@@ -13,7 +13,7 @@ namespace orvanta {
 
 std::string foldCase(std::string_view text);
 // Allocates nothing.
-bool equalsIgnoringCase(std::string_view a, std::string_view b);
+bool equalsFolded(std::string_view a, std::string_view b);
 
 // Whether the string is on the list: as a whole element, or with some element occurring in it (an empty element occurs
 // in every string). `whitelist` decides only where the list cannot: an empty or absent list gives `whitelist`, an

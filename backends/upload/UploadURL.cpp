@@ -4,6 +4,8 @@
 
 #include <algorithm>
 
+#include "platform/core/Text.h"
+
 namespace orvanta {
 
 namespace {
@@ -33,20 +35,7 @@ bool isSchemeCharacter(char c) {
 }  // namespace
 
 std::string percentEncodeForQuery(std::string_view text) {
-  constexpr std::string_view kDigits = "0123456789ABCDEF";
-  std::string encoded;
-  encoded.reserve(text.size());
-  for (const char c : text) {
-    if (isQueryCharacter(c)) {
-      encoded += c;
-    } else {
-      const auto byte = static_cast<unsigned char>(c);
-      encoded += '%';
-      encoded += kDigits[byte >> 4U];
-      encoded += kDigits[byte & 0xfU];
-    }
-  }
-  return encoded;
+  return platform::percentEncode(text, isQueryCharacter);
 }
 
 std::string_view lastPathComponent(std::string_view path) {
