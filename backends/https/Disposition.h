@@ -14,6 +14,19 @@ enum class Disposition {
 
 // The one decision that every event for an HTTPS backend meets. `batches`: the backend collects what is not realtime.
 // `knowsUser`: the session has user info, or needs none. Pure.
-Disposition disposition(BackendState state, EventFlag flag, bool batches, bool knowsUser);
+constexpr Disposition disposition(BackendState state, EventFlag flag, bool batches, bool knowsUser) {
+  switch (state) {
+    case kBackendDisabled:
+      return Disposition::drop;
+    case kBackendWaiting:
+      return Disposition::batch;  // realtime ones too: whether they may leave is not decided
+    case kBackendHeld:
+      if (!isPromoting(flag)) return Disposition::batch;
+      break;  // it is enabled by this very event
+    case kBackendEnabled:
+      break;
+  }
+  return knowsUser && (isRealtime(flag) || !batches) ? Disposition::post : Disposition::batch;
+}
 
 }  // namespace orvanta
