@@ -39,7 +39,7 @@ struct BackendIdentity {
   platform::TimeValue startTimestamp;  // of the session
 };
 
-// What a session makes its backends with, besides each one's name and profile.
+// Everything that a session makes its backends with, besides each one's name and profile.
 struct BackendSetup {
   BackendIdentity identity;
   bool batchEvents = false;   // until an evaluation says otherwise

@@ -7,7 +7,7 @@
 
 namespace orvanta {
 
-// What a client asks for with an event. Clients may send any other number; it asks for nothing.
+// A client's request with an event. Clients may send any other number; it asks for nothing.
 enum class EventFlag : std::int32_t {
   none = 0,
   realtime = 1,            // goes at once, past the batch

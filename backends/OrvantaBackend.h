@@ -20,7 +20,7 @@
 
 namespace orvanta {
 
-// Whether and how a backend reports.
+// How a backend reports.
 enum BackendState : std::int32_t {
   kBackendWaiting = 0,   // batches its events until there is user info to decide by
   kBackendDisabled = 1,  // drops them
@@ -28,7 +28,8 @@ enum BackendState : std::int32_t {
   kBackendHeld = 3,      // batches them; a promoting one turns it to enabled
 };
 
-// Called exactly once: the text of what was flushed or none, and an error or none. Any thread, none of our locks held.
+// Called exactly once, with the text of what was flushed and the error, each of which may be nullopt. On any thread,
+// with no lock of ours held.
 using FlushCompletion = platform::UniqueFunction<void(std::optional<std::string>, std::optional<OrvantaError>)>;
 
 // One way to deliver a session's events. Every operation that a backend has no use for has a harmless default.
@@ -97,7 +98,7 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
   static std::string convertIntoSHA256(std::string_view text);
 
  protected:
-  // What sendMessage() does with the event once it has its number.
+  // Sends the event, which has its number now.
   virtual std::optional<std::string> sendNumbered(const Event& event);
 
   BackendServices& services() const { return _services; }
@@ -106,7 +107,7 @@ class OrvantaBackend : public std::enable_shared_from_this<OrvantaBackend> {
   void setDisplayURL(std::optional<std::string> url) { _displayURL = std::move(url); }
   void setEventWhitelist(std::optional<std::vector<std::int32_t>> list) { _eventWhitelist = std::move(list); }
   void setEventBlacklist(std::optional<std::vector<std::int32_t>> list) { _eventBlacklist = std::move(list); }
-  // For subclasses whose rules are compare-exchange.
+  // For changes that depend on the present state.
   std::atomic<BackendState>& stateCell() { return _state; }
   // The backend's one lock.
   platform::Mutex& mutex() const RETURN_CAPABILITY(_mutex) { return _mutex; }

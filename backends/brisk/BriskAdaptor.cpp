@@ -12,7 +12,7 @@ namespace {
 
 constexpr const char* kBundle = "/Tamberline.bundle/Bundles/HQXPerformance.bundle";
 
-// The plug-in's class; null, with the reason in the log, when there is none to be had.
+// The plug-in's class; null, with the reason in the log, when it cannot be had.
 const OrvantaPluginClass* findAdaptorClass(BackendServices& services) {
   const std::string directory = services.platform().files().plugInsDirectory + kBundle;
   const platform::LoadedBundle* loaded = services.plugIns.load(directory);
@@ -44,7 +44,7 @@ OrvantaPluginOperation findForwardingOperation(const OrvantaPluginClass& adaptor
 }  // namespace
 
 std::unique_ptr<BriskAdaptor> BriskAdaptor::create(BackendServices& services) {
-  const platform::BlockingScope blocking;  // what a plug-in does takes as long as it likes, here and below
+  const platform::BlockingScope blocking;  // a plug-in may take as long as it likes, here and below
   const OrvantaPluginClass* adaptorClass = findAdaptorClass(services);
   if (adaptorClass == nullptr) return nullptr;
   void* const instance = adaptorClass->create();

@@ -21,7 +21,7 @@ using std::chrono::steady_clock;
 
 constexpr std::size_t kReceiveBuffer = 1088;
 // A turn of reading ends after so many datagrams, so that a flood leaves other queues their turn. After as many in a
-// row that nothing waited for, each turn waits for the pause, and the system drops what is too much meanwhile.
+// row that nothing waited for, each turn waits for the pause, and the system drops the excess meanwhile.
 constexpr int kReadsPerTurn = 256;
 constexpr milliseconds kFloodPause{2};
 
@@ -104,7 +104,7 @@ DashboardBackend::DashboardBackend(Made, BackendServices& services, std::string 
       _networkProcQueue(services.platform().pool().makeQueue()),
       _socket(std::move(socket)) {}
 
-// Nothing is armed any more, since what is armed holds the backend.
+// Nothing is armed any more: armed timers and watches hold the backend.
 DashboardBackend::~DashboardBackend() = default;
 
 bool DashboardBackend::setUp(const std::optional<std::string>& serverIP, std::uint16_t serverPort) {

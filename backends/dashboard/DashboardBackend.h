@@ -19,11 +19,11 @@ namespace orvanta {
 //
 // The owner's calls come on the session's queue. Everything that touches the socket runs on the backend's own network
 // queue, and that queue is its only lock. Armed timers and watches hold the backend; cleanup() disarms them for good,
-// now or when nothing is left to deliver, closes the socket and so lets the backend go. The timer is armed only while a
-// datagram or the clean-up waits for it, always at a multiple of the period from creation: an idle backend wakes
-// nobody.
+// now or when nothing is left to deliver, closes the socket and so releases the backend. The timer is armed only while
+// a datagram or the clean-up waits for it, always at a multiple of the period from creation: an idle backend causes no
+// wake-ups.
 //
-// Nothing is reported of datagrams that get lost. A send after the clean-up goes nowhere.
+// Lost datagrams are not reported. A send after the clean-up goes nowhere.
 class DashboardBackend final : public OrvantaBackend {
   struct Made {};  // only the factories have one
 
@@ -39,8 +39,8 @@ class DashboardBackend final : public OrvantaBackend {
                    const BackendSetup& setup, platform::UdpSocket socket);
   ~DashboardBackend() override;
 
-  // Blocks for the whole exchange. Whether the server took it, whatever its status; where it went is announced by an
-  // event of category 0 and type 2.
+  // Blocks for the whole exchange. Returns whether the server answered with a text, whatever its status; an event of
+  // category 0 and type 2 announces where the data went.
   bool uploadLogData(const SharedArray& logData) override;
   void cleanup() override;
 

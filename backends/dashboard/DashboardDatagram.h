@@ -25,7 +25,7 @@ inline constexpr std::size_t kDashboardEventNumberOffset = 60;  // in a datagram
 // The header's fields in host order; on the wire they follow each other big-endian, without gaps.
 struct DashboardHeader {
   static constexpr std::uint16_t kModeAcknowledged = 1;    // the server is to acknowledge
-  static constexpr std::uint16_t kModeExplicitServer = 2;  // the server's address came from no profile
+  static constexpr std::uint16_t kModeExplicitServer = 2;  // the server's address did not come from a profile
 
   std::uint8_t versionMajor = 0;
   std::uint8_t clientType = 0;
@@ -52,7 +52,7 @@ struct DashboardPacket {
   std::string text;
 };
 
-// What a backend puts into every datagram.
+// The fields that a backend puts into every datagram.
 struct DashboardSender {
   std::uint8_t versionMajor = 0;
   std::int32_t clientType = 0;
@@ -70,11 +70,11 @@ std::vector<std::uint8_t> encodeDashboardDatagram(const DashboardSender& sender,
 // A failure says what is wrong: shorter than a header, another marker, a length that is not the datagram's.
 Result<DashboardPacket> decodeDashboardDatagram(std::span<const std::uint8_t> datagram);
 
-// The pairs of a datagram's text, unescaped, for keys without spaces and "=". What a cut left of a pair before its "="
-// cannot be told from the end of the value before it.
+// The pairs of a datagram's text, unescaped, for keys without spaces and "=". A pair that was cut before its
+// "=" cannot be told from the end of the value before it.
 std::vector<std::pair<std::string, std::string>> parseDashboardText(std::string_view text);
 
-// The log line of a datagram that encodeDashboardDatagram() made, or that decodes; none when it is not UTF-8.
+// The log line of a datagram that encodeDashboardDatagram() made, or that decodes; nullopt when it is not UTF-8.
 std::optional<std::string> writeLocalLog(std::span<const std::uint8_t> datagram);
 
 }  // namespace orvanta

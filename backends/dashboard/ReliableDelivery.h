@@ -27,8 +27,8 @@ struct UDPPacketToSend {
   std::vector<std::uint8_t> data;  // the whole datagram
 };
 
-// Which datagrams are kept, when they are sent again and when they are given up: the bookkeeping of delivery over UDP,
-// without a socket or a clock.
+// Decides which datagrams are kept, when they are sent again and when they are given up: the bookkeeping of delivery
+// over UDP, without a socket or a clock.
 //
 // Plain delivery keeps only what could not be sent, until it can. Acknowledged delivery keeps every datagram until its
 // event number is acknowledged or its four retransmissions are used up:
@@ -39,7 +39,7 @@ struct UDPPacketToSend {
 // Owned by one DashboardBackend and used on its network queue only. Nothing here fails.
 class ReliableDelivery {
  public:
-  // Sends a datagram; whether the whole of it went out.
+  // Sends a datagram and returns whether the whole of it went out.
   using Send = std::function<bool(std::span<const std::uint8_t>)>;
 
   static constexpr std::size_t kCapacity = 50;  // one more drops the oldest
@@ -51,7 +51,7 @@ class ReliableDelivery {
   void sent(std::vector<std::uint8_t> datagram, std::uint16_t eventNumber, bool whole);
   // One period of the timer has passed.
   void tick(const Send& send);
-  // Whether a datagram was waiting for that number; the oldest such one is gone now.
+  // Forgets the oldest datagram with that number. Returns whether there was one.
   bool acknowledged(std::uint16_t eventNumber);
 
   bool empty() const { return _messageQueue.empty(); }

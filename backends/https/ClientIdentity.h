@@ -6,7 +6,7 @@
 
 namespace orvanta {
 
-// Under which identifier a backend posts. Used on the session's queue.
+// Chooses the identifier under which a backend posts. Used on the session's queue.
 class ClientIdentity {
  public:
   // How the user's consent and the storebag stand to each other.
@@ -34,7 +34,7 @@ class ClientIdentity {
  private:
   const std::string _uuidRespectDnu;
   const std::string _uuidOverrideDnu;
-  std::string _uuidCustom;  // empty: none
+  std::string _uuidCustom;  // empty until a section asks for it
   DnuType _dnuType = kConsentRespected;
   std::int32_t _extrasOnInternal = 0;
 };

@@ -5,7 +5,7 @@
 
 namespace orvanta {
 
-// What becomes of one event.
+// The fate of one event.
 enum class Disposition {
   drop,
   batch,  // it waits for a flush

@@ -15,8 +15,8 @@ namespace orvanta {
 // flush that sent. Owned by an HTTPSPostBackend and guarded by its mutex; what is taken out belongs to the taker.
 class EventBatch {
  public:
-  // Waiting events, and the identifier that the first `relabelledCount` of them report instead of their own (none: they
-  // report none).
+  // Waiting events, and the identifier that the first `relabelledCount` of them report instead of their own (nullopt:
+  // they report none).
   struct Events {
     std::vector<EventRecord> records;
     std::size_t relabelledCount = 0;

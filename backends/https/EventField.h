@@ -11,13 +11,14 @@
 
 namespace orvanta {
 
-// What a field of an event may hold: a text, a number (booleans are numbers and stay booleans), or a date, which is
-// sent as its seconds since 1970 (-1.0 when not finite). Everything else, NaN and infinities included, is never sent.
+// Values that a field of an event may hold: a text, a number (booleans are numbers and stay booleans), or a date, which
+// is sent as its seconds since 1970 (-1.0 when not finite). Everything else, NaN and infinities included, is never
+// sent.
 
-// Appends the field's value as JSON. False, with nothing appended, for what is never sent.
+// Appends the field's value as JSON. Returns false, with nothing appended, for values that are never sent.
 bool appendFieldValue(std::string& out, const Value& value);
 // The text that a digest filter hashes: a text as it is, numbers and dates as the decimal text of what would be sent
-// (booleans as 1 and 0). None for what is never sent, which a digest must not make sendable.
+// (booleans as 1 and 0). Nullopt for values that are never sent, which a digest must not make sendable.
 std::optional<std::string> textForDigest(const Value& value);
 
 // Writes the fields of one event's JSON object, compact or indented for people, in the order of the calls. Borrows the

@@ -16,19 +16,20 @@ struct FilterRule {
   std::int32_t method = -1;  // category; negative: any
   std::int32_t status = -1;  // type; negative: any
   Action action = Action::none;
-  std::optional<std::string> key;  // compared without case; none: never matches
+  std::optional<std::string> key;  // compared without case; a rule without one never matches
 };
 
-// The table of what must not leave the device as it is: built once per evaluation, scanned for every field of every
-// event. Owned by its backend and used on the session's queue; immutable. Fields that no rule names cost no allocation.
+// The table of fields that must not leave the device as they are: built once per evaluation, scanned for every field of
+// every event. Owned by its backend and used on the session's queue; immutable. Fields that no rule names cost no
+// allocation.
 class EventFilters {
  public:
   EventFilters() = default;
-  // Refused, with the reason, when an element makes no sense: a table that lost a rule would let a field through.
+  // Fails, with the reason, when an element is invalid: a table that lost a rule would let a field through.
   static Result<EventFilters> createFiltersFromArray(const Array& definitions);
 
   bool empty() const { return _filters.empty(); }
-  // Whether some rule may name one of the reserved keys.
+  // Returns whether a rule may name one of the reserved keys.
   bool namesReservedKey() const { return _namesReservedKey; }
 
   // The first rule, in table order, for that field of an event of that category and type; null when there is none.
@@ -53,8 +54,8 @@ class EventFilters {
   bool _namesReservedKey = false;
 };
 
-// What a digest rule makes of a value: 64 hexadecimal digits over its text; none when the value can never be sent, so
-// that the field is to be removed.
+// The digest of a value: 64 hexadecimal digits over its text. Nullopt when the value can never be sent, so that the
+// field is to be removed.
 std::optional<std::string> digestOf(const Value& value);
 
 }  // namespace orvanta

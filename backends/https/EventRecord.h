@@ -40,7 +40,7 @@ class EventRecord {
   EventRecord(std::shared_ptr<const SessionFields> fields, Event event, std::optional<std::string> combinedSessionID,
               std::int32_t timezoneOffset);
 
-  // Merges the user info (null: none) and applies the filters. Once.
+  // Merges the user info, which may be null, and applies the filters. Called once.
   void prepare(std::shared_ptr<const RecordLayer> userInfo, const EventFilters& filters);
 
   // The integer reading of the prepared record's "_method", 0 when user info or a filter left none.
@@ -48,7 +48,7 @@ class EventRecord {
   // About how much memory the record keeps alive, in bytes.
   std::size_t footprint() const;
 
-  // What is laid over a batched record.
+  // The layers over a batched record.
   struct Overlay {
     bool relabelled = false;                 // "_sessionID" is `sessionID`, whatever the record held
     const std::string* sessionID = nullptr;  // null: removed
@@ -58,10 +58,10 @@ class EventRecord {
   void write(FieldWriter& writer, const Overlay& overlay) const;
 
  private:
-  // What a filter made of the field that was visible under the key.
+  // A filter's work on the field that was visible under the key.
   struct Change {
     std::string_view key;               // in a layer that the record shares
-    std::optional<std::string> digest;  // none: removed
+    std::optional<std::string> digest;  // nullopt: removed
   };
 
   std::int32_t visibleNumber(ReservedKey key) const;

@@ -126,7 +126,7 @@ std::optional<std::string> HTTPSPostBackend::batchEvent(PreparedEvent event) {
   };
   look();
   const bool reached = count > _eventThreshold;
-  // Held back events cannot be flushed; what that costs them is told below.
+  // Events that must not leave cannot be flushed; they are dropped below.
   const bool tooLarge =
       waitingBytes != 0 && waitingBytes + footprint > kMaximumBatchBytes && state() == kBackendEnabled;
   std::optional<std::string> flushed;
@@ -257,7 +257,7 @@ PostMessage HTTPSPostBackend::buildMessage(std::span<const OutgoingEvent> events
                                         events, showsMessages());
 }
 
-// People see what was sent where they have agreed to it, or where the environment is theirs and they have asked for it.
+// Users see what was sent where they consented to it; developers, in environments of theirs, where they asked for it.
 bool HTTPSPostBackend::showsMessages() const {
   if (_clientIdentity.dnuType() == ClientIdentity::kConsentRespected && _consentGiven) return true;
   if (!_forceEventLogging) return false;

@@ -42,7 +42,7 @@ class HTTPSPostBackend final : public OrvantaBackend {
 
   const std::optional<std::string>& postURL() const { return _postURLs.postURL(); }
   void setPostURL(std::optional<std::string> url) { _postURLs.setPostURL(std::move(url)); }
-  // Why the last evaluation that was not frozen came out as it did; none before the first.
+  // Why the last evaluation that was not frozen came out as it did; nullopt before the first.
   const std::optional<ReportingReason>& reason() const { return _reason; }
 
   // A batch that would take more memory than this is flushed like one that has reached its event threshold.

@@ -1,4 +1,4 @@
-// HTTPSPostBackend: its evaluation, from the facts to the settings taken.
+// HTTPSPostBackend: how it gathers the facts of an evaluation and takes its settings.
 
 #include "backends/https/HTTPSPostBackend.h"
 #include "config/DeviceInfo.h"

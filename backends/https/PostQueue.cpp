@@ -19,7 +19,7 @@ bool isServerError(int status) {
 
 }  // namespace
 
-// What is done when the post has ended. Shared by the two callbacks of the request; if both are dropped uncalled, the
+// Ends the post. Shared by the two callbacks of the request; if both are dropped uncalled, the
 // completion hears of that.
 class PostQueue::Outcome {
  public:
@@ -31,8 +31,8 @@ class PostQueue::Outcome {
     if (_completion) complete(makeOrvantaError("the post was dropped", kLocalFailure));
   }
 
-  // On the HTTP client's thread. Whether finish() has anything to do: most posts are taken, and nobody waits for them.
-  // The backend, if this was its last reference, is let go of there.
+  // On the HTTP client's thread. Returns whether finish() has anything to do: most posts are taken and have no
+  // completion. finish() releases the backend, whose last reference this may be.
   bool observe(const platform::HttpResult& result) {
     if (!result.response) return true;
     if (!isServerError(result.response->status)) return static_cast<bool>(_completion);

@@ -12,10 +12,10 @@
 
 namespace orvanta {
 
-// Called exactly once with what came of the post: an error or none. Any thread, none of our locks held.
+// Called exactly once when the post has ended, with the error or nullopt. On any thread, with no lock of ours held.
 using PostCompletion = platform::UniqueFunction<void(std::optional<OrvantaError>)>;
 
-// One post on its way, from the hand-in to its completion.
+// One post on its way, from its submission to its completion.
 struct Post {
   std::string url;
   std::vector<platform::HttpHeader> headers;  // those that depend on the body are added behind them

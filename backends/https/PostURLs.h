@@ -18,7 +18,7 @@ inline const std::string* suppliedPostURL(const Dictionary& section, bool fixed)
 // replaces the earlier. Used on the session's queue.
 class PostURLs {
  public:
-  // What the user defaults say.
+  // From the user defaults.
   PostURLs(std::optional<std::string> postURL, std::optional<std::string> realtimePostURL);
 
   // Takes the section's URLs where none is fixed. Realtime events without a URL of their own go where others go.

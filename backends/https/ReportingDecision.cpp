@@ -105,7 +105,7 @@ bool passesTests(ReportingDecision& decision, const Dictionary& section, const R
     reason.test = ReportingTest::consentMissing;
     if (!facts.consentGiven) return false;
   }
-  // An unknown country passes any list that has an entry; without one nobody reports.
+  // An unknown country passes any list that has an entry; without one no device reports.
   if (!matchStringWithList(textsUnder(section, StorebagKey::localeWhitelist), facts.countryCode, false)) {
     return refuseByList(reason, ReportingTest::countryNotListed, section, StorebagKey::localeWhitelist,
                         facts.countryCode);

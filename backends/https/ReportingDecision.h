@@ -13,7 +13,7 @@
 
 namespace orvanta {
 
-// What an evaluation looks at besides the storebag.
+// The facts that an evaluation looks at besides the storebag.
 struct ReportingFacts {
   std::optional<std::string> clientName;
   std::optional<std::string> serviceName;
@@ -28,12 +28,12 @@ struct ReportingFacts {
   bool postURLFixed = false;  // by a user default, so that no section supplies it
 };
 
-// What an evaluation wants taken, in the order in which it is to be taken. What is none stays as it was. Pointers lead
-// into the profile.
+// The settings that an evaluation decides, in the order in which they take effect. One that is nullopt stays as it was.
+// Pointers lead into the profile.
 struct ReportingSettings {
   struct CountryThreshold {
     std::string countryCode;
-    double from = 0;  // 0 when there was none, as is `to`
+    double from = 0;  // 0 without a threshold; so is `to`
     double to = 0;
   };
   struct Sampling {
@@ -70,8 +70,8 @@ struct ReportingDecision {
   ReportingSettings settings;
 };
 
-// Whether and how a backend with this profile reports. Pure: no clock, no logs, no I/O. Elements of "clients" that are
-// no dictionaries are passed over; a chosen section whose restrictions make no sense reports nothing.
+// Decides whether and how a backend with this profile reports. Pure: no clock, no logs, no I/O. Elements of "clients"
+// that are not dictionaries are passed over; a chosen section with invalid restrictions reports nothing.
 ReportingDecision evaluate(const Dictionary& profile, const ReportingFacts& facts);
 
 }  // namespace orvanta

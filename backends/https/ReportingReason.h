@@ -13,10 +13,10 @@ enum class ReportingTest {
   noClientList,         // the profile lists no client sections
   userInfoNotRequired,  // enabled without further tests
   waitingForUserInfo,   // the session requires user info and has none yet
-  noSectionMatches,     // none for this client and service
+  noSectionMatches,     // no section is for this client and service
   versionTooLow,        // sections for this client and service, each for newer versions
   // In the section that was chosen.
-  malformedSection,  // a key whose value makes no sense
+  malformedSection,  // a key has an invalid value
   consentMissing,
   countryNotListed,
   familyNotListed,

@@ -12,7 +12,7 @@
 namespace orvanta {
 
 // The reserved fields that are the same in every event of a session, and their JSON, written once. Immutable; shared by
-// the records of the session, which outlive their backend in no case but tests.
+// the records of the session, which outlive their backend only in tests.
 struct SessionFields {
   static std::shared_ptr<const SessionFields> of(const BackendIdentity& identity, bool internalBuild);
 

@@ -15,9 +15,9 @@ std::string foldCase(std::string_view text);
 // Allocates nothing.
 bool equalsFolded(std::string_view a, std::string_view b);
 
-// Whether the string is on the list: as a whole element, or with some element occurring in it (an empty element occurs
-// in every string). `whitelist` decides only where the list cannot: an empty or absent list gives `whitelist`, an
-// absent string its opposite.
+// Return whether the string is on the list: as a whole element, or with some element occurring in it (an empty element
+// occurs in every string). `whitelist` decides only where the list cannot: an empty or absent list gives `whitelist`,
+// an absent string its opposite.
 using TextList = std::vector<std::string>;
 bool matchExactStringWithList(const TextList& list, const std::optional<std::string>& wholeString, bool whitelist);
 bool matchStringWithList(const TextList& list, const std::optional<std::string>& wholeString, bool whitelist);

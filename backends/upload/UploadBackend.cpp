@@ -14,7 +14,7 @@ namespace orvanta {
 
 namespace {
 
-// What is read at most. One byte beyond the bound tells a whole file from the start of one.
+// The most that is read. One byte beyond the bound tells a whole file from the start of one.
 std::uint64_t bytesToRead(std::uint64_t size) {
   return size > 0 ? size : kMaximumUnsizedUploadBytes + 1;
 }
@@ -24,7 +24,7 @@ std::optional<std::string> textAt(const SharedDictionary& dictionary, StorebagKe
   return text == nullptr ? std::nullopt : std::optional(*text);
 }
 
-// The file's content, compressed; none when there is nothing to send, with the reason in the log.
+// The file's content, compressed; nullopt, with the reason in the log, when there is nothing to send.
 std::optional<std::string> compressedContent(const platform::ExtensionHandle& handle, std::uint64_t size) {
   const platform::BlockingScope blocking;  // a slow file system, and seconds of compression
   const std::optional<std::string> content = handle.read(static_cast<std::size_t>(bytesToRead(size)));

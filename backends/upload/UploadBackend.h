@@ -22,7 +22,7 @@ class UploadBackend final : public OrvantaBackend {
                                                const BackendSetup& setup);
   UploadBackend(Made, BackendServices& services, std::string name, SharedDictionary profile, const BackendSetup& setup);
 
-  // Whether the request was made, whatever came of it. A file above UploadBudget::kMaximumFileBytes is refused.
+  // Returns whether the request was made, whatever came of it. A file above UploadBudget::kMaximumFileBytes is refused.
   bool uploadFileAtPath(const UploadFile& file) override;
 
   // Any thread.
@@ -30,7 +30,7 @@ class UploadBackend final : public OrvantaBackend {
   void setUploadURL(std::optional<std::string> url);
 
  private:
-  // The whole request, or none when the upload must not be made; the reason is logged.
+  // The whole request; nullopt, with the reason in the log, when the upload must not be made.
   std::optional<platform::HttpRequest> makeRequest(const std::string& uploadURL, const UploadFile& file,
                                                    std::string body) const;
   static void handleAnswer(const std::string& uploadURL, const UploadFile& file, const platform::HttpResult& result);

@@ -19,8 +19,8 @@ std::string_view lastPathComponent(std::string_view path);
 std::string fileUploadURL(std::string_view uploadURL, std::string_view deviceID, std::uint32_t sessionID,
                           std::string_view path);
 
-// Whether the text is an absolute URL with a host, made of characters that URLs are made of, each "%" followed by two
-// hexadecimal digits.
+// Returns whether the text is an absolute URL with a host, made of characters that URLs may hold, each "%" followed by
+// two hexadecimal digits.
 bool isValidURL(std::string_view text);
 
 }  // namespace orvanta

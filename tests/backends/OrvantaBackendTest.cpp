@@ -54,7 +54,7 @@ TEST_F(OrvantaBackendTest, Lists) {
   backend.setEventWhitelist(List{-1, 12, 65536});
   backend.setEventBlacklist(List{12});
   EXPECT_TRUE(backend.isWhitelistedEvent(12) && backend.isBlacklistedEvent(12));
-  EXPECT_FALSE(backend.isWhitelistedEvent(0)) << "65536 is no category, and not category 0";
+  EXPECT_FALSE(backend.isWhitelistedEvent(0)) << "65536 is not a category, and not category 0";
   EXPECT_FALSE(backend.isWhitelistedEvent(65535)) << "neither is -1";
 }
 

@@ -108,7 +108,7 @@ TEST(DashboardDatagram, CutsTheTextAt1023Bytes) {
     EXPECT_EQ(textOf(datagram), text);
     EXPECT_EQ(datagram.size(), 1087U);
     EXPECT_EQ(decodeDashboardDatagram(datagram)->header.length(), 1087U);
-    EXPECT_EQ(writeLocalLog(datagram).has_value(), text.back() != '\xC3') << "half a character is no text";
+    EXPECT_EQ(writeLocalLog(datagram).has_value(), text.back() != '\xC3') << "half a character is not text";
   }
   Dictionary numbered;
   std::string expected;
@@ -117,7 +117,7 @@ TEST(DashboardDatagram, CutsTheTextAt1023Bytes) {
   EXPECT_EQ(textOf(datagramOf(numbered)), expected.substr(0, 1023));
 }
 
-TEST(DashboardDatagram, RefusesWhatIsNone) {
+TEST(DashboardDatagram, RefusesOtherBytes) {
   using Bytes = std::vector<std::uint8_t>;
   const auto good = datagramOf({{"a", 1}});
   Bytes longer = good, marked = good;

@@ -24,14 +24,14 @@ inline SharedDictionary shared(Dictionary dictionary) {
 std::string gunzip(const std::string& bytes);
 // The body as it was before compression.
 std::string plainBody(const platform::HttpRequest& request);
-// The posted envelope, and its events; empty, with a failure, when the body is none.
+// The posted envelope, and its events; empty, with a failure, when the body does not parse.
 Dictionary envelopeOf(const platform::HttpRequest& request);
 std::vector<Dictionary> postedEvents(const platform::HttpRequest& request);
 std::string headerOf(const platform::HttpRequest& request, std::string_view name);
 
 using TestBackends = TestServices<BackendServices>;
 
-// What a flush told its caller.
+// The answer that a flush gave its caller.
 struct FlushAnswer {
   int calls = 0;
   std::optional<std::string> text;

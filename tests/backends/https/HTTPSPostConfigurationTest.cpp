@@ -7,7 +7,7 @@ namespace {
 
 class HTTPSPostConfigurationTest : public HTTPSFixture {
  protected:
-  // Where an event with that flag goes; none when no post was made.
+  // The URL to which an event with that flag goes; nullopt when no post was made.
   std::optional<std::string> urlOf(HTTPSPostBackend& backend, std::int32_t flag) {
     platform.http.clear();
     send(backend, 1, flag);

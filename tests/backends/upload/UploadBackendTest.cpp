@@ -103,7 +103,7 @@ TEST_F(UploadBackendTest, AFileThatDoesNotTellItsSizeGoesWholeOrNotAtAll) {
   EXPECT_EQ(platform.http.requests().size(), 1U);
 }
 
-TEST_F(UploadBackendTest, RefusesWhatIsNoReadableRegularFile) {
+TEST_F(UploadBackendTest, RefusesAllButReadableRegularFiles) {
   const std::string& directory = platform.directory.path();
   const std::string file = platform.directory.write("file", "content");
   const std::string sparse = platform.directory.write("sparse", "");
@@ -142,7 +142,7 @@ TEST_F(UploadBackendTest, ReadsThroughTheDescriptorFromTheBeginningAndNeverByThe
   const UniqueFd fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
   ::lseek(fd.get(), 5, SEEK_SET);
   std::filesystem::remove(path);
-  platform.directory.write("file", "somebody else's");
+  platform.directory.write("file", "another's");
   EXPECT_TRUE(upload(path, fd.get()));
   const auto request = platform.http.requests().at(0);
   EXPECT_EQ(request.url, fileUploadURL("http://up.example/u", "D", 7, path));
