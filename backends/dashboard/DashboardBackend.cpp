@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cassert>
 #include <new>
 #include <span>
 #include <utility>
@@ -235,6 +236,7 @@ void DashboardBackend::cleanup() {
 // --- On the network queue ---
 
 void DashboardBackend::tryToSendMsg(std::vector<std::uint8_t> datagram, std::uint16_t eventNumber) {
+  assert(_networkProcQueue->isCurrent());
   if (!_socket.isOpen()) return;
   const bool whole = _socket.send(datagram);
   _delivery.sent(std::move(datagram), eventNumber, whole);
@@ -242,6 +244,7 @@ void DashboardBackend::tryToSendMsg(std::vector<std::uint8_t> datagram, std::uin
 }
 
 void DashboardBackend::myPeriodicTask() {
+  assert(_networkProcQueue->isCurrent());
   _delivery.tick([this](std::span<const std::uint8_t> datagram) { return _socket.send(datagram); });
   if (_cleanupState != CleanupState::none) {
     if (_delivery.empty()) {
@@ -259,6 +262,7 @@ void DashboardBackend::myPeriodicTask() {
 }
 
 void DashboardBackend::processSocketRead() {
+  assert(_networkProcQueue->isCurrent());
   std::array<std::uint8_t, kReceiveBuffer> buffer;
   int datagrams = 0;
   while (datagrams < kReadsPerTurn) {
@@ -280,10 +284,12 @@ void DashboardBackend::processSocketRead() {
 }
 
 void DashboardBackend::watchSocket() {
+  assert(_networkProcQueue->isCurrent());
   if (_readSource) _readSource->whenReadable([self = self()] { self->processSocketRead(); });
 }
 
 void DashboardBackend::updateTimer() {
+  assert(_networkProcQueue->isCurrent());
   const bool needed = _timer && (!_delivery.empty() || _cleanupState != CleanupState::none);
   if (needed == _timerArmed) return;
   _timerArmed = needed;
@@ -300,6 +306,7 @@ void DashboardBackend::updateTimer() {
 
 // The sources are cancelled before the socket that they watch is closed.
 void DashboardBackend::cleanupSources() {
+  assert(_networkProcQueue->isCurrent());
   _timerArmed = false;
   _timer.reset();
   _lastResort.reset();

@@ -66,7 +66,7 @@ class DashboardBackend final : public OrvantaBackend {
   void setPeriod(const Value& reliable);
   std::shared_ptr<DashboardBackend> self();
 
-  // On the network queue.
+  // On the network queue, which they assert.
   void tryToSendMsg(std::vector<std::uint8_t> datagram, std::uint16_t eventNumber);
   void myPeriodicTask();
   void processSocketRead();
