@@ -14,6 +14,7 @@
 #include <mutex>
 #include <stdexcept>
 
+#include "backends/BackendServices.h"
 #include "backends/https/EventFilters.h"
 #include "backends/https/EventRecord.h"
 #include "backends/https/PostMessage.h"
