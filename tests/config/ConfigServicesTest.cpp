@@ -46,7 +46,9 @@ TEST(StorebagServer, isTheOverrideOrFollowsTheBuildOnce) {
   for (const auto& [setting, releaseType, expected] : rows) {
     TestServices<ConfigServices> platform;
     platform.device.release = releaseType;
-    if (setting) ASSERT_TRUE(platform.get().defaults().set("orvanta_storebag_url", *setting));
+    if (setting) {
+      ASSERT_TRUE(platform.get().defaults().set("orvanta_storebag_url", *setting));
+    }
     EXPECT_EQ(platform.services.storebagServerURL(), expected);
     EXPECT_EQ(platform.services.isInternalBuild(), releaseType == "Internal");
     platform.device.release = releaseType == "Internal" ? "Beta" : "Internal";

@@ -209,7 +209,9 @@ TEST_F(StorebagSelectionTest, takesTheEnvironmentsSection) {
     TestServices<ConfigServices> device;  // the environment is decided once
     installKey(device, signer.publicKeyDer(KeyLayout::subjectPublicKeyInfo));
     if (row.internalBuild) device.device.release = "Internal";
-    if (row.environment) ASSERT_TRUE(device.get().defaults().set("environmentType", *row.environment));
+    if (row.environment) {
+      ASSERT_TRUE(device.get().defaults().set("environmentType", *row.environment));
+    }
     device.http.answer = [&](const auto&) { return ScriptedHttpClient::status(200, signer.document(row.bag)); };
     log.clear();
     const auto chosen = fetchStorebagForEnvironmentAndClientType(device, 5, fetch);
