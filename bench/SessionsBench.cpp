@@ -14,7 +14,7 @@
 #include "bench/RawPeers.h"
 #include "bench/Stages.h"
 #include "daemon/OrvantadAgent.h"
-#include "platform/core/LogSink.h"
+#include "platform/core/Log.h"
 #include "tests/support/TestPlatform.h"
 
 namespace orvanta::bench {

@@ -12,7 +12,6 @@
 #include "config/UserDefaultKeys.h"
 #include "interface/OrvantaLogging.h"
 #include "platform/codec/PropertyList.h"
-#include "platform/core/NearestWord.h"
 #include "platform/core/Text.h"
 #include "platform/core/UniqueFd.h"
 

@@ -3,7 +3,7 @@
 #include "config/UserDefaultKeys.h"
 #include "interface/OrvantaConstants.h"
 #include "interface/OrvantaLogging.h"
-#include "platform/core/NearestWord.h"
+#include "platform/core/Text.h"
 
 namespace orvanta {
 

@@ -5,6 +5,8 @@
 #include <string>
 #include <string_view>
 
+#include "platform/core/Value.h"
+
 namespace orvanta::platform {
 
 // Small readings and forms of text that several folders need. Pure; any thread.
@@ -23,5 +25,12 @@ std::string errnoText(int error);
 std::string percentEncode(std::string_view text, bool (*keeps)(char));
 // "%41" becomes "A"; a "%" that does not begin an escape stays as it is.
 std::string percentDecode(std::string_view text);
+
+// The one of `known` (at least one) that takes the fewest changes to become `word`: what was probably meant.
+std::string_view nearestWord(std::string_view word, std::span<const std::string_view> known);
+
+// The keys of `dictionary` that are not among `known`, as `unknown key "acess", did you mean "access"?`; empty when all
+// are known.
+std::string describeUnknownKeys(const Dictionary& dictionary, std::span<const std::string_view> known);
 
 }  // namespace orvanta::platform

@@ -14,7 +14,7 @@
 #include "platform/core/FileStamp.h"
 #include "platform/core/Log.h"
 #include "platform/core/Mutex.h"
-#include "platform/core/NearestWord.h"
+#include "platform/core/Text.h"
 #include "platform/host/SystemFacts.h"
 
 namespace orvanta::platform {

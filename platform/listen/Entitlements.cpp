@@ -16,7 +16,6 @@
 
 #include "platform/codec/PropertyList.h"
 #include "platform/core/Log.h"
-#include "platform/core/NearestWord.h"
 #include "platform/core/Text.h"
 #include "platform/queue/WorkQueue.h"
 

@@ -18,7 +18,7 @@
 #include <string_view>
 #include <utility>
 
-#include "platform/core/NearestWord.h"
+#include "platform/core/Text.h"
 
 namespace orvanta::platform {
 

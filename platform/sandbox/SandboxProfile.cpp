@@ -5,7 +5,7 @@
 #include <algorithm>
 #include <utility>
 
-#include "platform/core/NearestWord.h"
+#include "platform/core/Text.h"
 #include "platform/sandbox/Landlock.h"
 
 namespace orvanta::platform {

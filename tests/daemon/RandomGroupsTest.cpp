@@ -13,7 +13,7 @@
 #include "interface/OrvantaConstants.h"
 #include "interface/RemoteCalls.h"
 #include "platform/codec/PropertyList.h"
-#include "platform/core/LogSink.h"
+#include "platform/core/Log.h"
 #include "tests/support/TestPlatform.h"
 
 namespace orvanta::test {

@@ -3,7 +3,7 @@
 
 #include "backends/https/HTTPSPostBackend.h"
 #include "config/Storebag.h"
-#include "platform/core/LogSink.h"
+#include "platform/core/Log.h"
 #include "tests/config/SignedStorebag.h"
 #include "tests/fuzz/Require.h"
 #include "tests/support/TestPlatform.h"

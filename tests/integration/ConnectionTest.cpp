@@ -6,7 +6,7 @@
 
 #include "interface/RemoteCalls.h"
 #include "tests/integration/IntegrationFixture.h"
-#include "tests/integration/RawClient.h"
+#include "tests/support/Peer.h"
 
 namespace orvanta::test {
 namespace {

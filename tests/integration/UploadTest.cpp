@@ -12,8 +12,8 @@
 
 #include "platform/codec/PropertyList.h"
 #include "tests/integration/IntegrationFixture.h"
-#include "tests/integration/RawClient.h"
 #include "tests/support/ForbiddenActs.h"
+#include "tests/support/Peer.h"
 
 namespace orvanta::test {
 namespace {

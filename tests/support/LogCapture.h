@@ -6,7 +6,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/core/LogSink.h"
+#include "platform/core/Log.h"
 
 namespace orvanta::test {
 

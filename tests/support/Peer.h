@@ -17,6 +17,7 @@
 #include "interface/RemoteCalls.h"
 #include "platform/codec/MessagePack.h"
 #include "platform/core/UniqueFd.h"
+#include "platform/ipc/Connect.h"
 #include "platform/ipc/Connection.h"
 #include "platform/ipc/FrameDecoder.h"
 #include "platform/ipc/SocketIo.h"
@@ -145,6 +146,14 @@ class Peer {
   platform::UniqueFd _socket;
   platform::FrameDecoder _decoder{kFrameLimits};
   std::vector<platform::UniqueFd> _descriptors;
+};
+
+// A client that speaks bytes, as good or as bad as a test wants.
+struct RawClient : Peer {
+  explicit RawClient(const std::string& directory)
+      : Peer(std::move(platform::connectToService(directory, "com.kovalt.orvantad").value())) {}
+  // The next answer; nullopt at the end.
+  std::optional<platform::Frame> answer() { return nextFrame(); }
 };
 
 }  // namespace orvanta::test

@@ -10,7 +10,7 @@
 #include <utility>
 
 #include "interface/OrvantaConstants.h"
-#include "platform/core/LogSink.h"
+#include "platform/core/Log.h"
 #include "platform/host/UserDefaults.h"
 #include "tools/orvantactl/Commands.h"
 #include "tools/orvantactl/JsonValues.h"

@@ -4,8 +4,10 @@
 
 #include <cmath>
 #include <limits>
+#include <tuple>
 
 #include "backends/OrvantaBackend.h"
+#include "backends/https/StringMatching.h"
 
 namespace orvanta {
 namespace {
@@ -83,6 +85,27 @@ TEST(EventFilters, DigestsOfEveryType) {
     Dictionary wanted{{"other", 1}};
     if (!expected.isNull()) wanted.set("k", expected);
     EXPECT_EQ(Value(event), Value(wanted)) << value.description();
+  }
+}
+
+TEST(StringMatching, EqualsFolded) {
+  const std::tuple<const char*, const char*, bool> rows[] = {
+      {"userName", "USERNAME", true},
+      {"Größe", "GRÖSSE", false},  // letters are folded one by one
+      {"GRÖẞE", "größe", false},
+      {"ÄÖÜ", "äöü", true},
+      {"ΑΘΉΝΑΣ", "αθήνας", true},  // a final sigma is a sigma
+      {"ПРИВЕТ", "привет", true},
+      {"ՀԱՅ", "հայ", true},
+      {"×", "÷", false},  // no letters, in the middle of a run of letters
+      {"a", "ab", false},
+      {"\xC3", "\xC3", true},  // stray bytes stand for themselves
+      {"\xC3", "\xC2", false},
+      {"\xE2\x82", "\xE2\x82\xAC", false},
+  };
+  for (const auto& [a, b, equal] : rows) {
+    EXPECT_EQ(equalsFolded(a, b), equal) << a << " and " << b;
+    EXPECT_EQ(foldCase(a) == foldCase(b), equal) << a << " and " << b;
   }
 }
 

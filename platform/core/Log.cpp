@@ -1,4 +1,4 @@
-#include "platform/core/LogSink.h"
+#include "platform/core/Log.h"
 
 #include <string>
 
