@@ -12,8 +12,8 @@ namespace orvanta {
 namespace {
 
 template <class Backend>
-std::shared_ptr<OrvantaBackend> create(BackendServices& services, const std::string& name, const SharedDictionary& profile,
-                                       const BackendSetup& setup) {
+std::shared_ptr<OrvantaBackend> create(BackendServices& services, const std::string& name,
+                                       const SharedDictionary& profile, const BackendSetup& setup) {
   return Backend::create(services, name, profile, setup);
 }
 

@@ -8,11 +8,11 @@
 
 #include "backends/Event.h"
 #include "config/DeviceInfo.h"
-#include "session/DaemonServices.h"
 #include "interface/ClientSessionInterface.h"
 #include "platform/ipc/Connection.h"
 #include "session/Aggregation.h"
 #include "session/BackendSet.h"
+#include "session/DaemonServices.h"
 #include "session/OrvantadSessionDelegate.h"
 #include "session/SessionInfoRecord.h"
 
