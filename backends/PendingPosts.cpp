@@ -11,48 +11,53 @@ bool PendingPosts::hasRoom(const QueueShare& queue, std::size_t bytes) const {
   return _ending || (fits(queue.bytes, kMaximumQueueBytes) && fits(_bytes, kMaximumTotalBytes));
 }
 
-std::unique_ptr<PendingPosts::Place> PendingPosts::Place::take(std::shared_ptr<PendingPosts> posts,
-                                                               std::shared_ptr<QueueShare> queue, std::size_t bytes) {
+std::unique_ptr<PendingPosts::Reservation> PendingPosts::Reservation::take(std::shared_ptr<PendingPosts> posts,
+                                                                           std::shared_ptr<QueueShare> queue,
+                                                                           std::size_t bytes) {
   PendingPosts& all = *posts;
-  std::unique_lock lock(all._mutex);
+  platform::MutexLock lock(all._mutex);
   if (!all.hasRoom(*queue, bytes)) {
     if (all._waiters == kMaximumWaiters) return nullptr;
     ++all._waiters;
     lock.unlock();
     const platform::BlockingScope blocking;
     lock.lock();
-    all._changed.wait(lock, [&] { return all.hasRoom(*queue, bytes); });
+    while (!all.hasRoom(*queue, bytes)) all._changed.wait(lock);
     --all._waiters;
   }
   ++all._count;
   all._bytes += bytes;
   queue->bytes += bytes;
-  return std::unique_ptr<Place>(new Place(std::move(posts), std::move(queue), bytes));
+  return std::unique_ptr<Reservation>(new Reservation(std::move(posts), std::move(queue), bytes));
 }
 
-PendingPosts::Place::~Place() {
+PendingPosts::Reservation::~Reservation() {
   giveRoomBack();
-  const std::lock_guard lock(_posts->_mutex);
-  if (--_posts->_count == 0) _posts->_changed.notify_all();
+  const platform::MutexLock lock(_posts->_mutex);
+  if (--_posts->_count == 0) _posts->_changed.notifyAll();
 }
 
-void PendingPosts::Place::giveRoomBack() {
+void PendingPosts::Reservation::giveRoomBack() {
   const std::size_t bytes = std::exchange(_bytes, 0);
-  const std::lock_guard lock(_posts->_mutex);
+  const platform::MutexLock lock(_posts->_mutex);
   _posts->_bytes -= bytes;
   _queue->bytes -= bytes;
-  if (_posts->_waiters > 0) _posts->_changed.notify_all();
+  if (_posts->_waiters > 0) _posts->_changed.notifyAll();
 }
 
 void PendingPosts::stopWaiting() {
-  const std::lock_guard lock(_mutex);
+  const platform::MutexLock lock(_mutex);
   _ending = true;
-  _changed.notify_all();
+  _changed.notifyAll();
 }
 
-bool PendingPosts::waitUntilHandedIn(std::chrono::milliseconds patience) {
-  std::unique_lock lock(_mutex);
-  return _changed.wait_for(lock, patience, [&] { return _count == 0; });
+bool PendingPosts::waitUntilSubmitted(std::chrono::milliseconds timeout) {
+  const auto deadline = std::chrono::steady_clock::now() + timeout;
+  platform::MutexLock lock(_mutex);
+  while (_count != 0) {
+    if (!_changed.waitUntil(lock, deadline)) return _count == 0;
+  }
+  return true;
 }
 
 }  // namespace orvanta

@@ -1,18 +1,19 @@
 #pragma once
 
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <memory>
-#include <mutex>
+
+#include "platform/core/Mutex.h"
 
 namespace orvanta {
 
 // The posts of all backends that wait to be compressed: how many, and how much memory they may take. Owned by
 // BackendServices and shared with the posts, some of which go after it. Thread-safe.
 //
-// Who brings more than there is room for waits, so that a program that reports faster than this device compresses is
-// slowed down. When kMaximumWaiters wait already it is refused instead; when the daemon ends there is room for all.
+// A session that brings more than there is room for waits, so that a program that reports faster than this device
+// compresses is slowed down. When kMaximumWaiters wait already it is refused instead; when the daemon ends there is
+// room for all.
 class PendingPosts {
  public:
   static constexpr std::size_t kMaximumQueueBytes = 16U << 20U;
@@ -24,21 +25,21 @@ class PendingPosts {
     std::size_t bytes = 0;  // guarded by the posts' mutex
   };
 
-  // One post, counted while it lives.
-  class Place {
+  // One post's room, held while the object lives.
+  class Reservation {
    public:
-    // Null when there is no room and no waiting for it. A post of any size may wait alone. Called without
-    // locks, since it may wait in a BlockingScope.
-    static std::unique_ptr<Place> take(std::shared_ptr<PendingPosts> posts, std::shared_ptr<QueueShare> queue,
-                                       std::size_t bytes);
-    ~Place();
-    Place(const Place&) = delete;
-    Place& operator=(const Place&) = delete;
+    // Returns null when there is no room and too many wait for it already. A post of any size may wait alone. Called
+    // without locks, since it may wait in a BlockingScope.
+    static std::unique_ptr<Reservation> take(std::shared_ptr<PendingPosts> posts, std::shared_ptr<QueueShare> queue,
+                                             std::size_t bytes);
+    ~Reservation();
+    Reservation(const Reservation&) = delete;
+    Reservation& operator=(const Reservation&) = delete;
     // The post has been compressed: its text takes no room any more.
     void giveRoomBack();
 
    private:
-    Place(std::shared_ptr<PendingPosts> posts, std::shared_ptr<QueueShare> queue, std::size_t bytes)
+    Reservation(std::shared_ptr<PendingPosts> posts, std::shared_ptr<QueueShare> queue, std::size_t bytes)
         : _posts(std::move(posts)), _queue(std::move(queue)), _bytes(bytes) {}
 
     const std::shared_ptr<PendingPosts> _posts;
@@ -46,22 +47,20 @@ class PendingPosts {
     std::size_t _bytes;
   };
 
-  // For ending: nobody waits for room from now on, there is room for whatever comes.
+  // For ending: from now on there is room for every post, and none waits.
   void stopWaiting();
-  // Waits until no post is left that the HTTP client has not got, at most `patience`; whether none is left.
-  // For tests.
-  bool waitUntilHandedIn(std::chrono::milliseconds patience);
+  // Waits until the HTTP client has every post, at most `timeout`. Returns whether it has. For tests.
+  bool waitUntilSubmitted(std::chrono::milliseconds timeout);
 
  private:
-  bool hasRoom(const QueueShare& queue, std::size_t bytes) const;  // with _mutex held
+  bool hasRoom(const QueueShare& queue, std::size_t bytes) const REQUIRES(_mutex);
 
-  std::mutex _mutex;
-  std::condition_variable _changed;
-  // Guarded by _mutex.
-  std::size_t _count = 0;
-  std::size_t _bytes = 0;
-  std::size_t _waiters = 0;
-  bool _ending = false;
+  platform::Mutex _mutex;
+  platform::Condition _changed;
+  std::size_t _count GUARDED_BY(_mutex) = 0;
+  std::size_t _bytes GUARDED_BY(_mutex) = 0;
+  std::size_t _waiters GUARDED_BY(_mutex) = 0;
+  bool _ending GUARDED_BY(_mutex) = false;
 };
 
 }  // namespace orvanta

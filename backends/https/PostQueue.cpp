@@ -82,17 +82,18 @@ struct PostQueue::Job {
   Post post;
   std::shared_ptr<Outcome> outcome;
   // Also until the pool drops the job, which it may do after the services have gone.
-  std::unique_ptr<PendingPosts::Place> place;
+  std::unique_ptr<PendingPosts::Reservation> reservation;
 };
 
 void PostQueue::post(Post post) {
   auto outcome = std::make_shared<Outcome>(_backend, _backendName, std::move(post.completion));
-  auto place = PendingPosts::Place::take(_pendingPosts, _share, post.json.size());
-  if (!place) {
+  auto reservation = PendingPosts::Reservation::take(_pendingPosts, _share, post.json.size());
+  if (!reservation) {
     outcome->finish({std::nullopt, "too much waits to be posted already"});
     return;
   }
-  auto job = std::make_unique<Job>(Job{shared_from_this(), std::move(post), std::move(outcome), std::move(place)});
+  auto job =
+      std::make_unique<Job>(Job{shared_from_this(), std::move(post), std::move(outcome), std::move(reservation)});
   _queue->post([job = std::move(job)] { job->queue->compressAndStart(*job); });
 }
 
@@ -109,7 +110,7 @@ void PostQueue::compressAndStart(Job& job) {
   request.headers.push_back({"Content-Length", std::to_string(request.body.size())});
   if (smaller) request.headers.push_back({"Content-Encoding", "gzip"});
   std::string().swap(job.post.json);
-  job.place->giveRoomBack();
+  job.reservation->giveRoomBack();
   _http.start(
       _lane, std::move(request),
       [outcome = job.outcome](const platform::HttpResult& result) { return outcome->observe(result); },

@@ -87,18 +87,18 @@ bool UploadBackend::uploadFileAtPath(const UploadFile& file) {
     return false;
   }
 
-  std::unique_ptr<UploadBudget::Share> share;
+  std::unique_ptr<UploadBudget::Reservation> reservation;
   {
     const platform::BlockingScope waitingForOthers;
-    share = UploadBudget::Share::take(services().uploadBudget, UploadBudget::kCopies * bytesToRead(*size));
+    reservation = UploadBudget::Reservation::take(services().uploadBudget, UploadBudget::kCopies * bytesToRead(*size));
   }
-  if (!share) {
+  if (!reservation) {
     ORVANTA_LOG(error, "UploadBackend(uploadFileAtPath): The daemon is ending.");
     return false;
   }
   std::optional<std::string> body = compressedContent(handle, *size);
   if (!body) return false;
-  share->shrinkTo(body->size());
+  reservation->shrinkTo(body->size());
 
   std::optional<platform::HttpRequest> request = makeRequest(*url, file, std::move(*body));
   if (!request) return false;

@@ -248,8 +248,8 @@ int LinuxDeviceProperties::timeZoneOffset(double wallSeconds) const {
   thread_local Answer last;
   if (last.offset && last.seconds == seconds) return *last.offset;
   std::tm local{};
-  static std::mutex zoneMutex;
-  const std::lock_guard lock(zoneMutex);
+  static Mutex zoneMutex;
+  const MutexLock lock(zoneMutex);
   ::tzset();
   last = {seconds, ::localtime_r(&seconds, &local) != nullptr ? static_cast<int>(local.tm_gmtoff) : 0};
   return *last.offset;

@@ -110,7 +110,7 @@ std::promise<void> HTTPSFixture::holdCompressing() {
 }
 
 void HTTPSFixture::settle() {
-  ASSERT_TRUE(platform.services.pendingPosts->waitUntilHandedIn(kHangGuard));
+  ASSERT_TRUE(platform.services.pendingPosts->waitUntilSubmitted(kHangGuard));
 }
 
 HTTPSFixture::Posts HTTPSFixture::fields(std::string_view key) {

@@ -176,7 +176,7 @@ TEST_F(HTTPSPostBackendTest, WhoIsShownWhatWasSent) {
     const auto backend = makeBackend(requiring({{"override_dnu", row.overrideDnu}}), own);
     ASSERT_EQ(backend->state(), kBackendEnabled) << row.what;
     EXPECT_EQ(send(*backend, 1).has_value(), row.shown) << row.what;
-    EXPECT_TRUE(own.services.pendingPosts->waitUntilHandedIn(kHangGuard));
+    EXPECT_TRUE(own.services.pendingPosts->waitUntilSubmitted(kHangGuard));
   }
 }
 

@@ -143,7 +143,7 @@ TEST_F(HTTPSPostRequestTest, ADroppedPostIsReported) {
     Event event{.category = 1, .type = 1};
     backend->sendMessage(event);
     backend->flushMessagesWithCompletion(pending.completion());
-    ASSERT_TRUE(own.services.pendingPosts->waitUntilHandedIn(kHangGuard));
+    ASSERT_TRUE(own.services.pendingPosts->waitUntilSubmitted(kHangGuard));
     EXPECT_EQ(pending.answer->calls, 0);
   }
   EXPECT_EQ(pending.answer->calls, 1);
@@ -151,20 +151,20 @@ TEST_F(HTTPSPostRequestTest, ADroppedPostIsReported) {
 }
 
 TEST(PendingPostsTest, AllQueuesShareTheRoomAndFewMayWaitForIt) {
-  using Place = PendingPosts::Place;
+  using Reservation = PendingPosts::Reservation;
   const auto posts = std::make_shared<PendingPosts>();
   std::vector<std::shared_ptr<PendingPosts::QueueShare>> queues;
-  std::vector<std::unique_ptr<Place>> places;
+  std::vector<std::unique_ptr<Reservation>> places;
   for (int i = 0; i < 5; ++i) queues.push_back(std::make_shared<PendingPosts::QueueShare>());
   for (int i = 0; i < 4; ++i) {  // leaves the fifth no room, though it has nothing yet
-    places.push_back(Place::take(posts, queues[i], PendingPosts::kMaximumTotalBytes / 4));
+    places.push_back(Reservation::take(posts, queues[i], PendingPosts::kMaximumTotalBytes / 4));
     ASSERT_NE(places.back(), nullptr);
   }
   std::atomic<int> refused = 0, admitted = 0;
-  std::vector<std::future<std::unique_ptr<Place>>> waiting;
+  std::vector<std::future<std::unique_ptr<Reservation>>> waiting;
   for (std::size_t i = 0; i <= PendingPosts::kMaximumWaiters; ++i) {
     waiting.push_back(std::async(std::launch::async, [&, i] {
-      auto place = Place::take(posts, queues[i % queues.size()], 1);
+      auto place = Reservation::take(posts, queues[i % queues.size()], 1);
       ++(place ? admitted : refused);
       return place;
     }));
@@ -195,7 +195,7 @@ TEST_F(HTTPSPostRequestTest, WhoHasMoreThanMayWaitWaitsForRoomAndLosesNothing) {
   ASSERT_TRUE(waiting.waitFor(1)) << "in a BlockingScope";
   const auto other = std::async(std::launch::async, [&] { backend->setCorrelatedSessionID("root.own"); });
   EXPECT_EQ(other.wait_for(kHangGuard), std::future_status::ready) << "it waits with the backend's lock held";
-  EXPECT_FALSE(platform.services.pendingPosts->waitUntilHandedIn(std::chrono::milliseconds(0)));
+  EXPECT_FALSE(platform.services.pendingPosts->waitUntilSubmitted(std::chrono::milliseconds(0)));
   release.set_value();
   sender.get();
   ASSERT_TRUE(first.wait() && second.wait());

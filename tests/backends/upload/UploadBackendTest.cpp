@@ -169,11 +169,11 @@ TEST_F(UploadBackendTest, RequestsThatCannotBeMade) {
 }
 
 TEST_F(UploadBackendTest, UploadsShareTheirMemoryUntilTheDaemonEnds) {
-  using Share = UploadBudget::Share;
+  using Reservation = UploadBudget::Reservation;
   auto& budget = platform.services.uploadBudget;
-  auto large = Share::take(budget, UploadBudget::kMaximumTotalBytes);
+  auto large = Reservation::take(budget, UploadBudget::kMaximumTotalBytes);
   auto second =
-      std::async(std::launch::async, [&] { return Share::take(budget, UploadBudget::kMaximumTotalBytes - 1); });
+      std::async(std::launch::async, [&] { return Reservation::take(budget, UploadBudget::kMaximumTotalBytes - 1); });
   large->shrinkTo(2);
   EXPECT_EQ(second.wait_for(std::chrono::milliseconds(20)), std::future_status::timeout) << "not yet enough";
   large.reset();
