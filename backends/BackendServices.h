@@ -26,8 +26,8 @@ class PendingDatagrams {
   std::size_t _count GUARDED_BY(_mutex) = 0;
 };
 
-// What the backends of all sessions share. Owned by DaemonServices; destroyed when the platform has stopped. Each
-// member is thread-safe.
+// The things that the backends of all sessions share. Owned by DaemonServices; destroyed when the platform has stopped.
+// Each member is thread-safe.
 struct BackendServices {
   explicit BackendServices(Platform& platform) : config(platform) {}
 

@@ -13,7 +13,7 @@ namespace orvanta {
 std::optional<std::string> compressDataWithZlibOrGzip(bool gzip, std::string_view input);
 std::optional<std::string> gzipDeflate(std::string_view input);
 
-// What the log says of a failed deflateInit2 (or the reset of a kept stream) and of a failed deflate.
+// The log's text for a failed deflateInit2 (or the reset of a kept stream) and of a failed deflate.
 const char* describeDeflateInitResult(int zlibResult);
 const char* describeDeflateResult(int zlibResult);
 

@@ -11,7 +11,7 @@
 
 namespace orvanta {
 
-// What the whole process shares of configuration: facts that are found out once, on first use, and then hold until the
+// The configuration that the whole process shares: facts that are found out once, on first use, and then hold until the
 // daemon ends, the storebag server's lane and the client framework. Owned by the services of the layer above, in the
 // end by DaemonServices; destroyed when the platform has stopped and before it goes. Thread-safe: a caller that comes
 // while a fact is being found out waits for it.

@@ -16,7 +16,7 @@ bool isMessageLogName(std::string_view name);
 std::string messageLogName(std::int32_t creationTime);
 
 // The message-log directory during one call of writeToLogFile, used by its thread alone: the file operations that the
-// rules for choosing a file need, each one system call on the open directory. What fails is told in the result; nothing
+// rules for choosing a file need, each one system call on the open directory. A failure is told in the result; nothing
 // is remembered from one call to the next.
 class MessageLogDirectory {
  public:

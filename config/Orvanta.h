@@ -17,7 +17,7 @@ class Orvanta {
  public:
   explicit Orvanta(Platform& platform);
 
-  // framework.plist's "version", or "8.0" when it has none.
+  // framework.plist's "version", or "8.0" when it has no version.
   const std::string& bundleVersion() const { return _version; }
   // The resource publicKey.der; null when it is missing or not an RSA key.
   std::shared_ptr<const platform::RsaPublicKey> publicKey();

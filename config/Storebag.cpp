@@ -36,7 +36,7 @@ std::optional<std::string> cacheControlOf(const HttpResponse& response) {
   return joined;
 }
 
-// What the conferencing client gets when no server can be reached.
+// The conferencing client's bag when no server can be reached.
 SharedDictionary fallbackBag() {
   Dictionary section;
   section.set(kOrvantaBackendBrisk, Dictionary{{"active", true}});

@@ -25,9 +25,9 @@ bool verifyStorebagSignature(const platform::RsaPublicKey& key, std::span<const 
 // not say.
 std::int32_t maxAgeFromCacheControl(std::optional<std::string_view> cacheControl);
 
-// What a fetch brings besides the bag.
+// The result of a fetch besides the bag.
 struct StorebagFetch {
-  // In: the stamp to send; out: replaced by a newer one. Without a value at the call none is sent.
+  // In: the stamp to send; out: replaced by a newer one. Without a value at the call no stamp is sent.
   std::optional<std::string> lastModified;
   std::int32_t maxAge = 0;   // seconds; written whenever the server answered
   bool notModified = false;  // the server says that nothing has changed since the stamp

@@ -62,8 +62,7 @@ constexpr StorebagKeyInfo kKeys[] = {
     {Key::localeWhitelist, Place::clientSection, "locale_whitelist", Type::texts, "no reports",
      WrongType::reportsNothing,
      "3: one of these fragments occurs in the device's country code (\"DE\"). **Required**: an empty list, too, means "
-     "no "
-     "reports. A device that knows no country passes a list that has an entry"},
+     "no reports. A device that knows no country passes a list that has an entry"},
     {Key::deviceWhitelist, Place::clientSection, "device_whitelist", Type::texts, "all", WrongType::reportsNothing,
      "4: one of these fragments occurs in the product family; empty: all"},
     {Key::deviceBlacklist, Place::clientSection, "device_blacklist", Type::texts, "all", WrongType::reportsNothing,

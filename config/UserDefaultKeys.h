@@ -4,7 +4,7 @@
 
 namespace orvanta {
 
-// What the daemon reads from its user defaults; docs/operation.md says what each does.
+// The user defaults that the daemon reads; docs/operation.md says what each does.
 inline constexpr std::string_view kStorebagURLKey = "orvanta_storebag_url";
 inline constexpr std::string_view kEnvironmentTypeKey = "environmentType";
 inline constexpr std::string_view kPostURLKey = "httpsPostURL";

@@ -58,10 +58,10 @@ SessionList::SessionList(Platform& platform) : _platform(platform), _status(plat
 bool SessionList::admit(const OrvantadSession& session, std::shared_ptr<SessionConnection> connection) {
   const platform::MutexLock lock(_lock);
   if (_isEnding) return false;
-  const std::size_t before = countOf(State::open);
-  if (before == 0) _platform.keepAlive().begin();
+  if (_open == 0) _platform.keepAlive().begin();
   _entries.push_back({&session, std::move(connection)});
-  _status.changed(before + 1);
+  ++_unended;
+  _status.changed(++_open);
   return true;
 }
 
@@ -72,15 +72,17 @@ void SessionList::leave(const OrvantadSession& session) {
   if (entry == _entries.end() || entry->state != State::open) return;
   entry->state = State::ending;
   released = std::move(entry->connection);
-  const std::size_t left = countOf(State::open);
-  _status.changed(left);
-  if (left == 0) _platform.keepAlive().end();
+  _status.changed(--_open);
+  if (_open == 0) _platform.keepAlive().end();
 }
 
 void SessionList::ended(const OrvantadSession& session) {
   const platform::MutexLock lock(_lock);
-  if (const auto entry = find(session); entry != _entries.end()) entry->state = State::ended;
-  if (!allEnded()) return;
+  if (const auto entry = find(session); entry != _entries.end() && entry->state != State::ended) {
+    entry->state = State::ended;
+    --_unended;
+  }
+  if (_unended > 0) return;
   _changed.notifyAll();
   if (!_isEnding) releaseMemoryWhenIdle();
 }
@@ -93,21 +95,12 @@ void SessionList::connectionEnded(const OrvantadSession& session) {
 
 std::size_t SessionList::openCount() const {
   const platform::MutexLock lock(_lock);
-  return countOf(State::open);
+  return _open;
 }
 
 std::vector<SessionList::Entry>::iterator SessionList::find(const OrvantadSession& session) {
   return std::find_if(_entries.begin(), _entries.end(),
                       [&session](const Entry& entry) { return entry.session == &session; });
-}
-
-std::size_t SessionList::countOf(State state) const {
-  return static_cast<std::size_t>(
-      std::count_if(_entries.begin(), _entries.end(), [state](const Entry& entry) { return entry.state == state; }));
-}
-
-bool SessionList::allEnded() const {
-  return std::all_of(_entries.begin(), _entries.end(), [](const Entry& entry) { return entry.state == State::ended; });
 }
 
 // Returns the memory of the last sessions to the system, but not after each of many short visits.
@@ -140,10 +133,10 @@ bool SessionList::endAll() {
   // Also waits for sessions whose clients have just left by themselves.
   const auto deadline = std::chrono::steady_clock::now() + kEndOfSessions;
   platform::MutexLock lock(_lock);
-  while (!allEnded() && _changed.waitUntil(lock, deadline)) {
+  while (_unended > 0 && _changed.waitUntil(lock, deadline)) {
   }
-  if (allEnded()) return true;
-  ORVANTA_LOG(error, "main: {} sessions are still busy and are left behind", unendedCount());
+  if (_unended == 0) return true;
+  ORVANTA_LOG(error, "main: {} sessions are still busy and are left behind", _unended);
   return false;
 }
 

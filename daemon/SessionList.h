@@ -32,7 +32,8 @@ class SessionCountStatus {
 //   open ──its client leaves, or the daemon ends──► ending ──end() has run──► ended ──connection ended──► removed
 //
 // Only open ones count as sessions: the process is marked busy while there is one. The list owns them until then; later
-// their connections do. Nothing is destroyed under the lock, which is never held together with another.
+// their connections do. Nothing is destroyed under the lock. It is never held together with the agent's; the locks of
+// the status and of the keep-alive are taken inside it.
 //
 // Owned by the agent; any thread.
 class SessionList {
@@ -66,9 +67,6 @@ class SessionList {
   };
 
   std::vector<Entry>::iterator find(const OrvantadSession& session) REQUIRES(_lock);
-  std::size_t countOf(State state) const REQUIRES(_lock);
-  std::size_t unendedCount() const REQUIRES(_lock) { return countOf(State::open) + countOf(State::ending); }
-  bool allEnded() const REQUIRES(_lock);
   void releaseMemoryWhenIdle() REQUIRES(_lock);
 
   Platform& _platform;
@@ -77,6 +75,8 @@ class SessionList {
   mutable platform::Mutex _lock;
   platform::Condition _changed;
   std::vector<Entry> _entries GUARDED_BY(_lock);
+  std::size_t _open GUARDED_BY(_lock) = 0;     // of the entries: those in state open
+  std::size_t _unended GUARDED_BY(_lock) = 0;  // those in state open or ending
   bool _isEnding GUARDED_BY(_lock) = false;
   std::chrono::steady_clock::time_point _memoryReleased GUARDED_BY(_lock);
 };

@@ -27,7 +27,7 @@ void warnOfUnknownUserDefaults(Platform& platform) {
 
 void warnOfUselessConfiguration(DaemonServices& services) {
   Platform& platform = services.platform;
-  // Whoever reads a file logs the keys in it that nothing reads: the device and the framework read theirs here.
+  // The reader of a file logs the keys in it that nothing uses: the device and the framework read theirs here.
   platform.device().productVersion();
   warnOfUnknownUserDefaults(platform);
   if (!platform.device().deviceName()) {

@@ -5,8 +5,8 @@
 namespace orvanta {
 
 // Warns of what in the configuration keeps the daemon from being of use, or is not read at all: a framework bundle
-// without a usable verification key, an entitlement that nobody holds, keys that mean nothing. For main, once: what is
-// noticed later, where it is used, is often noticed too late.
+// without a usable verification key, an entitlement that is granted to no one, keys that mean nothing. For main, once:
+// what is noticed later, where it is used, is often noticed too late.
 void warnOfUselessConfiguration(DaemonServices& services);
 
 }  // namespace orvanta

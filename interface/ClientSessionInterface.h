@@ -53,7 +53,8 @@ struct AggregatedEvent {
   double timestamp = 0;          // seconds since 1970
   std::uint16_t category = 0;
   std::uint16_t type = 0;
-  SharedDictionary payload;  // with the user info of the session where the event entered; null if there was neither
+  SharedDictionary
+      payload;  // with the user info of the session where the event entered; null if the event had no payload
   bool isEndNotice() const { return !sessionInfo && timestamp == 0 && category == 0 && type == 0 && !payload; }
 };
 

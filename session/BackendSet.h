@@ -62,7 +62,8 @@ class BackendSet {
   void setCombinedSessionIDString(const std::string& sessionIDString) const;
   // The ancestors' and its own; batched records are relabelled. Also under the agent's lock.
   void setCorrelatedSessionID(const std::string& combined) const;
-  // Takes the states and thresholds of the parent session's backends; null: it has none. Also under the agent's lock.
+  // Takes the states and thresholds of the parent session's backends; null: it has no backends. Also under the agent's
+  // lock.
   void followParent(const BackendSet* parent) const;
   // The names of those that report, or hold what they would report.
   std::vector<std::string> reportingNames() const;

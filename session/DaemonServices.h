@@ -25,7 +25,7 @@ struct DaemonServices {
   BackendServices backends;
   // One for all flushes. Shared with the requests, since the pool may drop the last completions only when it goes.
   const std::shared_ptr<platform::Mutex> flushLock = std::make_shared<platform::Mutex>();
-  // Who may connect.
+  // Says which peers may connect.
   platform::Entitlements entitlements;
 };
 

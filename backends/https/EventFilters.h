@@ -32,7 +32,7 @@ class EventFilters {
   // Returns whether a rule may name one of the reserved keys.
   bool namesReservedKey() const { return _namesReservedKey; }
 
-  // The first rule, in table order, for that field of an event of that category and type; null when there is none.
+  // The first rule, in table order, for that field of an event of that category and type; null when no rule fits.
   const FilterRule* find(std::string_view key, std::int32_t method, std::int32_t status) const {
     return (_keyBits & bitOf(key)) == 0 ? nullptr : search(key, method, status);
   }

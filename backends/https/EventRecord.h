@@ -43,7 +43,7 @@ class EventRecord {
   // Merges the user info, which may be null, and applies the filters. Called once.
   void prepare(std::shared_ptr<const RecordLayer> userInfo, const EventFilters& filters);
 
-  // The integer reading of the prepared record's "_method", 0 when user info or a filter left none.
+  // The integer reading of the prepared record's "_method", 0 when user info or a filter removed it.
   std::int32_t category() const { return _category; }
   // About how much memory the record keeps alive, in bytes.
   std::size_t footprint() const;

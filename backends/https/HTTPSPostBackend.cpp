@@ -60,14 +60,16 @@ HTTPSPostBackend::HTTPSPostBackend(BackendServices& services, std::string name, 
 }
 
 void HTTPSPostBackend::setUserInfoDict(SharedDictionary userInfo) {
-  _userInfo = RecordLayer::of(userInfo);
+  // Equal user info keeps its layer, which waiting events share with those to come.
+  const bool same = _userInfo && userInfo && *userInfo == _userInfo->entries();
+  if (!same) _userInfo = RecordLayer::of(userInfo);
   OrvantaBackend::setUserInfoDict(std::move(userInfo));
 }
 
 std::optional<std::string> HTTPSPostBackend::sendNumbered(const Event& event) {
   const bool knowsUser = !identity().requireUserInfo || userInfoDict() != nullptr;
-  const Disposition becomes = disposition(state(), event.flag, batchEvents(), knowsUser);
-  if (becomes == Disposition::drop) return std::nullopt;
+  const auto becomes = [&](BackendState at, EventFlag flag) { return disposition(at, flag, batchEvents(), knowsUser); };
+  if (becomes(state(), event.flag) == Disposition::drop) return std::nullopt;
   Event kept = event;
   if (isSessionEnd(event)) kept.payload = sessionEndPayload(event.payload);
   PreparedEvent prepared = newEventDict(std::move(kept));
@@ -79,9 +81,14 @@ std::optional<std::string> HTTPSPostBackend::sendNumbered(const Event& event) {
     stateCell().compare_exchange_strong(held, kBackendEnabled);
   }
   ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): realtime is {:d}", isRealtime(event.flag));
-  if (becomes == Disposition::post) return sendDirectly(prepared.record, event);
+  // Decided again: the parent's session or the server may have changed the state meanwhile. What was taken is not
+  // dropped any more, and what was promoted above is held only when it has been held anew.
+  const BackendState now = state();
+  const BackendState decisive = now == kBackendDisabled ? kBackendEnabled : now;
+  const EventFlag unpromoting = isRealtime(event.flag) ? EventFlag::realtime : EventFlag::none;
+  if (becomes(decisive, unpromoting) == Disposition::post) return sendDirectly(prepared.record, event);
 
-  ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): Batching {}, {:d}, {:d}", int{state()}, batchEvents(),
+  ORVANTA_LOG(debug, "HTTPSPostBackend(sendMessage): Batching {}, {:d}, {:d}", int{now}, batchEvents(),
               identity().requireUserInfo);
   return batchEvent(std::move(prepared));
 }

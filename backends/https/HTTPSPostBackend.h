@@ -40,6 +40,7 @@ class HTTPSPostBackend final : public OrvantaBackend {
   void setCorrelatedSessionID(std::optional<std::string> combined) override;
   void setUserInfoDict(SharedDictionary userInfo) override;
 
+  // The session's queue only.
   const std::optional<std::string>& postURL() const { return _postURLs.postURL(); }
   void setPostURL(std::optional<std::string> url) { _postURLs.setPostURL(std::move(url)); }
   // Why the last evaluation that was not frozen came out as it did; nullopt before the first.

@@ -19,8 +19,8 @@ bool isServerError(int status) {
 
 }  // namespace
 
-// Ends the post. Shared by the two callbacks of the request; if both are dropped uncalled, the
-// completion hears of that.
+// Ends the post. Shared by the two callbacks of the request; if both are dropped uncalled, the completion hears of
+// that.
 class PostQueue::Outcome {
  public:
   Outcome(std::weak_ptr<OrvantaBackend> backend, std::string backendName, PostCompletion completion)

@@ -8,7 +8,7 @@
 
 namespace orvanta {
 
-// The post URL that a storebag's section supplies; null where it has none or a user default has fixed the URL. The
+// The post URL that a storebag's section supplies; null where it has no URL or a user default has fixed the URL. The
 // first section that supplies one also says how events are counted.
 inline const std::string* suppliedPostURL(const Dictionary& section, bool fixed) {
   return fixed ? nullptr : textUnder(section, StorebagKey::postURL);
@@ -21,7 +21,8 @@ class PostURLs {
   // From the user defaults.
   PostURLs(std::optional<std::string> postURL, std::optional<std::string> realtimePostURL);
 
-  // Takes the section's URLs where none is fixed. Realtime events without a URL of their own go where others go.
+  // Takes the section's URLs where no user default has fixed them. Realtime events without a URL of their own go where
+  // others go.
   void update(const Dictionary& section);
 
   bool postURLFixed() const { return _postURLFixed; }

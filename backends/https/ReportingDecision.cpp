@@ -49,7 +49,7 @@ void reportWithoutUserInfo(ReportingDecision& decision, const Array& sections, c
   decision.reason.test = ReportingTest::userInfoNotRequired;
 }
 
-// The first section for the client that is enabled for this version; null, with the reason, when there is none.
+// The first section for the client that is enabled for this version; null, with the reason, when no section is.
 const Dictionary* chooseSection(ReportingReason& reason, const Array& sections, const ReportingFacts& facts) {
   reason.test = ReportingTest::noSectionMatches;
   for (std::size_t i = 0; i < sections.size(); ++i) {

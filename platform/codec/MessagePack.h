@@ -12,7 +12,7 @@
 
 namespace orvanta::platform {
 
-// What a decoder accepts. Depth counts the outermost array; `maximumCharge` bounds what the decoded values take in
+// The limits of a decoder. Depth counts the outermost array; `maximumCharge` bounds what the decoded values take in
 // memory, so that a small message cannot become a large one.
 struct MessagePackLimits {
   std::size_t maximumDepth = 0;

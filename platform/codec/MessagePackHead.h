@@ -40,7 +40,7 @@ struct MessagePackHead {
   std::uint64_t elements() const { return kind == Kind::array ? argument : kind == Kind::map ? argument * 2 : 0; }
 };
 
-// What a decoded value takes in memory beyond the place that its container keeps for it, about.
+// About how much memory a decoded value takes beyond the place that its container keeps for it.
 inline std::size_t memoryCharge(const MessagePackHead& head) {
   constexpr std::size_t kInlineText = 15;     // longer texts have a block of their own
   constexpr std::size_t kBlockOverhead = 16;  // what the allocator adds to a block

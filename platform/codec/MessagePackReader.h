@@ -42,7 +42,7 @@ class MessagePackReader {
   void leave() { --_depth; }
   bool value(Value& out);
   bool array(const MessagePackHead& head, Array& out);
-  // What `head` begins, read already.
+  // Reads the value that `head`, read already, begins.
   bool valueAfter(const MessagePackHead& head, Value& out);
 
   void refuse(std::size_t offset, std::string_view what);

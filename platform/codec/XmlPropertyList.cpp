@@ -146,7 +146,7 @@ class XmlReader {
     return node.type() == pugi::node_pcdata && isBlank(node.value());
   }
 
-  // The element at or behind `node` on its level; null when there is none or (an error) text comes first.
+  // The element at or behind `node` on its level; null when the level ends or (an error) text comes first.
   pugi::xml_node nextElement(pugi::xml_node node) {
     while (node && isIgnorable(node)) node = node.next_sibling();
     if (!node || node.type() == pugi::node_element) return node;

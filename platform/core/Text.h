@@ -18,7 +18,7 @@ bool equalsIgnoringCase(std::string_view a, std::string_view b);
 std::string hexText(std::span<const std::uint8_t> bytes);
 std::string hexText(std::string_view bytes);
 
-// What the system says of an errno value, such as "No such file or directory".
+// The system's text for an errno value, such as "No such file or directory".
 std::string errnoText(int error);
 
 // Each byte that `keeps` refuses becomes "%" and two upper-case hexadecimal digits.

@@ -6,7 +6,7 @@
 
 namespace orvanta::platform {
 
-// Owns one file descriptor and closes it. -1 when it owns none.
+// Owns one file descriptor and closes it. -1 when it is empty.
 class UniqueFd {
  public:
   UniqueFd() noexcept = default;

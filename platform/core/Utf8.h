@@ -24,7 +24,7 @@ void appendUtf8(std::string& out, char32_t codePoint);
 
 // Returns whether XML has a way to carry this character at all, be it as a reference.
 bool isXmlCharacter(char32_t codePoint);
-// Offset of the first thing in `text` that is not UTF-8 or not an XML character; nullopt when there is none.
+// Offset of the first thing in `text` that is not UTF-8 or not an XML character; nullopt when all is valid.
 std::optional<std::size_t> findNonXmlCharacter(std::string_view text);
 
 }  // namespace orvanta::platform

@@ -142,7 +142,7 @@ class Value {
 
 inline Value::Value() = default;  // here, since decoders make many empty values
 
-// A payload or record that several owners read and none changes; null where there is none.
+// A payload or record that several owners read and no one changes; null where it is absent.
 using SharedDictionary = std::shared_ptr<const Dictionary>;
 using SharedArray = std::shared_ptr<const Array>;
 

@@ -13,7 +13,7 @@ namespace orvanta::platform {
 class LoadedBundle {
  public:
   explicit LoadedBundle(void* library) : _library(library) {}
-  // The address of an exported name; null when the bundle has none.
+  // The address of an exported name; null when the bundle does not export it.
   const void* symbol(const char* name) const;
 
  private:

@@ -8,7 +8,7 @@
 
 namespace orvanta::platform {
 
-// What the device says of itself. Every query may be called from any thread, and returns nullopt when the platform has
+// The device's own description. Every query may be called from any thread, and returns nullopt when the platform has
 // no answer.
 class DeviceProperties {
  public:

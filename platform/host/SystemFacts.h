@@ -6,7 +6,7 @@
 
 namespace orvanta::platform {
 
-// What the system's own files say of the device: pure functions from a file's content to a fact, nullopt when
+// Reads what the system's own files say of the device: pure functions from a file's content to a fact, nullopt when
 // it says nothing.
 
 // The value of one assignment in an os-release file, its quotes and escapes removed.

@@ -77,7 +77,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
 
   virtual const std::shared_ptr<Outbox>& outbox() const = 0;
   virtual const std::shared_ptr<WorkQueue>& queue() const = 0;
-  // The oldest descriptor received and not yet taken; empty when there is none. On the queue only.
+  // The oldest descriptor received and not yet taken; empty when all are taken. On the queue only.
   virtual UniqueFd takeDescriptor() = 0;
   // For log lines, such as "fd 7 (pid 1234, uid 1000)"; set by the listener before resume().
   virtual const std::string& description() const = 0;

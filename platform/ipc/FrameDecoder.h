@@ -31,7 +31,7 @@ struct Frame {
   std::size_t charge = 0;    // what its values take in memory, about
 };
 
-// Whoever opens a connection says what it takes; nothing unless set.
+// Set by the side that opens a connection; a limit that is not set admits nothing.
 struct FrameLimits {
   std::size_t maximumFrame = 0;   // bytes on the wire
   std::size_t maximumCharge = 0;  // bytes that the values take in memory

@@ -19,8 +19,8 @@ namespace orvanta::platform {
 
 // The outbox of a SocketConnection, which makes it, keeps the socket open until close(), and hears of its progress.
 //
-// send() may be called on any thread. What the socket does not take at once waits here, and is written when the socket
-// becomes writable: on a queue of its own, since the connection's may be busy for long.
+// send() may be called on any thread. Bytes that the socket does not take at once wait here, and are written when the
+// socket becomes writable: on a queue of its own, since the connection's may be busy for long.
 //
 // Its states, and what moves it:
 //

@@ -10,10 +10,10 @@
 
 namespace orvanta::platform {
 
-// Who may do what: property lists in a directory, each granting entitlement values to a "user", a "group" (name or
-// number) or a security "label". Read anew at each question, so that a grant needs no restart. Nothing is granted by
-// default; a file that cannot be read or is invalid grants nothing and is logged with its reason, once until that
-// changes. Thread-safe.
+// Says which peer may do what, from property lists in a directory, each granting entitlement values to a "user", a
+// "group" (name or number) or a security "label". Read anew at each question, so that a grant needs no restart. Nothing
+// is granted by default; a file that cannot be read or is invalid grants nothing and is logged with its reason, once
+// until that changes. Thread-safe.
 class Entitlements {
  public:
   explicit Entitlements(std::string directory) : _directory(std::move(directory)) {}

@@ -7,7 +7,7 @@
 
 namespace orvanta::platform {
 
-// What a consumed extension token gives: reading one file that a client opened, and nothing else.
+// The right that a consumed extension token gives: reading one file that a client opened, and nothing else.
 //
 // A token stands for the open descriptor that came with the client's call, so that the file is read with the client's
 // rights and never by its path. The handle borrows that descriptor for the length of the call; release() ends its use,

@@ -9,7 +9,7 @@
 
 namespace orvanta::platform {
 
-// Who is at the other end of a Unix socket, as the kernel knew when it connected.
+// The peer at the other end of a Unix socket, as the kernel knew it when it connected.
 struct PeerIdentity {
   pid_t pid = 0;
   uid_t uid = 0;

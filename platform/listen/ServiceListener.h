@@ -27,7 +27,7 @@ class ConnectionQuota {
   const std::shared_ptr<Counts> _counts;
 };
 
-// What a ServiceListener does, apart from it so that work under way can outlive it. Accepts on a queue of its own,
+// The work of a ServiceListener, apart from it so that what is under way can outlive it. Accepts on a queue of its own,
 // offers on any thread of the pool.
 class Acceptor final : public std::enable_shared_from_this<Acceptor> {
  public:

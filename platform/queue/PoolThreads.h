@@ -25,7 +25,7 @@ class PoolThreads {
  public:
   static constexpr std::chrono::milliseconds kLinger{1000};
 
-  // What the threads do: run jobs.
+  // The threads' work: running jobs.
   class Loop {
    public:
     virtual ~Loop() = default;

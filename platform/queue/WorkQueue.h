@@ -57,7 +57,7 @@ class WorkQueue : public std::enable_shared_from_this<WorkQueue> {
   virtual ~WorkQueue() = default;
 
   virtual void post(Job job) = 0;
-  // Returns whether the calling thread is running one of this queue's jobs. What belongs to a queue asserts it.
+  // Returns whether the calling thread is running one of this queue's jobs. Objects that belong to a queue assert it.
   virtual bool isCurrent() const = 0;
 
   // A timer and a watch whose handlers run on this queue. Not armed yet.

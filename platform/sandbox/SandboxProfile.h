@@ -13,7 +13,7 @@
 
 namespace orvanta::platform {
 
-// What a sandbox profile says about system calls, by their numbers on this machine; calls that other machines have are
+// A sandbox profile's rules for system calls, by their numbers on this machine; calls that other machines have are
 // left out. Plain data, checked but not yet applied. The format is described in docs/sandbox.md.
 struct SandboxCalls {
   // The call is allowed when one of its arguments, or some bits of it, has one of these values.
@@ -33,7 +33,7 @@ struct SandboxCalls {
   static Result<SandboxCalls> fromPropertyList(const Value& section);
 };
 
-// What a sandbox profile's property list says, checked but not yet applied to any file system. Its format is described
+// A sandbox profile's property list, checked but not yet applied to any file system. Its format is described
 // in docs/sandbox.md. Plain data.
 struct SandboxProfile {
   struct FileRule {

@@ -16,7 +16,7 @@ std::string answerLine(std::uint64_t line, const StringReply::Outcome& outcome);
 
 // {"flush":{"result":…,"error":null}}, with an error as {"code":…,"description":…}.
 std::string flushLine(const FlushAnswer& answer);
-// The problem that the last flush had; nullopt when it had none. That there was nothing to flush is fine: unbatched
+// The problem that the last flush had; nullopt when it succeeded. That there was nothing to flush is fine: unbatched
 // events went out one by one, and the storebag means filtered ones to stay.
 std::optional<std::string> flushProblem(const FlushAnswer& answer);
 

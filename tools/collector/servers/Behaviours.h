@@ -47,7 +47,7 @@ class Behaviours {
   // Returns whether there was one.
   bool clear(const std::string& path);
   void clearAll();
-  // Returns the behaviour for one request to the path and uses up one of its times; nullopt if none matches.
+  // Returns the behaviour for one request to the path and uses up one of its times; nullopt if no behaviour matches.
   std::optional<PathBehaviour> take(std::string_view path);
   ByPath all() const;
 

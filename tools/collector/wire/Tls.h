@@ -16,7 +16,7 @@ struct ServerIdentity {
   std::string keyPem;
 };
 
-// What is wrong with the server's certificate, for tests of clients that must refuse it.
+// A fault of the server's certificate, for tests of clients that must refuse it.
 enum class CertificateFlaw { none, wrongHost, expired, selfSigned };
 
 // The collector's own certificate authority: made on first start, kept in two files (ca.pem, and ca-key.pem with mode
