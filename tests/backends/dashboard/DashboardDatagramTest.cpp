@@ -26,30 +26,32 @@ TEST(DashboardDatagram, EveryByteOfTheHeader) {
   const struct {
     const char* what;
     DashboardSender sender;
-    Event event;
+    Event event;         // its payload comes below
     std::string header;  // in hexadecimal: before the device identifier, that, behind it
     const char* line;
   } rows[] = {
       {"all fields",
        {8, 7, 1, 0, deviceID, 1},
-       {payload, {123, 4999}, 0x0102, 0x0304, kNone, 0x0506},
+       {nullptr, {123, 4999}, 0x0102, 0x0304, kNone, 0x0506},
        "080701010000007bfffffffeffffffb501020304"
        "30313233343536373839616263646566303132333435363738396162636465663031323334353637"
        "05060001",
        "123.004 0123456789abcdef0123456789abcdef01234567 127.0.0.1 XF     0     1  1286   258   772  a=q b=xyz"},
       {"short device, explicit server, latest time",
        {255, 14, 0xffffffff, 0xffff, "D", 3},
-       {payload, {-1, 999'999}, 65535, 0, kNone, 0},
+       {nullptr, {-1, 999'999}, 65535, 0, kNone, 0},
        "ff0e01f9ffffffff000000000000ffb5ffff000044" + std::string(78, '0') + "00000003",
        "4294967295.996 D 127.0.0.1 QB-ZIRL 65535 4294967295     0 65535     0  a=q b=xyz"},
       {"no such client type",
        {0, 256 + 19, 0, 0, "", 0},
-       {payload, {0, 3999}, 0, 0, kNone, 9},
+       {nullptr, {0, 3999}, 0, 0, kNone, 9},
        "0013010000000000ffffffffffffffb500000000" + std::string(80, '0') + "00090000",
        "0.000  127.0.0.1      0     0     9     0     0  a=q b=xyz"},
   };
   for (const auto& row : rows) {
-    const auto datagram = encodeDashboardDatagram(row.sender, row.event);
+    Event event = row.event;
+    event.payload = payload;
+    const auto datagram = encodeDashboardDatagram(row.sender, event);
     EXPECT_EQ(platform::hexText(std::span(datagram).first(kDashboardHeaderBytes)), row.header) << row.what;
     EXPECT_EQ(textOf(datagram), " a=q b=xyz") << row.what;
     EXPECT_EQ(writeLocalLog(datagram), row.line) << row.what;
